@@ -1,0 +1,283 @@
+// The configuration store: an SQLite database under the host root
+// (<root>/var/lib/tarvik/configstore/configstore.db) holding the user, default,
+// desired and SmartNIC configuration of the host, the global namespace
+// objects, boot mode, the boot-apply record, boot-time restore failures and
+// the maintenance-mode state. docs/platform.md describes tables and semantics.
+//
+// Thread safety: a DBStore connection serialises its own use with a mutex, so
+// it may be shared between threads. Every writer is atomic: it runs in its own
+// transaction, or inside the open ConfigStoreTransaction of its connection.
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include <hoxcm/export.h>
+#include <hoxcm/json.h>
+
+namespace HoxSchemaStore {
+class SchemaObject;
+}
+
+namespace HoxConfigStore {
+
+// Identity of one configuration object; `instanceId` is empty for a
+// singleton.
+struct HOXCM_API ConfigStoreObjectId {
+  std::string component;
+  std::string group;
+  std::string key;
+  std::string instanceId;
+
+  ConfigStoreObjectId() = default;
+  ConfigStoreObjectId(std::string component, std::string group, std::string key,
+                      std::string instanceId = {});
+  // "comp C grp G key K", followed by " id I" when the instance id is set.
+  std::string toString() const;
+  bool operator==(const ConfigStoreObjectId&) const = default;
+};
+
+// One row of configuration contents: "Component", "ConfigGroup", "Name",
+// "Identifier", "Value", "AutoConfValue".
+using ConfigMap = std::map<std::string, std::string>;
+using ConfigMapList = std::vector<std::shared_ptr<ConfigMap>>;
+
+enum BOOTMODE : int {
+  BOOTMODE_NORMAL = 0,           // host API changes allowed
+  BOOTMODE_BOOTSTRAP = 1,
+  BOOTMODE_DESIRED_STAGED = 4,   // staged desired configuration awaits a boot
+};
+
+// Which configuration a row set belongs to.
+enum class ConfigKind : int { User = 0, Default = 1, Desired = 2, Smartnic = 3, DesiredSmartnic = 4 };
+
+// A connection to the store of the current root.
+class HOXCM_API DBStore {
+ public:
+  virtual ~DBStore();
+  DBStore() = default;
+  DBStore(const DBStore&) = delete;
+  DBStore& operator=(const DBStore&) = delete;
+  // Path of the database file.
+  virtual const std::string& GetPath() const = 0;
+};
+
+// The process's connection to the store of the current root (HOX_ROOT),
+// opened on first use and shared afterwards. `storeType` 0 is the host store.
+// With `create` a missing store is created. Throws ConfigStoreException when
+// the store is corrupt, of a newer schema version, or cannot be opened.
+HOXCM_API std::shared_ptr<DBStore> GetDBStore(int storeType = 0, bool create = true);
+
+// Contents readers: one row per configuration object, ordered by component,
+// group, key, then instance insertion order.
+HOXCM_API ConfigMapList GetUserConfigContents(const std::shared_ptr<DBStore>& db);
+HOXCM_API ConfigMapList GetDesiredUserConfigContents(const std::shared_ptr<DBStore>& db);
+HOXCM_API ConfigMapList GetDefaultUserConfigContents(const std::shared_ptr<DBStore>& db);
+HOXCM_API ConfigMapList GetSmartnicConfiguration(const std::shared_ptr<DBStore>& db);
+// Default user configuration rows of one object (all instances of the key
+// when the id has no instance).
+HOXCM_API ConfigMapList GetDefaultUserConfigMapList(const ConfigStoreObjectId& id,
+                                                    const std::shared_ptr<DBStore>& db);
+
+// Replace the desired (staged) configuration by the items of a host document
+// (components, groups, keys; a "profile" wrapper is unwrapped).
+HOXCM_API void SetDesiredUserConfig(rapidjson::Document& document);
+HOXCM_API void SetDesiredSmartnicConfiguration(rapidjson::Document& document);
+// Replace the user (or default) configuration by the items of a host document.
+HOXCM_API void ImportConfiguration(ConfigKind kind, const rapidjson::Value& document);
+
+// One change of the user configuration, as a plugin run applies it.
+struct HOXCM_API UserConfigChange {
+  std::string action;  // "ADD", "SET" or "DELETE"
+  ConfigStoreObjectId id;
+  std::string value;   // JSON text of the object; unused for "DELETE"
+};
+// Applies all changes in one transaction: all or nothing.
+HOXCM_API void ApplyUserConfigChanges(const std::vector<UserConfigChange>& changes);
+
+HOXCM_API BOOTMODE GetBootMode();
+HOXCM_API void SetBootMode(BOOTMODE mode);
+
+// {"isBootComplete": bool, "bootApplyRecord": string}
+HOXCM_API rapidjson::Document getBootApplyRecord();
+HOXCM_API void setBootApplyRecord(const std::string& record);
+HOXCM_API void SetBootComplete(bool complete);
+
+struct HOXCM_API FailureRecord {
+  std::string component;
+  std::string group;
+  std::string key;
+};
+HOXCM_API std::vector<FailureRecord> GetBootTimeRestoreFailures();
+HOXCM_API void AddBootTimeRestoreFailure(const FailureRecord& failure);
+HOXCM_API void ClearBootTimeRestoreFailures();
+
+HOXCM_API bool GetMaintenanceMode();
+HOXCM_API void SetMaintenanceMode(bool enabled);
+
+// A fresh instance identifier for "cs_generated_id" keys (a random UUID).
+HOXCM_API std::string GenerateInstanceId();
+
+// Named string values attached to a store object id.
+class HOXCM_API StoreObject {
+ public:
+  explicit StoreObject(ConfigStoreObjectId id);
+  virtual ~StoreObject();
+  const ConfigStoreObjectId& GetConfigStoreObjectId() const;
+  // False (and `value` untouched) when the name has no value.
+  bool GetValue(const std::string& name, std::string* value) const;
+  void SetValue(const std::string& name, const std::string& value);
+  const std::map<std::string, std::string>& GetValues() const;
+
+ private:
+  ConfigStoreObjectId id_;
+  std::map<std::string, std::string> values_;
+};
+
+// A configuration object: its id and its JSON data (an owned copy).
+class HOXCM_API ConfigStoreObject : public StoreObject {
+ public:
+  explicit ConfigStoreObject(ConfigStoreObjectId id);
+  ConfigStoreObject(ConfigStoreObjectId id, const rapidjson::Value& data);
+  const rapidjson::Value& GetData() const;
+  // Compact JSON text of the data.
+  std::string Serialize() const;
+
+ private:
+  std::shared_ptr<rapidjson::Document> data_;
+};
+
+// The drift record of a change: id, action name and an owned copy of the
+// drift value.
+class HOXCM_API DriftObject : public StoreObject {
+ public:
+  DriftObject(ConfigStoreObjectId id, std::string action, const rapidjson::Value& drift);
+  const std::string& GetAction() const;
+  const rapidjson::Value& GetDrift() const;
+  std::string Serialize() const;
+
+ private:
+  std::string action_;
+  std::shared_ptr<rapidjson::Document> drift_;
+};
+
+// Builds a configuration object from an id, a value and the key's schema.
+HOXCM_API std::shared_ptr<ConfigStoreObject> CreateObject(
+    const ConfigStoreObjectId& id, const rapidjson::Value& value,
+    const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema, std::optional<int64_t> version = std::nullopt);
+
+extern HOXCM_API const char* const sGlobalNamespace;
+
+// Objects of one namespace (the global namespace holds objects outside the
+// host configuration, such as the preserved auto-deployment files).
+class HOXCM_API ConfigStore {
+ public:
+  virtual ~ConfigStore();
+  // Null when the store cannot be opened.
+  static std::shared_ptr<ConfigStore> GetStore(const std::string& ns);
+  // Null when absent.
+  virtual std::shared_ptr<ConfigStoreObject> GetObject(const ConfigStoreObjectId& id) = 0;
+  virtual void SetObject(const StoreObject& object) = 0;
+  virtual void DeleteObject(const ConfigStoreObjectId& id) = 0;
+  virtual std::shared_ptr<DBStore> GetDB() const = 0;
+};
+
+// A transaction over the process's connection: every store write made until
+// Commit() (on this thread) belongs to it; destroyed uncommitted, it rolls
+// back. Transactions do not nest.
+class HOXCM_API ConfigStoreTransaction {
+ public:
+  explicit ConfigStoreTransaction(const std::shared_ptr<ConfigStore>& store);
+  ~ConfigStoreTransaction();
+  ConfigStoreTransaction(const ConfigStoreTransaction&) = delete;
+  ConfigStoreTransaction& operator=(const ConfigStoreTransaction&) = delete;
+  void Commit();
+
+ private:
+  std::shared_ptr<DBStore> db_;
+  bool open_;
+};
+
+// Stages one desired object (an instance or a singleton value) of a key.
+HOXCM_API void ProcessDesiredObject(rapidjson::MemoryPoolAllocator<>& allocator,
+                                    const std::shared_ptr<DBStore>& db, const std::string& component,
+                                    const std::string& group, const std::string& key,
+                                    const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema,
+                                    const rapidjson::Value& value);
+
+// The current / default configuration of one key: an object for a
+// singleton, an array of instances for a multi-instance key; null when none.
+HOXCM_API rapidjson::Document GetCurrentConfigInternal(const std::shared_ptr<DBStore>& db,
+                                                       const std::string& component, const std::string& group,
+                                                       const std::string& key);
+HOXCM_API rapidjson::Document GetDefaultUserConfigInternal(const std::shared_ptr<DBStore>& db,
+                                                           const std::string& component,
+                                                           const std::string& group, const std::string& key);
+HOXCM_API rapidjson::Document GetDefaultUserConfigInstancesInternal(const std::shared_ptr<DBStore>& db,
+                                                                    const std::string& component,
+                                                                    const std::string& group,
+                                                                    const std::string& key);
+
+// Clean-up actions applied to extracted values (docs/platform.md).
+enum CLEANUP_ACTIONS : int {
+  CLEANUP_REMOVE_GENERATED_ID = 1,   // drop "cs_generated_id"
+  CLEANUP_REMOVE_NULLS = 2,          // drop members whose value is null
+  CLEANUP_REMOVE_EMPTY_OBJECTS = 3,  // drop members that are empty objects
+  CLEANUP_REMOVE_DEFAULTS = 4,       // drop members equal to their schema default
+  CLEANUP_REMOVE_UNKNOWN = 5,        // drop members the schema does not describe
+};
+
+// Document building, comparison, redaction and serialisation of
+// configuration values. Stateless; every function is thread-safe.
+class HOXCM_API ConfigStoreDocument {
+ public:
+  // Lower-case, hyphenated 8-4-4-4-12 form of a host UUID.
+  static std::string NormalizeHostId(const std::string& hostId);
+  // `source` with the host-specific sections reduced to the host `hostId`
+  // (format: docs/platform.md).
+  static void GetDocumentForHost(const rapidjson::Value& source, rapidjson::Document& result,
+                                 const std::string& hostId);
+  static bool ValueExists(const rapidjson::Value& object, const char* member);
+  // Schema-aware equality of a desired and a host value (docs/drift.md).
+  static bool IsEqualValue(const rapidjson::Value& desired, const rapidjson::Value& host,
+                           const rapidjson::Value& schema);
+  // A hash that agrees with IsEqualValue under the same schema.
+  static std::size_t HashValue(const rapidjson::Value& value, const rapidjson::Value& schema);
+  // Order-insensitive equality of two arrays of primitive values.
+  static bool IsEqualPrimitiveArray(const rapidjson::Value& a, const rapidjson::Value& b);
+  // Compact JSON of `value` with every property that `schema` marks
+  // "sensitive" replaced by "******", at any depth.
+  static std::string RedactAndSerializeValue(const rapidjson::Value& schema, const rapidjson::Value& value);
+  // Adds an item: a singleton (empty identifier) as doc[C][G][K], an instance
+  // appended to the array doc[C][G][K]. Under "profile" when it exists.
+  static void AddObject(rapidjson::Document& doc, const std::string& component, const std::string& group,
+                        const std::string& key, const std::string& identifier, rapidjson::Value& value,
+                        rapidjson::MemoryPoolAllocator<>& allocator);
+  // Adds an empty "profile" object to the document (an object).
+  static void AddProfile(rapidjson::Document& doc);
+  static void CleanupObject(rapidjson::Value& value, const rapidjson::Value& schema,
+                            const std::vector<CLEANUP_ACTIONS>& actions,
+                            rapidjson::MemoryPoolAllocator<>& allocator);
+  // Sorts object members by name, recursively, so that equal documents
+  // serialise identically.
+  static void NormalizeValue(rapidjson::Value& value, rapidjson::MemoryPoolAllocator<>& allocator);
+  // Splits a profile document into host-independent and host-specific
+  // sections by the schema document (docs/platform.md); result into `out`.
+  static void SplitDocument(const rapidjson::Value& profile, const rapidjson::Value& schemaDocument,
+                            const std::string& hostId, rapidjson::Document& out);
+  static void PatchRequiredProperty(rapidjson::Value& value, const std::string& field,
+                                    const rapidjson::Value& autoConf,
+                                    rapidjson::MemoryPoolAllocator<>& allocator);
+  static void PatchUnionTagProperty(rapidjson::Value& value, const std::string& field,
+                                    const rapidjson::Value& autoConf,
+                                    rapidjson::MemoryPoolAllocator<>& allocator);
+  // Parses JSON text; throws InvalidArgumentException 2080 when malformed.
+  static rapidjson::Document CreateDocument(const std::string& text);
+  static void SerializeValue(const rapidjson::Value& value, std::string& out);
+};
+
+}  // namespace HoxConfigStore

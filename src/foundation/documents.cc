@@ -1,0 +1,131 @@
+#include <hoxcm/documents.h>
+
+#include <cerrno>
+#include <cstring>
+#include <fstream>
+#include <iterator>
+#include <sstream>
+#include <sys/stat.h>
+#include <vector>
+
+#include <hoxcm/host.h>
+#include <hoxcm/schema_store.h>
+
+#include "foundation/json_parse.h"
+
+namespace HoxConfigManager {
+
+bool fileExists(const std::string& path) {
+  struct stat st;
+  if (::stat(path.c_str(), &st) != 0) {
+    const int err = errno;
+    // A missing file is the ordinary "no"; anything else is worth a line.
+    if (err != ENOENT && err != ENOTDIR) {
+      CSLogger::Log(CSLogger::kError,
+                    "Failed to query the status of \"%s\", error code: %d, error message: \"%s\"",
+                    path.c_str(), err, std::strerror(err));
+    }
+    return false;
+  }
+  return S_ISREG(st.st_mode);
+}
+
+std::shared_ptr<Document> CreateDocument() { return std::make_shared<Document>(); }
+
+void AddMember(Document* doc, Value* object, const std::string& name, Value* value) {
+  RAPIDJSON_ASSERT(doc != nullptr && object != nullptr && value != nullptr);
+  RAPIDJSON_ASSERT(object->IsObject());
+  Value key(name.c_str(), static_cast<rapidjson::SizeType>(name.size()), doc->GetAllocator());
+  object->AddMember(key, *value, doc->GetAllocator());
+}
+
+std::string GetInstanceIdFromValue(const Value& instance,
+                                   const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema) {
+  RAPIDJSON_ASSERT(schema != nullptr);
+  const std::string& member = schema->GetIdentityMember();
+  if (member.empty() || !HoxConfigStore::ConfigStoreDocument::ValueExists(instance, member.c_str())) {
+    return {};
+  }
+  const Value& id = instance[member.c_str()];
+  if (!id.IsString()) ThrowException<ConfigManagerException>(InvalidKeyValue, member);
+  return std::string(id.GetString(), id.GetStringLength());
+}
+
+bool IsEqualArray(const Value& a, const Value& b) {
+  RAPIDJSON_ASSERT(a.IsArray() && b.IsArray());
+  if (a.Size() != b.Size()) return false;
+  // Each element of `b` may be matched once: [1,2,2] and [1,1,2] differ.
+  std::vector<bool> matched(b.Size(), false);
+  for (const Value& x : a.GetArray()) {
+    bool found = false;
+    for (rapidjson::SizeType j = 0; j < b.Size(); ++j) {
+      if (matched[j] || b[j].GetType() != x.GetType() || !(b[j] == x)) continue;
+      matched[j] = true;
+      found = true;
+      break;
+    }
+    if (!found) return false;
+  }
+  return true;
+}
+
+void SerializeValue(const Value& value, std::string& out) {
+  rapidjson::StringBuffer buffer;
+  rapidjson::Writer<rapidjson::StringBuffer> writer(buffer);
+  value.Accept(writer);
+  out.assign(buffer.GetString(), buffer.GetSize());
+}
+
+std::string JsonToString(const Value& value) {
+  std::string out;
+  SerializeValue(value, out);
+  return out;
+}
+
+void CreateFileFromDocument(const char* path, const Document& doc) {
+  RAPIDJSON_ASSERT(path != nullptr);
+  std::string text;
+  SerializeValue(doc, text);
+  // Written beside the target and renamed over it, so a reader never sees
+  // half a document.
+  const std::string tmp = std::string(path) + ".tmp";
+  {
+    std::ofstream out(tmp, std::ios::binary | std::ios::trunc);
+    out.write(text.data(), static_cast<std::streamsize>(text.size()));
+    out.flush();
+    if (!out) {
+      std::remove(tmp.c_str());
+      throw std::runtime_error("Failed to write " + std::string(path));
+    }
+  }
+  if (std::rename(tmp.c_str(), path) != 0) {
+    const int err = errno;
+    std::remove(tmp.c_str());
+    throw std::runtime_error("Failed to write " + std::string(path) + ": " + std::strerror(err));
+  }
+}
+
+void ParseDocument(const std::string& text, Document& doc) {
+  if (!detail::ParseJson(text.data(), text.size(), doc)) {
+    ThrowException<InvalidArgumentException>(JsonParseFailed);
+  }
+}
+
+std::shared_ptr<Document> CreateDocumentFromString(const std::string& text) {
+  auto doc = CreateDocument();
+  ParseDocument(text, *doc);
+  return doc;
+}
+
+void CreateDocumentFromFile(const char* path, Document& doc) {
+  if (path == nullptr) ThrowException<ConfigManagerException>(JsonParseFailed);
+  std::ifstream in(path, std::ios::binary);
+  if (!in) ThrowException<ConfigManagerException>(JsonParseFailed);
+  std::string text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+  if (in.bad()) ThrowException<ConfigManagerException>(JsonParseFailed);
+  if (!detail::ParseJson(text.data(), text.size(), doc)) {
+    ThrowException<ConfigManagerException>(JsonParseFailed);
+  }
+}
+
+}  // namespace HoxConfigManager

@@ -1,0 +1,76 @@
+#include "foundation/json_parse.h"
+
+#include <rapidjson/memorystream.h>
+#include <rapidjson/reader.h>
+
+namespace HoxConfigManager::detail {
+namespace {
+
+// Forwards SAX events to the document and refuses nesting beyond the limit.
+class DepthLimitedBuilder {
+ public:
+  explicit DepthLimitedBuilder(Document& doc) : doc_(doc) {}
+
+  bool Null() { return doc_.Null(); }
+  bool Bool(bool b) { return doc_.Bool(b); }
+  bool Int(int i) { return doc_.Int(i); }
+  bool Uint(unsigned u) { return doc_.Uint(u); }
+  bool Int64(int64_t i) { return doc_.Int64(i); }
+  bool Uint64(uint64_t u) { return doc_.Uint64(u); }
+  bool Double(double d) { return doc_.Double(d); }
+  bool RawNumber(const char* s, rapidjson::SizeType n, bool copy) { return doc_.RawNumber(s, n, copy); }
+  bool String(const char* s, rapidjson::SizeType n, bool copy) { return doc_.String(s, n, copy); }
+  bool StartObject() { return Enter() && doc_.StartObject(); }
+  bool Key(const char* s, rapidjson::SizeType n, bool copy) { return doc_.Key(s, n, copy); }
+  bool EndObject(rapidjson::SizeType n) {
+    --depth_;
+    return doc_.EndObject(n);
+  }
+  bool StartArray() { return Enter() && doc_.StartArray(); }
+  bool EndArray(rapidjson::SizeType n) {
+    --depth_;
+    return doc_.EndArray(n);
+  }
+  bool TooDeep() const { return tooDeep_; }
+
+ private:
+  bool Enter() {
+    if (++depth_ > kMaxJsonDepth) {
+      tooDeep_ = true;
+      return false;
+    }
+    return true;
+  }
+  Document& doc_;
+  unsigned depth_ = 0;
+  bool tooDeep_ = false;
+};
+
+constexpr unsigned kParseFlags = rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag;
+
+}  // namespace
+
+bool ParseJson(const char* text, std::size_t size, Document& doc, std::string* error) {
+  bool ok = false;
+  bool tooDeep = false;
+  rapidjson::ParseResult result;
+  auto generator = [&](Document& target) {
+    DepthLimitedBuilder builder(target);
+    rapidjson::MemoryStream stream(text, size);
+    rapidjson::Reader reader;
+    result = reader.Parse<kParseFlags>(stream, builder);
+    tooDeep = builder.TooDeep();
+    ok = !result.IsError();
+    return ok;
+  };
+  doc.Populate(generator);
+  if (!ok && error != nullptr) {
+    *error = tooDeep ? "nesting deeper than " + std::to_string(kMaxJsonDepth) + " levels"
+                     : std::string(rapidjson::GetParseError_En(result.Code()));
+    *error += " at offset " + std::to_string(result.Offset());
+  }
+  if (!ok) doc.SetNull();
+  return ok;
+}
+
+}  // namespace HoxConfigManager::detail

@@ -1,0 +1,1 @@
+list(APPEND HOXCM_SOURCES)

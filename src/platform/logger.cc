@@ -1,0 +1,77 @@
+#include <hoxcm/host.h>
+
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
+#include <mutex>
+#include <string>
+#include <syslog.h>
+#include <unistd.h>
+
+namespace {
+
+int ParseLevel(const char* text) {
+  if (text == nullptr || *text == '\0') return CSLogger::kInfo;
+  if (std::strcmp(text, "error") == 0) return CSLogger::kError;
+  if (std::strcmp(text, "warning") == 0) return CSLogger::kWarning;
+  if (std::strcmp(text, "info") == 0) return CSLogger::kInfo;
+  if (std::strcmp(text, "detail") == 0 || std::strcmp(text, "debug") == 0) return CSLogger::kDetail;
+  char* end = nullptr;
+  const long n = std::strtol(text, &end, 10);
+  if (end != text && *end == '\0' && n >= -1 && n <= 3) return static_cast<int>(n);
+  return CSLogger::kInfo;
+}
+
+const char* PriorityName(int priority) {
+  switch (priority) {
+    case CSLogger::kError: return "error";
+    case CSLogger::kWarning: return "warning";
+    case CSLogger::kInfo: return "info";
+    default: return "detail";
+  }
+}
+
+int SyslogPriority(int priority) {
+  switch (priority) {
+    case CSLogger::kError: return LOG_ERR;
+    case CSLogger::kWarning: return LOG_WARNING;
+    case CSLogger::kInfo: return LOG_INFO;
+    default: return LOG_DEBUG;
+  }
+}
+
+bool SyslogEnabled() {
+  const char* s = std::getenv("HOX_LOG_SYSLOG");
+  return s != nullptr && std::strcmp(s, "1") == 0;
+}
+
+}  // namespace
+
+bool CSLogger::IsEnabled(int priority) { return priority <= ParseLevel(std::getenv("HOX_LOG_LEVEL")); }
+
+void CSLogger::Log(int priority, const char* format, ...) {
+  if (format == nullptr || !IsEnabled(priority)) return;
+  va_list args;
+  va_start(args, format);
+  char* text = nullptr;
+  const int n = ::vasprintf(&text, format, args);
+  va_end(args);
+  if (n < 0) return;  // out of memory: the line is lost, the caller goes on
+  // One write per line, so that lines of concurrent threads do not interleave.
+  std::string line = "hoxcm[";
+  line += std::to_string(::getpid());
+  line += "] ";
+  line += PriorityName(priority);
+  line += ": ";
+  line += text;
+  line += '\n';
+  if (SyslogEnabled()) {
+    ::syslog(LOG_USER | SyslogPriority(priority), "%s", text);
+  } else {
+    const ssize_t written = ::write(STDERR_FILENO, line.data(), line.size());
+    (void)written;
+  }
+  std::free(text);
+}

@@ -1,0 +1,3 @@
+list(APPEND HOXCM_SOURCES
+  src/platform/store/config_store_document.cc
+)

@@ -1,0 +1,72 @@
+#include "hoxcfg/common.h"
+
+#include <cstdio>
+#include <cstdlib>
+#include <exception>
+#include <fstream>
+#include <iostream>
+#include <unistd.h>
+
+#include <hoxcm/errors.h>
+
+namespace hoxcfg {
+
+void ApplyRoot(const GlobalOptions& options) {
+  if (!options.root.empty()) ::setenv("HOX_ROOT", options.root.c_str(), 1);
+}
+
+int RunCommand(const std::function<int()>& body) {
+  try {
+    return body();
+  } catch (const HoxConfigStore::ConfigStoreException& e) {
+    std::cerr << "hoxcfg: error " << e.GetErrorCode() << ": " << e.what() << std::endl;
+  } catch (const HoxConfigManager::ErrorInfo& e) {
+    std::cerr << "hoxcfg: error " << e.id << ": " << e.message << std::endl;
+  } catch (const CommandError& e) {
+    std::cerr << "hoxcfg: error " << e.code << ": " << e.message << std::endl;
+  } catch (const std::exception& e) {
+    std::cerr << "hoxcfg: error: " << e.what() << std::endl;
+  }
+  return kExitError;
+}
+
+void Run(GlobalOptions& options, const std::function<int()>& body) {
+  ApplyRoot(options);
+  options.exitCode = RunCommand(body);
+}
+
+std::string FormatJson(const rapidjson::Value& value, const GlobalOptions& options) {
+  rapidjson::StringBuffer buffer;
+  if (!options.compact && ::isatty(STDOUT_FILENO)) {
+    rapidjson::PrettyWriter<rapidjson::StringBuffer> writer(buffer);
+    writer.SetIndent(' ', 2);
+    value.Accept(writer);
+  } else {
+    rapidjson::Writer<rapidjson::StringBuffer> writer(buffer);
+    value.Accept(writer);
+  }
+  return std::string(buffer.GetString(), buffer.GetSize()) + "\n";
+}
+
+void WriteOutput(const std::string& text, const std::string& path) {
+  if (path.empty() || path == "-") {
+    std::cout << text << std::flush;
+    return;
+  }
+  const std::string tmp = path + ".tmp";
+  {
+    std::ofstream out(tmp, std::ios::binary | std::ios::trunc);
+    out << text;
+    out.flush();
+    if (!out) {
+      std::remove(tmp.c_str());
+      throw CommandError{kExitError, "cannot write " + path};
+    }
+  }
+  if (std::rename(tmp.c_str(), path.c_str()) != 0) {
+    std::remove(tmp.c_str());
+    throw CommandError{kExitError, "cannot write " + path};
+  }
+}
+
+}  // namespace hoxcfg
