@@ -1,1 +1,3 @@
-list(APPEND HOXCM_SOURCES)
+list(APPEND HOXCM_SOURCES
+  src/operations/extraction.cc
+)
