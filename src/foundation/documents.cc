@@ -118,12 +118,22 @@ std::shared_ptr<Document> CreateDocumentFromString(const std::string& text) {
 }
 
 void CreateDocumentFromFile(const char* path, Document& doc) {
-  if (path == nullptr) ThrowException<ConfigManagerException>(JsonParseFailed);
-  std::ifstream in(path, std::ios::binary);
-  if (!in) ThrowException<ConfigManagerException>(JsonParseFailed);
-  std::string text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
-  if (in.bad()) ThrowException<ConfigManagerException>(JsonParseFailed);
-  if (!detail::ParseJson(text.data(), text.size(), doc)) {
+  std::string text;
+  bool readable = false;
+  if (path != nullptr) {
+    // Reading a directory makes the stream throw; any read failure is the
+    // same "unparsable" answer.
+    try {
+      std::ifstream in(path, std::ios::binary);
+      if (in) {
+        text.assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+        readable = !in.bad();
+      }
+    } catch (const std::exception&) {
+      readable = false;
+    }
+  }
+  if (!readable || !detail::ParseJson(text.data(), text.size(), doc)) {
     ThrowException<ConfigManagerException>(JsonParseFailed);
   }
 }
