@@ -1,0 +1,3 @@
+list(APPEND HOXCM_SOURCES
+  src/platform/host/stubs.cc
+)
