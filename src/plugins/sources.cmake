@@ -1,1 +1,1 @@
-list(APPEND HOXCM_SOURCES)
+list(APPEND HOXCM_SOURCES src/plugins/stubs.cc)
