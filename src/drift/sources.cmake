@@ -1,1 +1,4 @@
-list(APPEND HOXCM_SOURCES)
+list(APPEND HOXCM_SOURCES
+  src/drift/drift_handler.cc
+  src/drift/stubs.cc
+)

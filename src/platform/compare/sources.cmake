@@ -1,0 +1,3 @@
+list(APPEND HOXCM_SOURCES
+  src/platform/compare/stubs.cc
+)
