@@ -1,0 +1,34 @@
+// Internal pieces of configuration extraction shared between its source
+// files. Stateless and thread-safe.
+#pragma once
+
+#include <set>
+#include <string>
+
+#include <hoxcm/config_store.h>
+#include <hoxcm/schema_store.h>
+
+namespace HoxConfigManager::detail {
+
+// A column of a contents row; empty when the row lacks it.
+inline const std::string& Column(const HoxConfigStore::ConfigMap& row, const char* name) {
+  static const std::string kEmpty;
+  auto it = row.find(name);
+  return it == row.end() ? kEmpty : it->second;
+}
+
+// The quorlet object: its configuration is only extracted on hosts that are
+// integrated with the desired-state platform.
+const HoxSchemaStore::SchemaObjectId& QuorletObjectId();
+
+// The objects left out of extraction because the host is not integrated with
+// the desired-state platform: the quorlet object unless the host facts enable
+// the feature switch "dspIntegrated", nothing otherwise.
+std::set<HoxSchemaStore::SchemaObjectId> DspExcludedObjects();
+
+// Copies the host's SSH configuration files into the store so that edits
+// made outside the library are part of the user configuration. Never throws:
+// every failure is logged and the extraction goes on.
+void SyncSshConfiguration();
+
+}  // namespace HoxConfigManager::detail

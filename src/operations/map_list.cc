@@ -1,0 +1,178 @@
+// Map-list processing: configuration-store rows become items of a host
+// document. Shared by every extraction.
+#include <algorithm>
+#include <optional>
+#include <set>
+#include <string>
+#include <vector>
+
+#include <hoxcm/documents.h>
+#include <hoxcm/host.h>
+#include <hoxcm/operations.h>
+
+#include "operations/extraction_internal.h"
+
+namespace HoxConfigManager {
+namespace {
+
+using detail::Column;
+using HoxConfigStore::ConfigMap;
+using HoxConfigStore::ConfigStoreDocument;
+using HoxSchemaStore::SchemaObject;
+using HoxSchemaStore::SchemaObjectId;
+
+constexpr const char* kGeneratedIdMember = "cs_generated_id";
+constexpr const char* kDeleteDefault = "DELETE_DEFAULT";
+
+// Validator findings that only summarise another finding (a failed "oneOf"
+// because its tag is missing, ...): auto-configuration answers the
+// underlying finding and has nothing to say about the summary.
+const std::set<int>& AutoConfIgnoredErrors() {
+  static const std::set<int> kIgnored = {
+      JsonValidator::VALIDATION_ERR_ONE_OF, JsonValidator::VALIDATION_ERR_ANY_OF,
+      JsonValidator::VALIDATION_ERR_ALL_OF, JsonValidator::VALIDATION_ERR_NOT};
+  return kIgnored;
+}
+
+// Clean-up of each document type (the meaning of each action is the store's).
+// Current and desired documents feed the drift walk and the boot-time apply,
+// which must see what is stored, store-generated identities and explicit
+// defaults included; only null members, which mean "absent", go. An exported
+// profile is a portable statement of intent: no generated identities, no
+// nulls or empty objects, no values equal to the schema default, nothing the
+// schema does not describe.
+const std::vector<HoxConfigStore::CLEANUP_ACTIONS>& CleanupActions(DocumentType type) {
+  using namespace HoxConfigStore;
+  static const std::vector<CLEANUP_ACTIONS> kProfile = {CLEANUP_REMOVE_GENERATED_ID, CLEANUP_REMOVE_NULLS,
+                                                        CLEANUP_REMOVE_EMPTY_OBJECTS, CLEANUP_REMOVE_DEFAULTS,
+                                                        CLEANUP_REMOVE_UNKNOWN};
+  static const std::vector<CLEANUP_ACTIONS> kStored = {CLEANUP_REMOVE_NULLS};
+  return type == DOCUMENT_PROFILE ? kProfile : kStored;
+}
+
+// Rows arrive ordered by key, so one key's schema serves a run of rows; the
+// lookup is repeated only when the key changes.
+class SchemaLookup {
+ public:
+  explicit SchemaLookup(const std::shared_ptr<HoxSchemaStore::SchemaStore>& store) : store_(store) {}
+
+  const SchemaObject& Find(const SchemaObjectId& id) {
+    if (!schema_ || !(id == id_)) {
+      schema_ = store_->Find(id.component, id.group, id.key);
+      // A stored item without a schema cannot be cleaned, identified or
+      // validated: refuse the extraction rather than guess.
+      if (!schema_) ThrowException<SchemaNotFound>(SchemaObjectNotFound, id.toString());
+      id_ = id;
+    }
+    return *schema_;
+  }
+
+ private:
+  const std::shared_ptr<HoxSchemaStore::SchemaStore>& store_;
+  SchemaObjectId id_;
+  std::shared_ptr<SchemaObject> schema_;
+};
+
+}  // namespace
+
+void ProcessAutoConfig(Value& value, const Value& schema, const std::string& autoConfValue, Allocator& allocator) {
+  if (autoConfValue.empty()) {
+    CSLogger::Log(CSLogger::kDetail, "No auto configuration to process");
+    return;
+  }
+  Document autoConf;
+  ParseDocument(autoConfValue, autoConf);
+
+  Document errors;
+  JsonValidator::Validate(schema, value, errors, AutoConfIgnoredErrors(), "");
+  RAPIDJSON_ASSERT(errors.IsArray());
+  for (const Value& error : errors.GetArray()) {
+    RAPIDJSON_ASSERT(error.IsObject());
+    const std::string field = error["field"].GetString();
+    const char* text = error["error"].GetString();
+    switch (error["errId"].GetInt()) {
+      case JsonValidator::VALIDATION_ERR_REQUIRED:
+        CSLogger::Log(CSLogger::kInfo, "patching validation error: '%s' %s", field.c_str(), text);
+        ConfigStoreDocument::PatchRequiredProperty(value, field, autoConf, allocator);
+        break;
+      case JsonValidator::VALIDATION_ERR_UNION_TAG:
+        CSLogger::Log(CSLogger::kInfo, "patching validation error: '%s' %s", field.c_str(), text);
+        ConfigStoreDocument::PatchUnionTagProperty(value, field, autoConf, allocator);
+        break;
+      default:
+        CSLogger::Log(CSLogger::kError, "unexpected validation error: '%s' %s", field.c_str(), text);
+        break;
+    }
+  }
+}
+
+void ProcessConfigMapList(Document& result, const HoxConfigStore::ConfigMapList& contents,
+                          const std::shared_ptr<HoxSchemaStore::SchemaStore>& schemaStore, DocumentType type) {
+  CSLogger::Log(CSLogger::kDetail, "%s invoked with DocumentType=%d", "ProcessConfigMapList", static_cast<int>(type));
+  if (!schemaStore) ThrowException<ConfigManagerException>(SchemaStoreAccessFailed);
+  if (!result.IsObject()) result.SetObject();
+  if (type == DOCUMENT_PROFILE) ConfigStoreDocument::AddProfile(result);
+
+  Allocator& allocator = result.GetAllocator();
+  const std::vector<HoxConfigStore::CLEANUP_ACTIONS>& cleanup = CleanupActions(type);
+  SchemaLookup schemas(schemaStore);
+  // Read once, and only when a quorlet row shows up.
+  std::optional<std::set<SchemaObjectId>> dspExcluded;
+  // One parser reused for every row: its stack keeps its capacity, and the
+  // parsed values land directly in the result's pool.
+  Document parsed(&allocator);
+
+  for (const auto& rowPtr : contents) {
+    RAPIDJSON_ASSERT(rowPtr != nullptr);
+    const ConfigMap& row = *rowPtr;
+    const std::string& key = Column(row, "Name");
+    const std::string& component = Column(row, "Component");
+    const std::string& group = Column(row, "ConfigGroup");
+    const std::string& identifier = Column(row, "Identifier");
+    CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was found.", component.c_str(), group.c_str(),
+                  key.c_str(), identifier.c_str());
+    const SchemaObjectId id(component, group, key);
+
+    const std::string& text = Column(row, "Value");
+    if (text == kDeleteDefault) ThrowException<ConfigManagerException>(DeleteDefaultNotSupported, id.toString());
+
+    if (id == detail::QuorletObjectId()) {
+      if (!dspExcluded) dspExcluded = detail::DspExcludedObjects();
+      if (dspExcluded->count(id) != 0) {
+        CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s} was not extracted, since dspIntegrated=False,",
+                      component.c_str(), group.c_str(), key.c_str());
+        continue;
+      }
+    }
+
+    ParseDocument(text, parsed);
+    Value value;
+    value.Swap(parsed);
+    RAPIDJSON_ASSERT(value.IsObject());
+
+    const SchemaObject& schema = schemas.Find(id);
+    auto autoConf = row.find("AutoConfValue");
+    if (autoConf != row.end()) ProcessAutoConfig(value, schema.GetInstanceSchema(), autoConf->second, allocator);
+
+    if (schema.GetIdentityMember() != kGeneratedIdMember) {
+      const std::vector<std::string>& solutionIds = schema.GetSolutionInstanceIds();
+      if (!identifier.empty() &&
+          std::find(solutionIds.begin(), solutionIds.end(), identifier) != solutionIds.end()) {
+        CSLogger::Log(CSLogger::kInfo,
+                      "Configuration for {%s/%s/%s/%s} was not extracted, since instance is created by a solution.",
+                      component.c_str(), group.c_str(), key.c_str(), identifier.c_str());
+        continue;
+      }
+    }
+
+    ConfigStoreDocument::CleanupObject(value, schema.GetInstanceSchema(), cleanup, allocator);
+    if (value.ObjectEmpty()) {
+      CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was filtered out.", component.c_str(),
+                    group.c_str(), key.c_str(), identifier.c_str());
+      continue;
+    }
+    ConfigStoreDocument::AddObject(result, component, group, key, identifier, value, allocator);
+  }
+}
+
+}  // namespace HoxConfigManager
