@@ -38,7 +38,10 @@ struct HOXCM_API ConfigStoreObjectId {
                       std::string instanceId = {});
   // "comp C grp G key K", followed by " id I" when the instance id is set.
   std::string toString() const;
-  bool operator==(const ConfigStoreObjectId&) const = default;
+  bool operator==(const ConfigStoreObjectId& o) const {
+    return component == o.component && group == o.group && key == o.key && instanceId == o.instanceId;
+  }
+  bool operator!=(const ConfigStoreObjectId& o) const { return !(*this == o); }
 };
 
 // One row of configuration contents: "Component", "ConfigGroup", "Name",

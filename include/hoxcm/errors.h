@@ -146,7 +146,8 @@ struct HOXCM_API ErrorInfo {
   ErrorInfo() = default;
   ErrorInfo(std::string id, std::vector<std::string> args, std::string message = {})
       : id(std::move(id)), args(std::move(args)), message(std::move(message)) {}
-  bool operator==(const ErrorInfo&) const = default;
+  bool operator==(const ErrorInfo& o) const { return id == o.id && args == o.args && message == o.message; }
+  bool operator!=(const ErrorInfo& o) const { return !(*this == o); }
 
   // JSON form, see docs/plugin-protocol.md. Serialize never fails;
   // Deserialize and Load throw ConfigStoreException(2000, "Invalid JSON")

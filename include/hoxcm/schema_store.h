@@ -29,7 +29,10 @@ struct HOXCM_API SchemaObjectId {
   SchemaObjectId(std::string component, std::string group, std::string key);
   // "component:group:key"
   std::string toString() const;
-  bool operator==(const SchemaObjectId&) const = default;
+  bool operator==(const SchemaObjectId& o) const {
+    return component == o.component && group == o.group && key == o.key;
+  }
+  bool operator!=(const SchemaObjectId& o) const { return !(*this == o); }
   bool operator<(const SchemaObjectId& other) const;
 };
 
