@@ -1,1 +1,8 @@
-list(APPEND HOXCM_SOURCES src/plugins/stubs.cc)
+# Manifests, registry and order, requests, runs, manifest schema checking.
+list(APPEND HOXCM_SOURCES
+  src/plugins/plugin.cc
+  src/plugins/plugin_launcher.cc
+  src/plugins/plugin_manager.cc
+  src/plugins/plugin_request.cc
+  src/plugins/plugin_schemas.cc
+)

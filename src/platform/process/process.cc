@@ -1,0 +1,168 @@
+#include "platform/process/process.h"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <sstream>
+#include <stdexcept>
+#include <system_error>
+
+namespace HoxPlatform {
+namespace {
+
+[[noreturn]] void ThrowErrno(int error, const std::string& what) {
+  throw std::system_error(error, std::generic_category(), what);
+}
+
+// Owns a descriptor; closes it once.
+class FileDescriptor {
+ public:
+  explicit FileDescriptor(int fd) : fd_(fd) {}
+  ~FileDescriptor() {
+    if (fd_ >= 0) ::close(fd_);
+  }
+  FileDescriptor(const FileDescriptor&) = delete;
+  FileDescriptor& operator=(const FileDescriptor&) = delete;
+  int get() const { return fd_; }
+  // Closes now and reports the result: a failing close may be the first
+  // sign of a lost write.
+  int Close() {
+    const int rc = ::close(fd_);
+    fd_ = -1;
+    return rc;
+  }
+
+ private:
+  int fd_;
+};
+
+struct SpawnActions {
+  posix_spawn_file_actions_t actions;
+  SpawnActions() { posix_spawn_file_actions_init(&actions); }
+  ~SpawnActions() { posix_spawn_file_actions_destroy(&actions); }
+};
+
+struct SpawnAttributes {
+  posix_spawnattr_t attributes;
+  SpawnAttributes() { posix_spawnattr_init(&attributes); }
+  ~SpawnAttributes() { posix_spawnattr_destroy(&attributes); }
+};
+
+}  // namespace
+
+pid_t SpawnClean(const std::string& program, const std::vector<std::string>& argv, int* error) {
+  SpawnActions actions;
+  // Descriptors of other threads and libraries may lack close-on-exec; the
+  // runner gets 0, 1 and 2 and nothing else.
+  int rc = posix_spawn_file_actions_addclosefrom_np(&actions.actions, 3);
+  if (rc != 0) {
+    *error = rc;
+    return -1;
+  }
+  SpawnAttributes attributes;
+  // The runner starts with default signal dispositions and an empty mask,
+  // whatever the caller has blocked, so SIGTERM reaches it.
+  sigset_t empty, all;
+  sigemptyset(&empty);
+  sigfillset(&all);
+  posix_spawnattr_setsigmask(&attributes.attributes, &empty);
+  posix_spawnattr_setsigdefault(&attributes.attributes, &all);
+  posix_spawnattr_setflags(&attributes.attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
+
+  std::vector<char*> args;
+  args.reserve(argv.size() + 1);
+  for (const std::string& a : argv) args.push_back(const_cast<char*>(a.c_str()));
+  args.push_back(nullptr);
+  char* environment[] = {nullptr};
+  pid_t pid = -1;
+  rc = posix_spawn(&pid, program.c_str(), &actions.actions, &attributes.attributes, args.data(), environment);
+  if (rc != 0) {
+    *error = rc;
+    return -1;
+  }
+  return pid;
+}
+
+int WaitForExit(pid_t pid, int* status) {
+  for (;;) {
+    if (::waitpid(pid, status, 0) >= 0) return 0;
+    if (errno != EINTR) return errno;
+  }
+}
+
+int SendSignal(pid_t pid, int signal) { return ::kill(pid, signal) == 0 ? 0 : errno; }
+
+std::string ErrorText(int error) {
+  char buffer[256];
+  // GNU strerror_r returns the text, which may not be `buffer`.
+  return ::strerror_r(error, buffer, sizeof buffer);
+}
+
+HostRunLock::HostRunLock(const std::string& path) : fd_(-1) {
+  std::error_code ec;
+  std::filesystem::create_directories(std::filesystem::path(path).parent_path(), ec);
+  fd_ = ::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600);
+  if (fd_ < 0) ThrowErrno(errno, "cannot open the plugin run lock " + path);
+  // A signal may interrupt the wait for another process's run.
+  while (::flock(fd_, LOCK_EX) != 0) {
+    if (errno != EINTR) {
+      const int saved = errno;
+      ::close(fd_);
+      ThrowErrno(saved, "cannot lock " + path);
+    }
+  }
+}
+
+HostRunLock::~HostRunLock() {
+  // Closing the descriptor releases the lock.
+  ::close(fd_);
+}
+
+void WriteFilePrivately(const std::string& path, const std::string& content) {
+  const std::filesystem::path target(path);
+  std::error_code ec;
+  std::filesystem::create_directories(target.parent_path(), ec);
+  std::string temp = path + ".XXXXXX";
+  // mkostemp creates the file with mode 0600, so the content is never
+  // readable by others, not even for a moment.
+  FileDescriptor fd(::mkostemp(temp.data(), O_CLOEXEC));
+  if (fd.get() < 0) ThrowErrno(errno, "cannot create a temporary file beside " + path);
+  auto fail = [&](int error, const char* what) {
+    ::unlink(temp.c_str());
+    ThrowErrno(error, std::string(what) + " " + temp);
+  };
+  const char* data = content.data();
+  std::size_t left = content.size();
+  while (left > 0) {
+    const ssize_t n = ::write(fd.get(), data, left);
+    if (n < 0) {
+      if (errno == EINTR) continue;
+      fail(errno, "cannot write");
+    }
+    data += n;
+    left -= static_cast<std::size_t>(n);
+  }
+  if (::fsync(fd.get()) != 0) fail(errno, "cannot flush");
+  if (fd.Close() != 0) fail(errno, "cannot close");
+  if (::rename(temp.c_str(), path.c_str()) != 0) fail(errno, "cannot rename");
+}
+
+std::string ReadWholeFile(const std::string& path) {
+  std::ifstream in(path, std::ios::binary);
+  if (!in) throw std::runtime_error("cannot open " + path);
+  std::stringstream ss;
+  ss << in.rdbuf();
+  if (in.bad()) throw std::runtime_error("cannot read " + path);
+  return ss.str();
+}
+
+}  // namespace HoxPlatform
