@@ -1,1 +1,1 @@
-list(APPEND HOXCFG_SOURCES hoxcfg/cmd_store.cc)
+list(APPEND HOXCFG_SOURCES hoxcfg/cmd_store.cc hoxcfg/host_setup.cc)
