@@ -1,4 +1,6 @@
 list(APPEND HOXCM_SOURCES
   src/drift/drift_handler.cc
-  src/drift/stubs.cc
+  src/drift/drift_walk.cc
+  src/drift/apply_tasks.cc
+  src/drift/compliance.cc
 )

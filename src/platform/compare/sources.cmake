@@ -1,3 +1,4 @@
 list(APPEND HOXCM_SOURCES
-  src/platform/compare/stubs.cc
+  src/platform/compare/value_compare.cc
+  src/platform/compare/redact.cc
 )

@@ -1,0 +1,338 @@
+#include "platform/compare/value_compare.h"
+
+#include <bit>
+#include <functional>
+#include <vector>
+
+#include <hoxcm/config_store.h>
+
+namespace HoxConfigStore::detail {
+
+namespace {
+
+using rapidjson::SizeType;
+using rapidjson::Value;
+
+constexpr std::uint64_t kUnsetHash = 0x5bd1e9955bd1e995ULL;
+// Arrays up to this size are matched pairwise; longer ones through hashes.
+constexpr SizeType kSmallArray = 8;
+
+// The schemas handed out for values that no schema describes.
+struct FallbackSchemas {
+  rapidjson::Document null, boolean, number, string, object, objectArray, scalarArray, nestedArray;
+  FallbackSchemas() {
+    auto make = [](rapidjson::Document& doc, const char* type, const char* items) {
+      doc.SetObject();
+      doc.AddMember("type", rapidjson::StringRef(type), doc.GetAllocator());
+      if (items != nullptr) {
+        Value itemSchema(rapidjson::kObjectType);
+        itemSchema.AddMember("type", rapidjson::StringRef(items), doc.GetAllocator());
+        doc.AddMember("items", itemSchema, doc.GetAllocator());
+      }
+    };
+    make(null, "null", nullptr);
+    make(boolean, "boolean", nullptr);
+    make(number, "number", nullptr);
+    make(string, "string", nullptr);
+    make(object, "object", nullptr);
+    make(objectArray, "array", "object");
+    make(scalarArray, "array", "string");
+    make(nestedArray, "array", "array");
+  }
+};
+
+const FallbackSchemas& Fallbacks() {
+  static const FallbackSchemas schemas;
+  return schemas;
+}
+
+const Value* FindLinear(const Value& object, std::string_view name) {
+  for (auto it = object.MemberBegin(); it != object.MemberEnd(); ++it) {
+    if (NameOf(it->name) == name) return &it->value;
+  }
+  return nullptr;
+}
+
+bool SameScalar(const Value& a, const Value& b) {
+  if (a.IsNumber() && b.IsNumber()) return a == b;
+  return a.GetType() == b.GetType() && a == b;
+}
+
+std::uint64_t NumberHash(const Value& v) {
+  double d = v.GetDouble();
+  if (d == 0) d = 0;  // -0.0 and 0 are equal
+  return Mix(std::bit_cast<std::uint64_t>(d));
+}
+
+std::uint64_t StringHash(const Value& v) { return std::hash<std::string_view>()(NameOf(v)); }
+
+// Hash of an element of a scalar array, agreeing with SameScalar.
+std::uint64_t ScalarHash(const Value& v) {
+  if (v.IsNumber()) return NumberHash(v);
+  if (v.IsString()) return Mix(StringHash(v));
+  return Mix(static_cast<std::uint64_t>(v.GetType()) + 1);
+}
+
+const Value* DefaultOf(const Value& schema) {
+  if (!schema.IsObject()) return nullptr;
+  auto it = schema.FindMember("default");
+  return it == schema.MemberEnd() ? nullptr : &it->value;
+}
+
+}  // namespace
+
+MemberIndex::MemberIndex(const Value& object) : object_(object) {
+  if (object.MemberCount() <= kWideObject) return;
+  index_.reserve(object.MemberCount());
+  SizeType i = 0;
+  for (auto it = object.MemberBegin(); it != object.MemberEnd(); ++it, ++i) index_.emplace(NameOf(it->name), i);
+}
+
+const Value* MemberIndex::Find(std::string_view name) const {
+  if (index_.empty()) return FindLinear(object_, name);
+  auto it = index_.find(name);
+  return it == index_.end() ? nullptr : &(object_.MemberBegin() + it->second)->value;
+}
+
+const Value& SchemaForValue(const Value& value) {
+  const FallbackSchemas& f = Fallbacks();
+  switch (value.GetType()) {
+    case rapidjson::kNullType: return f.null;
+    case rapidjson::kFalseType:
+    case rapidjson::kTrueType: return f.boolean;
+    case rapidjson::kNumberType: return f.number;
+    case rapidjson::kStringType: return f.string;
+    case rapidjson::kObjectType: return f.object;
+    case rapidjson::kArrayType:
+      if (value.Empty() || value[0].IsString() || value[0].IsNumber() || value[0].IsBool()) return f.scalarArray;
+      return value[0].IsArray() ? f.nestedArray : f.objectArray;
+  }
+  return f.null;
+}
+
+std::string_view SchemaType(const Value& schema) {
+  if (!schema.IsObject()) return {};
+  auto it = schema.FindMember("type");
+  if (it == schema.MemberEnd()) return {};
+  if (it->value.IsString()) return NameOf(it->value);
+  if (it->value.IsArray()) {
+    for (const Value& t : it->value.GetArray()) {
+      if (t.IsString() && NameOf(t) != "null") return NameOf(t);
+    }
+  }
+  return {};
+}
+
+const MemberIndex& ValueComparer::SchemaIndex(const Value& properties) {
+  auto& slot = schemaIndexes_[&properties];
+  if (!slot) slot = std::make_unique<MemberIndex>(properties);
+  return *slot;
+}
+
+const Value& ValueComparer::Child(const Value& schema, std::string_view name, const Value& value) {
+  if (schema.IsObject()) {
+    auto props = schema.FindMember("properties");
+    if (props != schema.MemberEnd() && props->value.IsObject()) {
+      const Value* child = props->value.MemberCount() > kWideObject ? SchemaIndex(props->value).Find(name)
+                                                                     : FindLinear(props->value, name);
+      if (child != nullptr && child->IsObject()) return *child;
+    }
+    auto extra = schema.FindMember("additionalProperties");
+    if (extra != schema.MemberEnd() && extra->value.IsObject()) return extra->value;
+  }
+  return SchemaForValue(value);
+}
+
+const Value& ValueComparer::Items(const Value& schema, const Value& element) {
+  if (schema.IsObject()) {
+    auto items = schema.FindMember("items");
+    if (items != schema.MemberEnd() && items->value.IsObject()) return items->value;
+  }
+  return SchemaForValue(element);
+}
+
+bool ValueComparer::HoldsObjects(const Value& schema, const Value& a, const Value& b) {
+  if (schema.IsObject()) {
+    auto items = schema.FindMember("items");
+    if (items != schema.MemberEnd() && SchemaType(items->value) == "object") return true;
+  }
+  for (const Value* array : {&a, &b}) {
+    for (const Value& e : array->GetArray()) {
+      if (e.IsObject() || e.IsArray()) return true;
+    }
+  }
+  return false;
+}
+
+bool ValueComparer::IsUnset(const Value& value, const Value& schema) {
+  switch (value.GetType()) {
+    case rapidjson::kNullType: return true;
+    case rapidjson::kStringType:
+      if (value.GetStringLength() == 0) return true;
+      break;
+    case rapidjson::kObjectType: {
+      bool allUnset = true;
+      for (auto it = value.MemberBegin(); it != value.MemberEnd() && allUnset; ++it) {
+        if (IsGeneratedId(it->name)) continue;
+        allUnset = IsUnset(it->value, Child(schema, NameOf(it->name), it->value));
+      }
+      if (allUnset) return true;
+      break;
+    }
+    default: break;
+  }
+  const Value* def = DefaultOf(schema);
+  return def != nullptr && *def == value;
+}
+
+bool ValueComparer::Equal(const Value& d, const Value& h, const Value& schema) {
+  const bool dUnset = IsUnset(d, schema);
+  const bool hUnset = IsUnset(h, schema);
+  if (dUnset || hUnset) return dUnset && hUnset;
+  if (d.IsObject() && h.IsObject()) return EqualObjects(d, h, schema);
+  if (d.IsArray() && h.IsArray()) {
+    if (d.Size() != h.Size()) return false;
+    return HoldsObjects(schema, d, h) ? EqualObjectArrays(d, h, schema) : EqualPrimitiveArrays(d, h);
+  }
+  return SameScalar(d, h);
+}
+
+bool ValueComparer::EqualObjects(const Value& d, const Value& h, const Value& schema) {
+  MemberIndex hostIndex(h);
+  SizeType found = 0;
+  for (auto it = d.MemberBegin(); it != d.MemberEnd(); ++it) {
+    if (IsGeneratedId(it->name)) continue;
+    const std::string_view name = NameOf(it->name);
+    const Value& childSchema = Child(schema, name, it->value);
+    const Value* hv = hostIndex.Find(name);
+    if (hv == nullptr) {
+      if (!IsUnset(it->value, childSchema)) return false;
+      continue;
+    }
+    ++found;
+    if (!Equal(it->value, *hv, childSchema)) return false;
+  }
+  if (found == h.MemberCount()) return true;
+  // Members only the host holds must be unset.
+  MemberIndex desiredIndex(d);
+  for (auto it = h.MemberBegin(); it != h.MemberEnd(); ++it) {
+    if (IsGeneratedId(it->name)) continue;
+    const std::string_view name = NameOf(it->name);
+    if (desiredIndex.Find(name) != nullptr) continue;
+    if (!IsUnset(it->value, Child(schema, name, it->value))) return false;
+  }
+  return true;
+}
+
+bool ValueComparer::EqualObjectArrays(const Value& d, const Value& h, const Value& schema) {
+  const SizeType n = h.Size();
+  std::vector<bool> matched(n, false);
+  if (n <= kSmallArray) {
+    for (const Value& x : d.GetArray()) {
+      const Value& itemSchema = Items(schema, x);
+      bool found = false;
+      for (SizeType j = 0; j < n && !found; ++j) {
+        if (!matched[j] && Equal(x, h[j], itemSchema)) matched[j] = found = true;
+      }
+      if (!found) return false;
+    }
+    return true;
+  }
+  std::unordered_map<std::uint64_t, std::vector<SizeType>> buckets;
+  buckets.reserve(n);
+  for (SizeType j = 0; j < n; ++j) buckets[Hash(h[j], Items(schema, h[j]))].push_back(j);
+  for (const Value& x : d.GetArray()) {
+    const Value& itemSchema = Items(schema, x);
+    auto bucket = buckets.find(Hash(x, itemSchema));
+    if (bucket == buckets.end()) return false;
+    bool found = false;
+    for (SizeType j : bucket->second) {
+      if (!matched[j] && Equal(x, h[j], itemSchema)) {
+        matched[j] = found = true;
+        break;
+      }
+    }
+    if (!found) return false;
+  }
+  return true;
+}
+
+std::size_t ValueComparer::Hash(const Value& value, const Value& schema) {
+  if (IsUnset(value, schema)) return kUnsetHash;
+  switch (value.GetType()) {
+    case rapidjson::kObjectType: {
+      // A sum, so that member order does not matter; unset members add
+      // nothing, as they do not count for equality.
+      std::uint64_t sum = 0;
+      for (auto it = value.MemberBegin(); it != value.MemberEnd(); ++it) {
+        if (IsGeneratedId(it->name)) continue;
+        const std::uint64_t child = Hash(it->value, Child(schema, NameOf(it->name), it->value));
+        if (child == kUnsetHash) continue;
+        sum += Mix(StringHash(it->name) ^ Mix(child));
+      }
+      return Mix(sum ^ 0x6f626a);
+    }
+    case rapidjson::kArrayType: {
+      std::uint64_t sum = 0;
+      for (const Value& e : value.GetArray()) sum += Mix(Hash(e, Items(schema, e)));
+      return Mix(sum + value.Size() * 0x9e3779b97f4a7c15ULL);
+    }
+    case rapidjson::kNumberType: return NumberHash(value);
+    case rapidjson::kStringType: return Mix(StringHash(value));
+    default: return Mix(static_cast<std::uint64_t>(value.GetType()) + 1);
+  }
+}
+
+bool EqualPrimitiveArrays(const Value& a, const Value& b) {
+  RAPIDJSON_ASSERT(a.IsArray() && b.IsArray());
+  const SizeType n = b.Size();
+  if (a.Size() != n) return false;
+  std::vector<bool> matched(n, false);
+  if (n <= 2 * kSmallArray) {
+    for (const Value& x : a.GetArray()) {
+      bool found = false;
+      for (SizeType j = 0; j < n && !found; ++j) {
+        if (!matched[j] && SameScalar(x, b[j])) matched[j] = found = true;
+      }
+      if (!found) return false;
+    }
+    return true;
+  }
+  std::unordered_map<std::uint64_t, std::vector<SizeType>> buckets;
+  buckets.reserve(n);
+  for (SizeType j = 0; j < n; ++j) buckets[ScalarHash(b[j])].push_back(j);
+  for (const Value& x : a.GetArray()) {
+    auto bucket = buckets.find(ScalarHash(x));
+    if (bucket == buckets.end()) return false;
+    bool found = false;
+    for (SizeType j : bucket->second) {
+      if (!matched[j] && SameScalar(x, b[j])) {
+        matched[j] = found = true;
+        break;
+      }
+    }
+    if (!found) return false;
+  }
+  return true;
+}
+
+}  // namespace HoxConfigStore::detail
+
+namespace HoxConfigStore {
+
+bool ConfigStoreDocument::IsEqualValue(const rapidjson::Value& desired, const rapidjson::Value& host,
+                                       const rapidjson::Value& schema) {
+  detail::ValueComparer comparer;
+  return comparer.Equal(desired, host, schema);
+}
+
+std::size_t ConfigStoreDocument::HashValue(const rapidjson::Value& value, const rapidjson::Value& schema) {
+  detail::ValueComparer comparer;
+  return comparer.Hash(value, schema);
+}
+
+bool ConfigStoreDocument::IsEqualPrimitiveArray(const rapidjson::Value& a, const rapidjson::Value& b) {
+  return detail::EqualPrimitiveArrays(a, b);
+}
+
+}  // namespace HoxConfigStore

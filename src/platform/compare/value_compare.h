@@ -1,0 +1,92 @@
+// Schema-aware comparison and hashing of configuration values, shared by the
+// configuration store's static helpers and the drift walk.
+//
+// Two values are equal when they agree after "unset" members are dropped: a
+// member is unset when it is absent, null, the empty string, an object whose
+// members are all unset, or equal to its schema "default". The store's
+// generated identity "cs_generated_id" is never compared. Arrays compare as
+// multisets: arrays of scalars by JSON type and value, arrays of objects
+// element by element under this equality. Hash() agrees with Equal(): equal
+// values under one schema hash alike. docs/drift.md has examples.
+//
+// A ValueComparer caches name indexes of wide schema nodes; it is not
+// thread-safe and must not outlive the schema documents it has seen.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <string_view>
+#include <unordered_map>
+
+#include <hoxcm/json.h>
+
+namespace HoxConfigStore::detail {
+
+constexpr const char* kGeneratedIdMember = "cs_generated_id";
+// Objects with more members than this are searched through a hash index.
+constexpr rapidjson::SizeType kWideObject = 16;
+
+inline std::string_view NameOf(const rapidjson::Value& name) {
+  return std::string_view(name.GetString(), name.GetStringLength());
+}
+inline bool IsGeneratedId(const rapidjson::Value& name) { return NameOf(name) == kGeneratedIdMember; }
+
+// Name → member lookup of one object, indexed when the object is wide. With
+// duplicate names the first member wins, as with FindMember.
+class MemberIndex {
+ public:
+  explicit MemberIndex(const rapidjson::Value& object);
+  const rapidjson::Value* Find(std::string_view name) const;
+
+ private:
+  const rapidjson::Value& object_;
+  std::unordered_map<std::string_view, rapidjson::SizeType> index_;
+};
+
+// A schema to use for a value the schema does not describe: {"type": T} with
+// T the value's JSON type ("array" schemas describe their first element).
+const rapidjson::Value& SchemaForValue(const rapidjson::Value& value);
+// The kind a schema node declares: its "type", or the first non-"null" entry
+// of a type list; empty when it declares none.
+std::string_view SchemaType(const rapidjson::Value& schema);
+
+class ValueComparer {
+ public:
+  ValueComparer() = default;
+  ValueComparer(const ValueComparer&) = delete;
+  ValueComparer& operator=(const ValueComparer&) = delete;
+
+  bool Equal(const rapidjson::Value& desired, const rapidjson::Value& host, const rapidjson::Value& schema);
+  std::size_t Hash(const rapidjson::Value& value, const rapidjson::Value& schema);
+  bool IsUnset(const rapidjson::Value& value, const rapidjson::Value& schema);
+
+  // The schema of member `name` below `schema` ("properties", then
+  // "additionalProperties"); SchemaForValue(value) when none describes it.
+  const rapidjson::Value& Child(const rapidjson::Value& schema, std::string_view name,
+                                const rapidjson::Value& value);
+  // The element schema of an array schema; SchemaForValue(element) otherwise.
+  const rapidjson::Value& Items(const rapidjson::Value& schema, const rapidjson::Value& element);
+  // True when arrays under `schema` hold objects (by schema, else by content).
+  bool HoldsObjects(const rapidjson::Value& schema, const rapidjson::Value& a, const rapidjson::Value& b);
+
+ private:
+  bool EqualObjects(const rapidjson::Value& d, const rapidjson::Value& h, const rapidjson::Value& schema);
+  bool EqualObjectArrays(const rapidjson::Value& d, const rapidjson::Value& h, const rapidjson::Value& schema);
+  const MemberIndex& SchemaIndex(const rapidjson::Value& properties);
+
+  std::unordered_map<const rapidjson::Value*, std::unique_ptr<MemberIndex>> schemaIndexes_;
+};
+
+// Order-insensitive equality of two arrays of scalars: each element of `b`
+// matches at most one element of `a`, by JSON type, then value.
+bool EqualPrimitiveArrays(const rapidjson::Value& a, const rapidjson::Value& b);
+
+inline std::uint64_t Mix(std::uint64_t x) {
+  x += 0x9e3779b97f4a7c15ULL;
+  x = (x ^ (x >> 30)) * 0xbf58476d1ce4e5b9ULL;
+  x = (x ^ (x >> 27)) * 0x94d049bb133111ebULL;
+  return x ^ (x >> 31);
+}
+
+}  // namespace HoxConfigStore::detail
