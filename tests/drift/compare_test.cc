@@ -1,0 +1,164 @@
+// Schema-aware equality, its hash, scalar-array equality and redaction of
+// configuration values.
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include <hoxcm/config_store.h>
+#include <hoxcm/documents.h>
+
+namespace {
+
+using HoxConfigStore::ConfigStoreDocument;
+using HoxConfigManager::Document;
+
+Document Parse(const std::string& text) {
+  Document doc;
+  HoxConfigManager::ParseDocument(text, doc);
+  return doc;
+}
+
+const char* kUserSchema = R"({
+  "type": "object",
+  "properties": {
+    "name": {"type": "string"},
+    "shell": {"type": "string", "default": "/bin/sh"},
+    "uid": {"type": "integer"},
+    "groups": {"type": "array", "items": {"type": "string"}},
+    "keys": {"type": "array", "items": {"type": "object", "properties": {"key": {"type": "string"}}}},
+    "home": {"type": "object", "properties": {"path": {"type": "string"}, "quota": {"type": "integer"}}}
+  }
+})";
+
+struct EqualityCase {
+  const char* what;
+  const char* desired;
+  const char* host;
+  bool equal;
+};
+
+TEST(IsEqualValueTest, FollowsTheDocumentedRules) {
+  // Given one instance schema, each pair should compare as documented, and
+  // equal pairs should hash alike.
+  const Document schema = Parse(kUserSchema);
+  const std::vector<EqualityCase> cases = {
+      {"identical", R"({"name":"a","uid":1})", R"({"name":"a","uid":1})", true},
+      {"member order does not matter", R"({"uid":1,"name":"a"})", R"({"name":"a","uid":1})", true},
+      {"changed scalar", R"({"name":"a","uid":1})", R"({"name":"a","uid":2})", false},
+      {"integer equals its double", R"({"uid":1})", R"({"uid":1.0})", true},
+      {"string is not a number", R"({"uid":"1"})", R"({"uid":1})", false},
+      {"generated id is ignored", R"({"name":"a","cs_generated_id":"x"})", R"({"name":"a","cs_generated_id":"y"})",
+       true},
+      {"generated id on one side only", R"({"name":"a"})", R"({"name":"a","cs_generated_id":"y"})", true},
+      {"empty string equals absent", R"({"name":"a","shell":""})", R"({"name":"a"})", true},
+      {"null equals absent", R"({"name":"a","uid":null})", R"({"name":"a"})", true},
+      {"absent equals schema default", R"({"name":"a"})", R"({"name":"a","shell":"/bin/sh"})", true},
+      {"absent differs from another value", R"({"name":"a"})", R"({"name":"a","shell":"/bin/bash"})", false},
+      {"empty nested object equals absent", R"({"name":"a","home":{}})", R"({"name":"a"})", true},
+      {"nested object of unset members equals absent", R"({"home":{"path":""}})", R"({})", true},
+      {"nested change", R"({"home":{"path":"/h","quota":1}})", R"({"home":{"quota":1,"path":"/x"}})", false},
+      {"scalar arrays are multisets", R"({"groups":["a","b","b"]})", R"({"groups":["b","a","b"]})", true},
+      {"scalar arrays count duplicates", R"({"groups":["a","b","b"]})", R"({"groups":["a","a","b"]})", false},
+      {"scalar arrays of different length", R"({"groups":["a"]})", R"({"groups":["a","a"]})", false},
+      {"object arrays ignore order", R"({"keys":[{"key":"1"},{"key":"2"}]})", R"({"keys":[{"key":"2"},{"key":"1"}]})",
+       true},
+      {"object arrays compare elements", R"({"keys":[{"key":"1"}]})", R"({"keys":[{"key":"3"}]})", false},
+      {"unknown members compare too", R"({"extra":[1,{"a":2}]})", R"({"extra":[{"a":2},1]})", true},
+      {"unknown member on host only", R"({})", R"({"extra":true})", false},
+      {"object against array", R"({"home":{"path":"/h"}})", R"({"home":["/h"]})", false},
+  };
+  for (const EqualityCase& c : cases) {
+    const Document d = Parse(c.desired);
+    const Document h = Parse(c.host);
+    EXPECT_EQ(ConfigStoreDocument::IsEqualValue(d, h, schema), c.equal) << c.what;
+    EXPECT_EQ(ConfigStoreDocument::IsEqualValue(h, d, schema), c.equal) << c.what << " (swapped)";
+    if (c.equal) {
+      EXPECT_EQ(ConfigStoreDocument::HashValue(d, schema), ConfigStoreDocument::HashValue(h, schema)) << c.what;
+    }
+  }
+}
+
+TEST(IsEqualValueTest, LongArraysMatchThroughHashesLikeShortOnes) {
+  // Given arrays long enough to be matched through hashes, the answer
+  // should be the same as element by element.
+  const Document schema = Parse(kUserSchema);
+  std::string a = R"({"keys":[)", b = R"({"keys":[)", c = R"({"groups":[)", e = R"({"groups":[)";
+  for (int i = 0; i < 100; ++i) {
+    const std::string sep = i ? "," : "";
+    a += sep + R"({"key":")" + std::to_string(i % 7) + R"("})";
+    b += sep + R"({"key":")" + std::to_string((99 - i) % 7) + R"("})";
+    c += sep + std::to_string(i % 5);
+    e += sep + std::to_string((i * 3) % 5);
+  }
+  a += "]}";
+  b += "]}";
+  c += "]}";
+  e += "]}";
+  EXPECT_TRUE(ConfigStoreDocument::IsEqualValue(Parse(a), Parse(b), schema));
+  EXPECT_TRUE(ConfigStoreDocument::IsEqualValue(Parse(c), Parse(e), schema));
+  std::string changed = b;
+  changed.replace(changed.find(R"("key":"3")"), 9, R"("key":"8")");
+  EXPECT_FALSE(ConfigStoreDocument::IsEqualValue(Parse(a), Parse(changed), schema));
+  EXPECT_EQ(ConfigStoreDocument::HashValue(Parse(a), schema), ConfigStoreDocument::HashValue(Parse(b), schema));
+}
+
+TEST(IsEqualPrimitiveArrayTest, MatchesEachElementOnce) {
+  struct Case {
+    const char* a;
+    const char* b;
+    bool equal;
+  };
+  std::string longA = "[", longB = "[";
+  for (int i = 0; i < 40; ++i) {
+    longA += (i ? "," : "") + std::to_string(i % 3);
+    longB += (i ? "," : "") + std::to_string((i + 1) % 3);
+  }
+  longA += "]";
+  longB += "]";
+  std::string longC = longB;
+  longC[1] = '7';
+  const std::vector<Case> cases = {
+      {"[1,2,2]", "[2,1,2]", true},      {"[1,2,2]", "[1,1,2]", false}, {"[1,2]", "[1,2,2]", false},
+      {R"(["1"])", "[1]", false},        {"[true]", "[false]", false},  {"[]", "[]", true},
+      {longA.c_str(), longB.c_str(), false}, {longA.c_str(), longA.c_str(), true}, {longA.c_str(), longC.c_str(), false},
+  };
+  for (const Case& c : cases) {
+    EXPECT_EQ(ConfigStoreDocument::IsEqualPrimitiveArray(Parse(c.a), Parse(c.b)), c.equal) << c.a << " vs " << c.b;
+  }
+  EXPECT_THROW(ConfigStoreDocument::IsEqualPrimitiveArray(Parse("{}"), Parse("[]")),
+               HoxConfigStore::ConfigStoreException);
+}
+
+TEST(RedactAndSerializeValueTest, MasksSensitivePropertiesAtAnyDepth) {
+  const Document schema = Parse(R"({
+    "type": "array",
+    "items": {
+      "type": "object",
+      "properties": {
+        "name": {"type": "string"},
+        "password": {"type": "string", "sensitive": true},
+        "tokens": {"type": "array", "items": {"type": "object",
+                   "properties": {"secret": {"type": "string", "sensitive": true}, "id": {"type": "string"}}}},
+        "nested": {"type": "object", "properties": {"pin": {"type": "integer", "sensitive": true}}},
+        "extra": {"type": "object", "additionalProperties": {"type": "string", "sensitive": true}},
+        "variant": {"oneOf": [{"properties": {"key": {"type": "string"}}},
+                              {"properties": {"key": {"type": "string", "sensitive": true}}}]}
+      }
+    }
+  })");
+  const char* instance = R"({"name":"root","password":"hunter2","tokens":[{"id":"t","secret":"s1"}],)"
+                         R"("nested":{"pin":1234},"extra":{"a":"x"},"variant":{"key":"k"}})";
+  const std::string masked = R"({"name":"root","password":"******","tokens":[{"id":"t","secret":"******"}],)"
+                             R"("nested":{"pin":"******"},"extra":{"a":"******"},"variant":{"key":"******"}})";
+  // An instance with its key's array schema, and the array itself.
+  EXPECT_EQ(ConfigStoreDocument::RedactAndSerializeValue(schema, Parse(instance)), masked);
+  EXPECT_EQ(ConfigStoreDocument::RedactAndSerializeValue(schema, Parse(std::string("[") + instance + "]")),
+            "[" + masked + "]");
+  // A sensitive property on its own, and a value without any schema.
+  EXPECT_EQ(ConfigStoreDocument::RedactAndSerializeValue(schema["items"]["properties"]["password"], Parse("\"pw\"")),
+            "\"******\"");
+  EXPECT_EQ(ConfigStoreDocument::RedactAndSerializeValue(Parse("{}"), Parse(R"({"a":[1,"b"]})")), R"({"a":[1,"b"]})");
+}
+
+}  // namespace

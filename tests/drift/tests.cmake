@@ -1,0 +1,2 @@
+hoxcm_add_test(drift_test
+  drift/compare_test.cc)
