@@ -74,6 +74,9 @@ class HOXCM_API SchemaObject {
   // The schema of one instance (the "items" of a multi-instance key, the
   // whole schema of a singleton).
   virtual const rapidjson::Value& GetInstanceSchema() const = 0;
+  // The key's configuration differs from host to host (addresses, names):
+  // it belongs to a host's own section when a document is split per host.
+  virtual bool IsHostSpecific() const;
 };
 
 class SchemaCache;

@@ -1,3 +1,8 @@
+# The schema store, the host document schema and the JSON validator.
 list(APPEND HOXCM_SOURCES
-  src/platform/schema/stubs.cc
+  src/platform/schema/host_document_schema.cc
+  src/platform/schema/schema_file.cc
+  src/platform/schema/schema_store.cc
+  src/platform/schema/validator.cc
+  src/platform/schema/validator_errors.cc
 )

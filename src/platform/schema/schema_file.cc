@@ -1,0 +1,319 @@
+#include "platform/schema/schema_file.h"
+
+#include <algorithm>
+#include <fstream>
+#include <initializer_list>
+#include <iterator>
+#include <regex>
+#include <set>
+
+#include <hoxcm/json.h>
+
+#include "foundation/json_parse.h"
+#include "platform/schema/valijson.h"
+
+namespace HoxSchemaStore::detail {
+namespace {
+
+constexpr std::size_t kMaxSchemaFileSize = 4u << 20;
+constexpr const char* kGeneratedId = "cs_generated_id";
+
+// Thrown inside this file only, turned into the load error text.
+struct SchemaFileError {
+  std::string reason;
+};
+
+[[noreturn]] void Fail(std::string reason) { throw SchemaFileError{std::move(reason)}; }
+
+bool ReadFile(const std::string& path, std::string& content, std::string& error) {
+  std::ifstream in(path, std::ios::binary);
+  if (!in) {
+    error = "cannot be opened";
+    return false;
+  }
+  content.assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+  if (in.bad()) {
+    error = "cannot be read";
+    return false;
+  }
+  if (content.size() > kMaxSchemaFileSize) {
+    error = "is larger than 4 MiB";
+    return false;
+  }
+  return true;
+}
+
+bool GetBool(const rapidjson::Value& root, const char* name) {
+  auto it = root.FindMember(name);
+  if (it == root.MemberEnd()) return false;
+  if (!it->value.IsBool()) Fail(std::string("\"") + name + "\" must be true or false");
+  return it->value.GetBool();
+}
+
+std::vector<std::string> GetStrings(const rapidjson::Value& root, const char* name) {
+  std::vector<std::string> out;
+  auto it = root.FindMember(name);
+  if (it == root.MemberEnd()) return out;
+  if (!it->value.IsArray()) Fail(std::string("\"") + name + "\" must be an array of strings");
+  for (const auto& v : it->value.GetArray()) {
+    if (!v.IsString() || v.GetStringLength() == 0) {
+      Fail(std::string("\"") + name + "\" must be an array of non-empty strings");
+    }
+    out.emplace_back(v.GetString(), v.GetStringLength());
+  }
+  return out;
+}
+
+std::vector<std::string> GetOperations(const rapidjson::Value& root, const char* name) {
+  std::vector<std::string> ops = GetStrings(root, name);
+  std::set<std::string> seen;
+  for (const auto& op : ops) {
+    if (op != "SET" && op != "ADD" && op != "DELETE") {
+      Fail(std::string("\"") + name + "\" may hold only \"SET\", \"ADD\" and \"DELETE\", not \"" + op + "\"");
+    }
+    if (!seen.insert(op).second) Fail(std::string("\"") + name + "\" lists \"" + op + "\" twice");
+  }
+  return ops;
+}
+
+void CheckRegex(const std::string& pattern, const std::string& where) {
+  try {
+    std::regex compiled(pattern);
+  } catch (const std::regex_error& e) {
+    Fail("invalid regular expression at " + where + ": " + e.what());
+  }
+}
+
+// Applies `visit` to every subschema of `node` reachable through the draft-4
+// keywords, depth first; `where` is a readable location for messages.
+template <typename Visit>
+void ForEachSubschema(const rapidjson::Value& node, const std::string& where, bool propertyNode, Visit& visit) {
+  if (!node.IsObject()) Fail("schema at " + where + " is not an object");
+  visit(node, where, propertyNode);
+  auto members = [&](const char* keyword, bool properties) {
+    auto it = node.FindMember(keyword);
+    if (it == node.MemberEnd()) return;
+    if (!it->value.IsObject()) Fail("\"" + std::string(keyword) + "\" at " + where + " is not an object");
+    for (const auto& m : it->value.GetObject()) {
+      ForEachSubschema(m.value, where + "/" + keyword + "/" + m.name.GetString(), properties, visit);
+    }
+  };
+  auto elements = [&](const char* keyword) {
+    auto it = node.FindMember(keyword);
+    if (it == node.MemberEnd() || !it->value.IsArray()) return;
+    for (rapidjson::SizeType i = 0; i < it->value.Size(); ++i) {
+      ForEachSubschema(it->value[i], where + "/" + keyword + "/" + std::to_string(i), propertyNode, visit);
+    }
+  };
+  members("properties", true);
+  members("patternProperties", true);
+  members("definitions", false);
+  for (const char* keyword : {"additionalProperties", "additionalItems", "not"}) {
+    auto it = node.FindMember(keyword);
+    if (it != node.MemberEnd() && it->value.IsObject()) {
+      ForEachSubschema(it->value, where + "/" + keyword, keyword != std::string("not"), visit);
+    }
+  }
+  auto items = node.FindMember("items");
+  if (items != node.MemberEnd() && items->value.IsObject()) {
+    ForEachSubschema(items->value, where + "/items", propertyNode, visit);
+  }
+  elements("items");
+  elements("allOf");
+  elements("anyOf");
+  elements("oneOf");
+}
+
+// The valijson compilation and the regular expressions of a JSON schema.
+void CheckCompiles(const rapidjson::Value& schema) {
+  auto visit = [](const rapidjson::Value& node, const std::string& where, bool) {
+    auto pattern = node.FindMember("pattern");
+    if (pattern != node.MemberEnd() && pattern->value.IsString()) CheckRegex(pattern->value.GetString(), where);
+    auto pp = node.FindMember("patternProperties");
+    if (pp != node.MemberEnd() && pp->value.IsObject()) {
+      for (const auto& m : pp->value.GetObject()) CheckRegex(m.name.GetString(), where + "/patternProperties");
+    }
+  };
+  ForEachSubschema(schema, "#", false, visit);
+  try {
+    valijson::Schema compiled;
+    valijson::SchemaParser parser(valijson::SchemaParser::kDraft4);
+    valijson::adapters::RapidJsonAdapter adapter(schema);
+    parser.populateSchema(adapter, compiled);
+  } catch (const HoxConfigStore::ConfigStoreException&) {
+    throw;
+  } catch (const std::exception& e) {
+    Fail(std::string("the JSON schema is not usable: ") + e.what());
+  }
+}
+
+// Checks the impact and sensitivity annotations of the instance schema and
+// tells whether any property declares reboot / maintenance-mode triggers.
+void CheckAnnotations(const rapidjson::Value& instance, KeySchema::Definition& def) {
+  auto visit = [&def](const rapidjson::Value& node, const std::string& where, bool propertyNode) {
+    for (const char* keyword : {"rebootRequired", "maintenanceModeRequired"}) {
+      auto it = node.FindMember(keyword);
+      if (it == node.MemberEnd()) continue;
+      if (!propertyNode) Fail("\"" + std::string(keyword) + "\" at " + where + " is not on a property");
+      const rapidjson::Value& v = it->value;
+      auto set = v.IsObject() ? v.FindMember("SET") : rapidjson::Value::ConstMemberIterator();
+      if (!v.IsObject() || set == v.MemberEnd() || !set->value.IsArray() || v.MemberCount() != 1) {
+        Fail("\"" + std::string(keyword) + "\" at " + where + " must be {\"SET\": [trigger values]}");
+      }
+      (keyword == std::string("rebootRequired") ? def.rebootPropertyLevel : def.maintenanceModePropertyLevel) = true;
+    }
+    auto sensitive = node.FindMember("sensitive");
+    if (sensitive != node.MemberEnd() && !sensitive->value.IsBool()) {
+      Fail("\"sensitive\" at " + where + " must be true or false");
+    }
+  };
+  ForEachSubschema(instance, "#", false, visit);
+}
+
+bool ListsString(const rapidjson::Value& array, const std::string& s) {
+  if (!array.IsArray()) return false;
+  for (const auto& v : array.GetArray()) {
+    if (v.IsString() && s == v.GetString()) return true;
+  }
+  return false;
+}
+
+void CheckIdentity(rapidjson::Value& instance, const std::string& identity, rapidjson::Document::AllocatorType& a) {
+  auto props = instance.FindMember("properties");
+  if (props == instance.MemberEnd()) {
+    instance.AddMember("properties", rapidjson::Value(rapidjson::kObjectType), a);
+    props = instance.FindMember("properties");
+  }
+  if (!props->value.IsObject()) Fail("\"properties\" of the schema is not an object");
+  if (identity == kGeneratedId) {
+    // Instances carry the store's generated identity; declare it so that
+    // schemas may forbid additional properties.
+    if (!props->value.HasMember(kGeneratedId)) {
+      rapidjson::Value type(rapidjson::kObjectType);
+      type.AddMember("type", "string", a);
+      props->value.AddMember(rapidjson::Value(kGeneratedId, a), type, a);
+    }
+    return;
+  }
+  auto member = props->value.FindMember(identity.c_str());
+  auto required = instance.FindMember("required");
+  if (member == props->value.MemberEnd() || !member->value.IsObject() ||
+      !member->value.HasMember("type") || member->value["type"] != "string" ||
+      required == instance.MemberEnd() || !ListsString(required->value, identity)) {
+    Fail("identity member \"" + identity + "\" must be a required property of type \"string\"");
+  }
+}
+
+KeySchema::Definition ReadDefinition(const rapidjson::Value& root, const SchemaObjectId& id, const std::string& path) {
+  static const std::set<std::string> kMembers = {
+      "formatVersion", "description", "multiInstance", "identity", "defaultUserConfig", "mutableDefault",
+      "hostSpecific", "solutionUsers", "solutionInstanceIds", "rebootRequired", "maintenanceModeRequired", "schema"};
+  if (!root.IsObject()) Fail("the file is not a JSON object");
+  for (const auto& m : root.GetObject()) {
+    if (!kMembers.count(m.name.GetString())) Fail("unknown member \"" + std::string(m.name.GetString()) + "\"");
+  }
+  auto version = root.FindMember("formatVersion");
+  if (version != root.MemberEnd() && !(version->value.IsInt() && version->value.GetInt() == 1)) {
+    Fail("\"formatVersion\" must be 1");
+  }
+  auto description = root.FindMember("description");
+  if (description != root.MemberEnd() && !description->value.IsString()) Fail("\"description\" must be a string");
+  auto multi = root.FindMember("multiInstance");
+  if (multi == root.MemberEnd() || !multi->value.IsBool()) Fail("\"multiInstance\" must be true or false");
+
+  KeySchema::Definition def;
+  def.id = id;
+  def.file = path;
+  def.multiInstance = multi->value.GetBool();
+  auto identity = root.FindMember("identity");
+  if (def.multiInstance) {
+    if (identity == root.MemberEnd() || !identity->value.IsString() || identity->value.GetStringLength() == 0) {
+      Fail("a multi-instance key needs \"identity\": a property name or \"cs_generated_id\"");
+    }
+    def.identity = identity->value.GetString();
+  } else if (identity != root.MemberEnd()) {
+    Fail("a singleton key has no \"identity\"");
+  }
+  def.defaultUserConfig = GetBool(root, "defaultUserConfig");
+  def.mutableDefault = GetBool(root, "mutableDefault");
+  if (def.mutableDefault && !def.defaultUserConfig) Fail("\"mutableDefault\" needs \"defaultUserConfig\"");
+  def.hostSpecific = GetBool(root, "hostSpecific");
+  def.solutionUsers = GetStrings(root, "solutionUsers");
+  def.solutionInstanceIds = GetStrings(root, "solutionInstanceIds");
+  if (!def.multiInstance && (!def.solutionUsers.empty() || !def.solutionInstanceIds.empty())) {
+    Fail("only a multi-instance key has solution users or solution instances");
+  }
+  def.rebootOperations = GetOperations(root, "rebootRequired");
+  def.maintenanceModeOperations = GetOperations(root, "maintenanceModeRequired");
+  return def;
+}
+
+}  // namespace
+
+KeySchema::KeySchema(Definition definition, const rapidjson::Value& instanceSchema) : def_(std::move(definition)) {
+  auto& a = schema_.GetAllocator();
+  if (def_.multiInstance) {
+    schema_.SetObject();
+    schema_.AddMember("type", "array", a);
+    schema_.AddMember("items", rapidjson::Value(instanceSchema, a), a);
+  } else {
+    schema_.CopyFrom(instanceSchema, a);
+  }
+}
+
+int KeySchema::GetRebootOperations(std::vector<std::string>& operations, bool& propertyLevel) const {
+  operations = def_.rebootOperations;
+  propertyLevel = def_.rebootPropertyLevel;
+  return 0;
+}
+
+int KeySchema::GetMaintenanceModeOperations(std::vector<std::string>& operations, bool& propertyLevel) const {
+  operations = def_.maintenanceModeOperations;
+  propertyLevel = def_.maintenanceModePropertyLevel;
+  return 0;
+}
+
+std::shared_ptr<KeySchema> LoadSchemaFile(const std::string& path, const SchemaObjectId& id, std::string& error) {
+  std::string content;
+  if (!ReadFile(path, content, error)) return nullptr;
+  rapidjson::Document root;
+  std::string parseError;
+  if (!HoxConfigManager::detail::ParseJson(content.data(), content.size(), root, &parseError)) {
+    error = "not valid JSON: " + parseError;
+    return nullptr;
+  }
+  try {
+    KeySchema::Definition def = ReadDefinition(root, id, path);
+    auto schema = root.FindMember("schema");
+    if (schema == root.MemberEnd() || !schema->value.IsObject()) Fail("\"schema\" must be a JSON schema object");
+    rapidjson::Value& instance = schema->value;
+    auto type = instance.FindMember("type");
+    if (type == instance.MemberEnd() || type->value != "object") {
+      Fail("the schema of " + std::string(def.multiInstance ? "an instance" : "the key") +
+           " must have \"type\": \"object\"");
+    }
+    if (def.multiInstance) CheckIdentity(instance, def.identity, root.GetAllocator());
+    CheckAnnotations(instance, def);
+    auto key = std::make_shared<KeySchema>(std::move(def), instance);
+    CheckCompiles(key->GetJsonSchema());
+    return key;
+  } catch (const SchemaFileError& e) {
+    error = e.reason;
+  } catch (const HoxConfigStore::ConfigStoreException& e) {
+    error = e.what();
+  }
+  return nullptr;
+}
+
+std::string CheckJsonSchema(const rapidjson::Value& schema) {
+  try {
+    CheckCompiles(schema);
+  } catch (const SchemaFileError& e) {
+    return e.reason;
+  } catch (const HoxConfigStore::ConfigStoreException& e) {
+    return e.what();
+  }
+  return std::string();
+}
+
+}  // namespace HoxSchemaStore::detail

@@ -1,0 +1,72 @@
+// One key's schema file, read and checked: the SchemaObject implementation
+// that the schema store hands out. The file format is described in
+// docs/schema-store.md.
+//
+// A KeySchema is immutable once built and may be shared between threads.
+#pragma once
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include <hoxcm/schema_store.h>
+
+namespace HoxSchemaStore::detail {
+
+class KeySchema final : public SchemaObject {
+ public:
+  // Everything a schema file declares, already checked.
+  struct Definition {
+    SchemaObjectId id;
+    std::string file;  // host path of the file, for GetSchemaInfo
+    bool multiInstance = false;
+    std::string identity;
+    bool defaultUserConfig = false;
+    bool mutableDefault = false;
+    bool hostSpecific = false;
+    std::vector<std::string> solutionUsers;
+    std::vector<std::string> solutionInstanceIds;
+    std::vector<std::string> rebootOperations;
+    std::vector<std::string> maintenanceModeOperations;
+    bool rebootPropertyLevel = false;
+    bool maintenanceModePropertyLevel = false;
+  };
+
+  // `instanceSchema` is the schema of one instance (of the singleton).
+  KeySchema(Definition definition, const rapidjson::Value& instanceSchema);
+  KeySchema(const KeySchema&) = delete;
+  KeySchema& operator=(const KeySchema&) = delete;
+
+  const SchemaObjectId& GetId() const override { return def_.id; }
+  bool IsMultiInstance() const override { return def_.multiInstance; }
+  const std::string& GetIdentityMember() const override { return def_.identity; }
+  bool HasDefaultUserConfig() const override { return def_.defaultUserConfig; }
+  bool IsMutableDefault() const override { return def_.mutableDefault; }
+  const std::vector<std::string>& GetSolutionUserNames() const override { return def_.solutionUsers; }
+  const std::vector<std::string>& GetSolutionInstanceIds() const override { return def_.solutionInstanceIds; }
+  int GetRebootOperations(std::vector<std::string>& operations, bool& propertyLevel) const override;
+  int GetMaintenanceModeOperations(std::vector<std::string>& operations, bool& propertyLevel) const override;
+  const rapidjson::Value& GetJsonSchema() const override { return schema_; }
+  const rapidjson::Value& GetInstanceSchema() const override {
+    return def_.multiInstance ? schema_["items"] : static_cast<const rapidjson::Value&>(schema_);
+  }
+
+  bool IsHostSpecific() const override { return def_.hostSpecific; }
+
+  const Definition& definition() const { return def_; }
+
+ private:
+  const Definition def_;
+  rapidjson::Document schema_;
+};
+
+// Reads and checks the schema file at `path` for the key `id`. Null with a
+// reason in `error` when the file is unreadable or malformed.
+std::shared_ptr<KeySchema> LoadSchemaFile(const std::string& path, const SchemaObjectId& id, std::string& error);
+
+// Checks `schema` (a JSON schema) for use by the validator: it must be an
+// object that the validator can compile, with valid regular expressions.
+// Empty when usable, else the reason.
+std::string CheckJsonSchema(const rapidjson::Value& schema);
+
+}  // namespace HoxSchemaStore::detail

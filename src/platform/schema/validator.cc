@@ -1,0 +1,269 @@
+// JSON schema validation: the schema engine (draft 4) for the standard
+// keywords, plus our "unionTag" keyword, and the findings in our format.
+#include <set>
+#include <string>
+#include <vector>
+
+#include <hoxcm/json.h>
+#include <hoxcm/schema_store.h>
+
+#include "platform/schema/validator_errors.h"
+#include "platform/schema/valijson.h"
+
+namespace JsonValidator {
+namespace {
+
+using detail::Finding;
+using rapidjson::Value;
+
+// Unions nest inside union variants; a schema that nests deeper is refused.
+constexpr int kMaxUnionDepth = 32;
+// $ref chains longer than this are taken as a loop.
+constexpr int kMaxRefHops = 32;
+
+bool ContainsUnionTag(const Value& node) {
+  if (node.IsObject()) {
+    for (const auto& m : node.GetObject()) {
+      if (m.name == "unionTag" || ContainsUnionTag(m.value)) return true;
+    }
+  } else if (node.IsArray()) {
+    for (const auto& v : node.GetArray()) {
+      if (ContainsUnionTag(v)) return true;
+    }
+  }
+  return false;
+}
+
+// The engine does not know union tags: it gets the schema without the
+// variant lists of union nodes, which the union walk checks instead.
+void RemoveUnionVariants(Value& node) {
+  if (node.IsObject()) {
+    if (node.HasMember("unionTag")) node.RemoveMember("oneOf");
+    for (auto& m : node.GetObject()) RemoveUnionVariants(m.value);
+  } else if (node.IsArray()) {
+    for (auto& v : node.GetArray()) RemoveUnionVariants(v);
+  }
+}
+
+Finding SchemaInvalid(const std::string& path, const std::string& reason) {
+  Finding f;
+  f.field = path;
+  f.code = VALIDATION_ERR_SCHEMA_INVALID;
+  f.args.push_back(reason);
+  f.text = "The schema is not usable: " + reason;
+  return f;
+}
+
+std::string ContextToPath(const std::string& base, const std::vector<std::string>& context) {
+  std::string path = base;
+  // The first element names the root ("<root>"); the others are "[name]".
+  for (std::size_t i = 1; i < context.size(); ++i) {
+    const std::string& part = context[i];
+    path += '/';
+    path += part.size() >= 2 ? part.substr(1, part.size() - 2) : part;
+  }
+  return path;
+}
+
+void RunEngine(const Value& schema, const Value& document, const std::string& path, std::vector<Finding>& out) {
+  valijson::ValidationResults results;
+  try {
+    valijson::Schema compiled;
+    valijson::SchemaParser parser(valijson::SchemaParser::kDraft4);
+    valijson::adapters::RapidJsonAdapter schemaAdapter(schema);
+    parser.populateSchema(schemaAdapter, compiled);
+    valijson::Validator validator;
+    valijson::adapters::RapidJsonAdapter target(document);
+    validator.validate(compiled, target, &results);
+  } catch (const std::exception& e) {
+    out.push_back(SchemaInvalid(path, e.what()));
+    return;
+  }
+  valijson::ValidationResults::Error error;
+  std::set<std::tuple<std::string, int, std::string>> seen;
+  while (results.popError(error)) {
+    Finding f;
+    if (!detail::ClassifyEngineError(ContextToPath(path, error.context), error.description, f)) continue;
+    // Variants of a failed oneOf/anyOf may report the same fault twice.
+    if (!seen.emplace(f.field, f.code, f.text).second) continue;
+    out.push_back(std::move(f));
+  }
+}
+
+void ValidateValue(const Value& schema, const Value& document, const std::string& path, int depth,
+                   std::vector<Finding>& out);
+
+class UnionWalk {
+ public:
+  UnionWalk(const Value& root, int depth, std::vector<Finding>& out) : root_(root), depth_(depth), out_(out) {}
+
+  void Walk(const Value& doc, const Value* node, const std::string& path) {
+    node = Resolve(node);
+    if (node == nullptr || !node->IsObject()) return;
+    auto tag = node->FindMember("unionTag");
+    if (tag != node->MemberEnd() && tag->value.IsString() && doc.IsObject()) CheckUnion(doc, *node, tag->value, path);
+    auto allOf = node->FindMember("allOf");
+    if (allOf != node->MemberEnd() && allOf->value.IsArray()) {
+      for (const auto& branch : allOf->value.GetArray()) Walk(doc, &branch, path);
+    }
+    if (doc.IsObject()) {
+      auto props = node->FindMember("properties");
+      auto extra = node->FindMember("additionalProperties");
+      for (const auto& m : doc.GetObject()) {
+        const Value* child = nullptr;
+        if (props != node->MemberEnd() && props->value.IsObject()) {
+          auto p = props->value.FindMember(m.name);
+          if (p != props->value.MemberEnd()) child = &p->value;
+        }
+        if (child == nullptr && extra != node->MemberEnd() && extra->value.IsObject()) child = &extra->value;
+        if (child != nullptr) Walk(m.value, child, path + "/" + m.name.GetString());
+      }
+    } else if (doc.IsArray()) {
+      auto items = node->FindMember("items");
+      if (items == node->MemberEnd()) return;
+      for (rapidjson::SizeType i = 0; i < doc.Size(); ++i) {
+        const Value* child = nullptr;
+        if (items->value.IsObject()) {
+          child = &items->value;
+        } else if (items->value.IsArray() && i < items->value.Size()) {
+          child = &items->value[i];
+        }
+        if (child != nullptr) Walk(doc[i], child, path + "/" + std::to_string(i));
+      }
+    }
+  }
+
+ private:
+  const Value* Resolve(const Value* node) const {
+    for (int hop = 0; node != nullptr && node->IsObject() && hop < kMaxRefHops; ++hop) {
+      auto ref = node->FindMember("$ref");
+      if (ref == node->MemberEnd()) return node;
+      if (!ref->value.IsString() || ref->value.GetString()[0] != '#') return nullptr;
+      rapidjson::Pointer pointer(ref->value.GetString(), ref->value.GetStringLength());
+      node = pointer.IsValid() ? pointer.Get(root_) : nullptr;
+    }
+    return node;
+  }
+
+  void CheckUnion(const Value& doc, const Value& node, const Value& tagName, const std::string& path) {
+    const std::string tag = tagName.GetString();
+    auto variants = node.FindMember("oneOf");
+    if (variants == node.MemberEnd() || !variants->value.IsArray()) return;
+    Finding f;
+    f.field = path + "/" + tag;
+    f.code = VALIDATION_ERR_UNION_TAG;
+    f.args.push_back(tag);
+    auto value = doc.FindMember(tagName);
+    if (value == doc.MemberEnd() || !value->value.IsString()) {
+      f.text = "The union tag property '" + tag + "' is missing or not a string.";
+      out_.push_back(std::move(f));
+      return;
+    }
+    for (const auto& variant : variants->value.GetArray()) {
+      if (!Selects(variant, tagName, value->value)) continue;
+      // Validate against the chosen variant alone, so that the findings name
+      // its faults instead of "matches no variant".
+      rapidjson::Document sub;
+      sub.CopyFrom(variant, sub.GetAllocator());
+      auto definitions = root_.IsObject() ? root_.FindMember("definitions") : root_.MemberEnd();
+      if (sub.IsObject() && !sub.HasMember("definitions") && definitions != root_.MemberEnd()) {
+        sub.AddMember("definitions", Value(definitions->value, sub.GetAllocator()), sub.GetAllocator());
+      }
+      ValidateValue(sub, doc, path, depth_ + 1, out_);
+      return;
+    }
+    f.text = "The union tag property '" + tag + "' does not name a variant.";
+    out_.push_back(std::move(f));
+  }
+
+  // A variant is chosen by the values its tag property allows ("enum").
+  static bool Selects(const Value& variant, const Value& tagName, const Value& tagValue) {
+    if (!variant.IsObject()) return false;
+    auto props = variant.FindMember("properties");
+    if (props == variant.MemberEnd() || !props->value.IsObject()) return false;
+    auto tag = props->value.FindMember(tagName);
+    if (tag == props->value.MemberEnd() || !tag->value.IsObject()) return false;
+    auto allowed = tag->value.FindMember("enum");
+    if (allowed == tag->value.MemberEnd() || !allowed->value.IsArray()) return false;
+    for (const auto& v : allowed->value.GetArray()) {
+      if (v == tagValue) return true;
+    }
+    return false;
+  }
+
+  const Value& root_;
+  const int depth_;
+  std::vector<Finding>& out_;
+};
+
+void ValidateValue(const Value& schema, const Value& document, const std::string& path, int depth,
+                   std::vector<Finding>& out) {
+  if (!schema.IsObject()) {
+    out.push_back(SchemaInvalid(path, "a schema must be a JSON object"));
+    return;
+  }
+  if (depth > kMaxUnionDepth) {
+    out.push_back(SchemaInvalid(path, "union variants nest too deeply"));
+    return;
+  }
+  if (!ContainsUnionTag(schema)) {
+    RunEngine(schema, document, path, out);
+    return;
+  }
+  rapidjson::Document stripped;
+  stripped.CopyFrom(schema, stripped.GetAllocator());
+  RemoveUnionVariants(stripped);
+  RunEngine(stripped, document, path, out);
+  UnionWalk(schema, depth, out).Walk(document, &schema, path);
+}
+
+int WriteFindings(const std::vector<Finding>& findings, const std::set<int>& ignored, rapidjson::Document& result) {
+  result.SetArray();
+  auto& a = result.GetAllocator();
+  int kept = 0;
+  for (const Finding& f : findings) {
+    if (ignored.count(f.code)) continue;
+    Value entry(rapidjson::kObjectType);
+    entry.AddMember("field", Value(f.field, a), a);
+    entry.AddMember("errId", f.code, a);
+    Value args(rapidjson::kArrayType);
+    for (const auto& arg : f.args) args.PushBack(Value(arg, a), a);
+    entry.AddMember("errArgs", args, a);
+    entry.AddMember("error", Value(f.text, a), a);
+    result.PushBack(entry, a);
+    ++kept;
+  }
+  return kept;
+}
+
+std::size_t Depth(const std::string& field, const std::string& context) {
+  std::size_t depth = 0;
+  for (std::size_t i = context.size(); i < field.size(); ++i) depth += field[i] == '/';
+  return depth;
+}
+
+}  // namespace
+
+int Validate(const Value& schema, const Value& document, rapidjson::Document& result, const std::set<int>& ignored,
+             const std::string& context) {
+  std::vector<Finding> findings;
+  ValidateValue(schema, document, context, 0, findings);
+  return WriteFindings(findings, ignored, result);
+}
+
+int ValidateCMDocument(const Value& schema, const Value& document, rapidjson::Document& result,
+                       const std::set<int>& ignored, const std::string& context) {
+  std::vector<Finding> findings;
+  ValidateValue(schema, document, context, 0, findings);
+  for (Finding& f : findings) {
+    // Members the host document schema does not know, down to key level,
+    // are configuration keys without a schema.
+    if (f.code == VALIDATION_ERR_ADDITIONAL_PROPERTIES && Depth(f.field, context) <= 3) {
+      f.code = VALIDATION_ERR_UNKNOWN_KEY;
+      f.text = "No schema for " + f.field.substr(context.size());
+    }
+  }
+  return WriteFindings(findings, ignored, result);
+}
+
+}  // namespace JsonValidator

@@ -1,0 +1,167 @@
+#include "platform/schema/validator_errors.h"
+
+#include <cctype>
+#include <string_view>
+
+#include <hoxcm/schema_store.h>
+
+namespace JsonValidator {
+namespace {
+
+struct Rule {
+  std::string_view prefix;
+  int code;
+  bool limitArgument;  // the schema's limit follows as the second argument
+};
+
+// Reports that merely say a child failed; the child reported itself.
+constexpr std::string_view kPropagation[] = {
+    "Failed to validate item #",
+    "Failed to validate against schema associated with property name",
+    "Failed to validate against schema associated with pattern",
+    "Failed to validate against additional properties schema",
+    "Failed to validate against child schema #",
+    "Failed to validate against dependent schema",
+};
+
+// The engine's report texts, by prefix. Order matters where one prefix
+// extends another.
+constexpr Rule kRules[] = {
+    {"Value type not permitted by 'type' constraint", VALIDATION_ERR_TYPE, false},
+    {"Failed to match against any enum values", VALIDATION_ERR_ENUM, false},
+    {"Target value and comparison value are not equal", VALIDATION_ERR_ENUM, false},
+    {"Failed to match expected value set by 'const'", VALIDATION_ERR_ENUM, false},
+    {"Expected number greater than", VALIDATION_ERR_MINIMUM, true},
+    {"Expected number less than", VALIDATION_ERR_MAXIMUM, true},
+    {"String should be no fewer than", VALIDATION_ERR_MIN_LENGTH, true},
+    {"String should be no more than", VALIDATION_ERR_MAX_LENGTH, true},
+    {"Failed to match regex specified by 'pattern'", VALIDATION_ERR_PATTERN, false},
+    {"Missing required property", VALIDATION_ERR_REQUIRED, false},
+    {"Object contains a property that could not be validated", VALIDATION_ERR_ADDITIONAL_PROPERTIES, false},
+    {"Array should contain no fewer than", VALIDATION_ERR_MIN_ITEMS, true},
+    {"Array should contain no more than", VALIDATION_ERR_MAX_ITEMS, true},
+    {"Elements at indexes", VALIDATION_ERR_UNIQUE_ITEMS, false},
+    {"String should be a valid", VALIDATION_ERR_FORMAT, false},
+    {"Failed to validate against any child schemas allowed by oneOf", VALIDATION_ERR_ONE_OF, false},
+    {"Failed to validate against exactly one child schema", VALIDATION_ERR_ONE_OF, false},
+    {"Failed to validate against any schemas allowed by anyOf", VALIDATION_ERR_ANY_OF, false},
+    {"Target should not validate against schema specified in 'not'", VALIDATION_ERR_NOT, false},
+    {"Value should be a multiple of", VALIDATION_ERR_MULTIPLE_OF, true},
+    {"Value could not be converted", VALIDATION_ERR_MULTIPLE_OF, false},
+    {"Missing dependency", VALIDATION_ERR_DEPENDENCIES, false},
+    {"Object should have no fewer than", VALIDATION_ERR_MIN_PROPERTIES, true},
+    {"Object should have no more than", VALIDATION_ERR_MAX_PROPERTIES, true},
+    {"Array contains more items than allowed", VALIDATION_ERR_ADDITIONAL_ITEMS, false},
+    {"Cannot validate item #", VALIDATION_ERR_ADDITIONAL_ITEMS, false},
+};
+
+// The first number of a text, trailing zeros of its fraction removed
+// ("1280.000000" -> "1280").
+std::string FirstNumber(std::string_view text) {
+  std::size_t i = 0;
+  while (i < text.size() && !std::isdigit(static_cast<unsigned char>(text[i]))) ++i;
+  if (i == text.size()) return std::string();
+  std::size_t start = (i > 0 && text[i - 1] == '-') ? i - 1 : i;
+  std::size_t end = i;
+  while (end < text.size() && (std::isdigit(static_cast<unsigned char>(text[end])) || text[end] == '.')) ++end;
+  std::string number(text.substr(start, end - start));
+  if (number.back() == '.') number.pop_back();
+  if (number.find('.') != std::string::npos) {
+    while (number.back() == '0') number.pop_back();
+    if (number.back() == '.') number.pop_back();
+  }
+  return number;
+}
+
+// The quoted name in "Missing required property 'name'." and alike.
+std::string QuotedName(const std::string& text) {
+  std::size_t first = text.find('\'');
+  std::size_t last = text.rfind('\'');
+  if (first == std::string::npos || last <= first) return std::string();
+  return text.substr(first + 1, last - first - 1);
+}
+
+}  // namespace
+
+namespace detail {
+
+std::string LastSegment(const std::string& field) {
+  std::size_t slash = field.rfind('/');
+  return slash == std::string::npos ? field : field.substr(slash + 1);
+}
+
+bool ClassifyEngineError(const std::string& path, const std::string& description, Finding& out) {
+  for (std::string_view prefix : kPropagation) {
+    if (description.starts_with(prefix)) return false;
+  }
+  out = Finding();
+  out.code = VALIDATION_ERR_GENERIC;
+  out.field = path;
+  out.text = description;
+  for (const Rule& rule : kRules) {
+    if (!description.starts_with(rule.prefix)) continue;
+    out.code = rule.code;
+    if (rule.limitArgument) {
+      out.args.push_back(LastSegment(path));
+      out.args.push_back(FirstNumber(description));
+      return true;
+    }
+    break;
+  }
+  // Missing or unexpected members are reported at the member's own field.
+  if (out.code == VALIDATION_ERR_REQUIRED || out.code == VALIDATION_ERR_ADDITIONAL_PROPERTIES ||
+      out.code == VALIDATION_ERR_DEPENDENCIES) {
+    const std::string name = QuotedName(description);
+    out.field = path + "/" + name;
+    out.args.push_back(name);
+    return true;
+  }
+  out.args.push_back(LastSegment(path));
+  return true;
+}
+
+}  // namespace detail
+
+std::string ConvertErrorCodeToMsgId(int code) {
+  static constexpr std::string_view kPrefix = "com.tarvik.hox.settings.validation.";
+  struct Entry {
+    int code;
+    std::string_view suffix;
+  };
+  static constexpr Entry kTable[] = {
+      {VALIDATION_OK, "ok"},
+      {VALIDATION_ERR_GENERIC, "invalid"},
+      {VALIDATION_ERR_TYPE, "type"},
+      {VALIDATION_ERR_ENUM, "enum"},
+      {VALIDATION_ERR_MINIMUM, "minimum"},
+      {VALIDATION_ERR_MAXIMUM, "maximum"},
+      {VALIDATION_ERR_MIN_LENGTH, "min.length"},
+      {VALIDATION_ERR_MAX_LENGTH, "max.length"},
+      {VALIDATION_ERR_PATTERN, "pattern"},
+      {VALIDATION_ERR_REQUIRED, "required"},
+      {VALIDATION_ERR_ADDITIONAL_PROPERTIES, "additional.properties"},
+      {VALIDATION_ERR_MIN_ITEMS, "min.items"},
+      {VALIDATION_ERR_MAX_ITEMS, "max.items"},
+      {VALIDATION_ERR_UNIQUE_ITEMS, "unique.items"},
+      {VALIDATION_ERR_FORMAT, "format"},
+      {VALIDATION_ERR_ONE_OF, "one.of"},
+      {VALIDATION_ERR_ANY_OF, "any.of"},
+      {VALIDATION_ERR_ALL_OF, "all.of"},
+      {VALIDATION_ERR_NOT, "not"},
+      {VALIDATION_ERR_MULTIPLE_OF, "multiple.of"},
+      {VALIDATION_ERR_DEPENDENCIES, "dependencies"},
+      {VALIDATION_ERR_MIN_PROPERTIES, "min.properties"},
+      {VALIDATION_ERR_MAX_PROPERTIES, "max.properties"},
+      {VALIDATION_ERR_ADDITIONAL_ITEMS, "additional.items"},
+      {VALIDATION_ERR_UNKNOWN_KEY, "unknown.key"},
+      {VALIDATION_ERR_SCHEMA_INVALID, "schema.invalid"},
+      {VALIDATION_ERR_UNION_TAG, "union.tag"},
+  };
+  std::string_view suffix = "invalid";
+  for (const Entry& e : kTable) {
+    if (e.code == code) suffix = e.suffix;
+  }
+  return std::string(kPrefix) + std::string(suffix);
+}
+
+}  // namespace JsonValidator
