@@ -1,2 +1,3 @@
 hoxcm_add_test(drift_test
-  drift/compare_test.cc)
+  drift/compare_test.cc
+  drift/drift_walk_test.cc)

@@ -1,0 +1,48 @@
+// A drift handler for tests that records every call as one line of text.
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include <hoxcm/documents.h>
+#include <hoxcm/drift.h>
+
+namespace hoxcm_test {
+
+class RecordingHandler final : public HoxConfigManager::DriftHandler {
+ public:
+  RecordingHandler(bool consolidated = true, bool driftRecords = true, bool perProperty = false)
+      : DriftHandler(consolidated, driftRecords, perProperty) {}
+
+  void Add(const HoxConfigManager::Value& desired, const HoxConfigStore::ConfigStoreObjectId& id,
+           const std::shared_ptr<HoxSchemaStore::SchemaObject>&, const std::string& path) override {
+    calls.push_back("Add " + path + Id(id) + " " + Text(desired));
+  }
+  void Set(const HoxConfigManager::Value& desired, const HoxConfigManager::Value& current,
+           const HoxConfigStore::ConfigStoreObjectId& id, const std::shared_ptr<HoxSchemaStore::SchemaObject>&,
+           const std::string& path, const HoxConfigManager::Value& drift) override {
+    calls.push_back("Set " + path + Id(id) + " " + Text(desired) + " " + Text(current));
+    records.push_back(Text(drift));
+  }
+  void Delete(const HoxConfigManager::Value& current, const HoxConfigStore::ConfigStoreObjectId& id,
+              const std::shared_ptr<HoxSchemaStore::SchemaObject>&, const std::string& path) override {
+    calls.push_back("Delete " + path + Id(id) + " " + Text(current));
+  }
+  void PropertyDrift(const HoxConfigManager::Value& desired, const HoxConfigManager::Value& current,
+                     const HoxConfigManager::Value&, const std::string& path,
+                     HoxConfigManager::ACTION action) override {
+    calls.push_back(std::string("Property ") + HoxConfigManager::ActionName(action) + " " + path + " " +
+                    Text(desired) + " " + Text(current));
+  }
+
+  std::vector<std::string> calls;
+  std::vector<std::string> records;
+
+ private:
+  static std::string Id(const HoxConfigStore::ConfigStoreObjectId& id) {
+    return id.instanceId.empty() ? "" : " [" + id.instanceId + "]";
+  }
+  static std::string Text(const HoxConfigManager::Value& v) { return HoxConfigManager::JsonToString(v); }
+};
+
+}  // namespace hoxcm_test
