@@ -81,6 +81,9 @@ HOXCM_API ConfigMapList GetUserConfigContents(const std::shared_ptr<DBStore>& db
 HOXCM_API ConfigMapList GetDesiredUserConfigContents(const std::shared_ptr<DBStore>& db);
 HOXCM_API ConfigMapList GetDefaultUserConfigContents(const std::shared_ptr<DBStore>& db);
 HOXCM_API ConfigMapList GetSmartnicConfiguration(const std::shared_ptr<DBStore>& db);
+HOXCM_API ConfigMapList GetDesiredSmartnicConfiguration(const std::shared_ptr<DBStore>& db);
+// The rows of any configuration kind, in the same order.
+HOXCM_API ConfigMapList GetConfigContents(const std::shared_ptr<DBStore>& db, ConfigKind kind);
 // Default user configuration rows of one object (all instances of the key
 // when the id has no instance).
 HOXCM_API ConfigMapList GetDefaultUserConfigMapList(const ConfigStoreObjectId& id,
@@ -101,6 +104,9 @@ struct HOXCM_API UserConfigChange {
 };
 // Applies all changes in one transaction: all or nothing.
 HOXCM_API void ApplyUserConfigChanges(const std::vector<UserConfigChange>& changes);
+// Sets (or, with an empty text, clears) the auto-configuration value (JSON
+// object text, "AutoConfValue") of an existing row; no row, no change.
+HOXCM_API void SetAutoConfValue(ConfigKind kind, const ConfigStoreObjectId& id, const std::string& autoConfValue);
 
 HOXCM_API BOOTMODE GetBootMode();
 HOXCM_API void SetBootMode(BOOTMODE mode);

@@ -1,3 +1,4 @@
 list(APPEND HOXCM_SOURCES
-  src/platform/host/stubs.cc
+  src/platform/host/host_facts.cc
+  src/platform/host/ssh_sync.cc
 )

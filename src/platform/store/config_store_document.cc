@@ -1,9 +1,380 @@
+// Building, reshaping and serialising configuration documents: host
+// sections, clean-up, normalisation and auto-configuration patches.
+#include <algorithm>
+#include <cctype>
+#include <string_view>
+#include <vector>
+
 #include <hoxcm/config_store.h>
+#include <hoxcm/documents.h>
+#include <hoxcm/host.h>
+
+#include "foundation/json_parse.h"
 
 namespace HoxConfigStore {
+namespace {
+
+using Allocator = rapidjson::MemoryPoolAllocator<>;
+using rapidjson::Value;
+
+constexpr const char* kProfile = "profile";
+constexpr const char* kHostSpecific = "hostSpecific";
+constexpr const char* kGeneratedId = "cs_generated_id";
+
+std::string_view Name(const Value& name) { return {name.GetString(), name.GetStringLength()}; }
+
+// The object member `name` of `parent`, created empty when missing; an
+// existing member that is not an object is "Invalid JSON".
+Value& ObjectMember(Value& parent, std::string_view name, Allocator& allocator) {
+  RAPIDJSON_ASSERT(parent.IsObject());
+  const Value key(rapidjson::StringRef(name.data(), name.size()));
+  auto it = parent.FindMember(key);
+  if (it == parent.MemberEnd()) {
+    parent.AddMember(Value(name.data(), static_cast<rapidjson::SizeType>(name.size()), allocator),
+                     Value(rapidjson::kObjectType), allocator);
+    return (parent.MemberEnd() - 1)->value;
+  }
+  RAPIDJSON_ASSERT(it->value.IsObject());
+  return it->value;
+}
+
+// Sets parent[name] to `value` (moved), replacing an existing member.
+void SetMember(Value& parent, std::string_view name, Value& value, Allocator& allocator) {
+  const Value key(rapidjson::StringRef(name.data(), name.size()));
+  auto it = parent.FindMember(key);
+  if (it != parent.MemberEnd()) {
+    it->value = value;
+  } else {
+    parent.AddMember(Value(name.data(), static_cast<rapidjson::SizeType>(name.size()), allocator), value, allocator);
+  }
+}
+
+// Copies every item (component, group, key) of `items` into `target`,
+// replacing items that exist there.
+void MergeItems(Value& target, const Value& items, Allocator& allocator) {
+  RAPIDJSON_ASSERT(items.IsObject());
+  for (const auto& component : items.GetObject()) {
+    RAPIDJSON_ASSERT(component.value.IsObject());
+    Value& targetComponent = ObjectMember(target, Name(component.name), allocator);
+    for (const auto& group : component.value.GetObject()) {
+      RAPIDJSON_ASSERT(group.value.IsObject());
+      Value& targetGroup = ObjectMember(targetComponent, Name(group.name), allocator);
+      for (const auto& key : group.value.GetObject()) {
+        Value copy(key.value, allocator);
+        SetMember(targetGroup, Name(key.name), copy, allocator);
+      }
+    }
+  }
+}
+
+// The schema of an object's member `name`, or null when the schema does not
+// list it among its "properties" (including those of its oneOf/anyOf/allOf
+// branches).
+const Value* PropertySchema(const Value& schema, const Value& name) {
+  if (!schema.IsObject()) return nullptr;
+  auto properties = schema.FindMember("properties");
+  if (properties != schema.MemberEnd() && properties->value.IsObject()) {
+    auto it = properties->value.FindMember(name);
+    if (it != properties->value.MemberEnd()) return &it->value;
+  }
+  for (const char* combinator : {"allOf", "anyOf", "oneOf"}) {
+    auto branches = schema.FindMember(combinator);
+    if (branches == schema.MemberEnd() || !branches->value.IsArray()) continue;
+    for (const Value& branch : branches->value.GetArray()) {
+      if (const Value* found = PropertySchema(branch, name)) return found;
+    }
+  }
+  return nullptr;
+}
+
+// The schema of the elements of an array described by `schema`.
+const Value* ItemsSchema(const Value* schema) {
+  if (schema == nullptr || !schema->IsObject()) return nullptr;
+  auto items = schema->FindMember("items");
+  return items != schema->MemberEnd() && items->value.IsObject() ? &items->value : nullptr;
+}
+
+bool IsRequired(const Value& schema, const Value& name) {
+  if (!schema.IsObject()) return false;
+  auto required = schema.FindMember("required");
+  if (required == schema.MemberEnd() || !required->value.IsArray()) return false;
+  for (const Value& entry : required->value.GetArray()) {
+    if (entry.IsString() && entry == name) return true;
+  }
+  return false;
+}
+
+// Whether members the schema does not list are still described, by
+// "patternProperties" or a true / schema "additionalProperties".
+bool DescribesOtherMembers(const Value& schema) {
+  if (!schema.IsObject()) return true;
+  if (!schema.HasMember("properties")) return true;  // nothing listed: nothing judged
+  if (schema.HasMember("patternProperties")) return true;
+  auto additional = schema.FindMember("additionalProperties");
+  return additional != schema.MemberEnd() && (additional->value.IsObject() || additional->value.IsTrue());
+}
+
+// Applies one clean-up action to `value` and everything below it.
+void Clean(Value& value, const Value* schema, CLEANUP_ACTIONS action) {
+  if (value.IsArray()) {
+    const Value* items = ItemsSchema(schema);
+    for (Value& element : value.GetArray()) Clean(element, items, action);
+    return;
+  }
+  if (!value.IsObject()) return;
+  static const Value kNoSchema;
+  const Value& objectSchema = schema != nullptr ? *schema : kNoSchema;
+  for (auto it = value.MemberBegin(); it != value.MemberEnd();) {
+    const Value* memberSchema = PropertySchema(objectSchema, it->name);
+    bool drop = false;
+    switch (action) {
+      case CLEANUP_REMOVE_GENERATED_ID:
+        break;  // top level only, see CleanupObject
+      case CLEANUP_REMOVE_NULLS:
+        drop = it->value.IsNull();
+        break;
+      case CLEANUP_REMOVE_EMPTY_OBJECTS:
+        Clean(it->value, memberSchema, action);
+        drop = it->value.IsObject() && it->value.ObjectEmpty();
+        break;
+      case CLEANUP_REMOVE_DEFAULTS:
+        if (memberSchema != nullptr && memberSchema->IsObject() && memberSchema->HasMember("default") &&
+            (*memberSchema)["default"] == it->value && !IsRequired(objectSchema, it->name)) {
+          drop = true;
+        }
+        break;
+      case CLEANUP_REMOVE_UNKNOWN:
+        drop = memberSchema == nullptr && Name(it->name) != kGeneratedId && !DescribesOtherMembers(objectSchema);
+        break;
+    }
+    if (drop) {
+      it = value.EraseMember(it);
+      continue;
+    }
+    if (action != CLEANUP_REMOVE_EMPTY_OBJECTS) Clean(it->value, memberSchema, action);
+    ++it;
+  }
+}
+
+bool IsHostSpecificNode(const Value& node) {
+  if (!node.IsObject()) return false;
+  auto flag = node.FindMember(kHostSpecific);
+  return flag != node.MemberEnd() && flag->value.IsTrue();
+}
+
+// Whether the schema document marks the item (or its group or component)
+// host-specific.
+bool IsHostSpecific(const Value& schemaDocument, const Value& component, const Value& group, const Value& key) {
+  const Value* node = &schemaDocument;
+  for (const Value* name : {&component, &group, &key}) {
+    node = PropertySchema(*node, *name);
+    if (node == nullptr) return false;
+    if (IsHostSpecificNode(*node)) return true;
+  }
+  const Value* items = ItemsSchema(node);
+  return items != nullptr && IsHostSpecificNode(*items);
+}
+
+// A JSON pointer from a validator field: "/a/b", or a bare member name.
+rapidjson::Pointer FieldPointer(const std::string& field) {
+  return rapidjson::Pointer(field.empty() || field.front() == '/' ? field : "/" + field);
+}
+
+}  // namespace
+
+std::string ConfigStoreDocument::NormalizeHostId(const std::string& hostId) {
+  std::string digits;
+  std::string trimmed;
+  for (char c : hostId) {
+    const auto u = static_cast<unsigned char>(c);
+    if (std::isspace(u)) continue;
+    trimmed.push_back(static_cast<char>(std::tolower(u)));
+    if (c != '-' && c != '{' && c != '}') digits.push_back(static_cast<char>(std::tolower(u)));
+  }
+  const bool hex = digits.size() == 32 &&
+                   std::all_of(digits.begin(), digits.end(), [](char c) { return std::isxdigit(c) != 0; });
+  if (!hex) return trimmed;
+  return digits.substr(0, 8) + "-" + digits.substr(8, 4) + "-" + digits.substr(12, 4) + "-" + digits.substr(16, 4) +
+         "-" + digits.substr(20);
+}
+
+void ConfigStoreDocument::GetDocumentForHost(const rapidjson::Value& source, rapidjson::Document& result,
+                                             const std::string& hostId) {
+  RAPIDJSON_ASSERT(source.IsObject());
+  result.SetObject();
+  Allocator& allocator = result.GetAllocator();
+  const Value* sections = nullptr;
+  for (const auto& member : source.GetObject()) {
+    if (Name(member.name) == kHostSpecific) {
+      sections = &member.value;
+      continue;
+    }
+    result.AddMember(Value(member.name, allocator), Value(member.value, allocator), allocator);
+  }
+  if (sections == nullptr) return;
+  RAPIDJSON_ASSERT(sections->IsObject());
+  Value& target = result.HasMember(kProfile) ? result[kProfile] : static_cast<Value&>(result);
+  const std::string host = NormalizeHostId(hostId);
+  for (const auto& section : sections->GetObject()) {
+    RAPIDJSON_ASSERT(section.value.IsObject());
+    if (NormalizeHostId(section.name.GetString()) != host) continue;
+    MergeItems(target, section.value, allocator);
+  }
+}
+
+void ConfigStoreDocument::SplitDocument(const rapidjson::Value& profile, const rapidjson::Value& schemaDocument,
+                                        const std::string& hostId, rapidjson::Document& out) {
+  RAPIDJSON_ASSERT(profile.IsObject());
+  const Value& root = profile.HasMember(kProfile) ? profile[kProfile] : profile;
+  RAPIDJSON_ASSERT(root.IsObject());
+  out.SetObject();
+  Allocator& allocator = out.GetAllocator();
+  Value shared(rapidjson::kObjectType);
+  Value specific(rapidjson::kObjectType);
+  for (const auto& component : root.GetObject()) {
+    RAPIDJSON_ASSERT(component.value.IsObject());
+    for (const auto& group : component.value.GetObject()) {
+      RAPIDJSON_ASSERT(group.value.IsObject());
+      for (const auto& key : group.value.GetObject()) {
+        Value& target = IsHostSpecific(schemaDocument, component.name, group.name, key.name) ? specific : shared;
+        Value& targetGroup =
+            ObjectMember(ObjectMember(target, Name(component.name), allocator), Name(group.name), allocator);
+        Value copy(key.value, allocator);
+        SetMember(targetGroup, Name(key.name), copy, allocator);
+      }
+    }
+  }
+  out.AddMember(rapidjson::StringRef(kProfile), shared, allocator);
+  if (!specific.ObjectEmpty()) {
+    Value sections(rapidjson::kObjectType);
+    sections.AddMember(Value(NormalizeHostId(hostId), allocator), specific, allocator);
+    out.AddMember(rapidjson::StringRef(kHostSpecific), sections, allocator);
+  }
+}
 
 bool ConfigStoreDocument::ValueExists(const rapidjson::Value& object, const char* member) {
   return object.IsObject() && member != nullptr && object.HasMember(member);
+}
+
+void ConfigStoreDocument::AddObject(rapidjson::Document& doc, const std::string& component, const std::string& group,
+                                    const std::string& key, const std::string& identifier, rapidjson::Value& value,
+                                    rapidjson::MemoryPoolAllocator<>& allocator) {
+  if (doc.IsNull()) doc.SetObject();
+  RAPIDJSON_ASSERT(doc.IsObject());
+  Value& root = doc.HasMember(kProfile) ? doc[kProfile] : static_cast<Value&>(doc);
+  Value& groupValue = ObjectMember(ObjectMember(root, component, allocator), group, allocator);
+  if (identifier.empty()) {
+    SetMember(groupValue, key, value, allocator);
+    return;
+  }
+  auto it = groupValue.FindMember(Value(rapidjson::StringRef(key.data(), key.size())));
+  if (it == groupValue.MemberEnd()) {
+    Value instances(rapidjson::kArrayType);
+    instances.PushBack(value, allocator);
+    groupValue.AddMember(Value(key, allocator), instances, allocator);
+    return;
+  }
+  RAPIDJSON_ASSERT(it->value.IsArray());
+  it->value.PushBack(value, allocator);
+}
+
+void ConfigStoreDocument::AddProfile(rapidjson::Document& doc) {
+  if (!doc.IsObject()) doc.SetObject();
+  if (!doc.HasMember(kProfile)) {
+    doc.AddMember(rapidjson::StringRef(kProfile), Value(rapidjson::kObjectType), doc.GetAllocator());
+  }
+}
+
+void ConfigStoreDocument::CleanupObject(rapidjson::Value& value, const rapidjson::Value& schema,
+                                        const std::vector<CLEANUP_ACTIONS>& actions,
+                                        rapidjson::MemoryPoolAllocator<>& /*allocator*/) {
+  // A multi-instance key's schema describes the array; its instances follow
+  // its "items".
+  const Value* instanceSchema = &schema;
+  if (schema.IsObject() && value.IsObject()) {
+    auto type = schema.FindMember("type");
+    if (type != schema.MemberEnd() && type->value == "array") instanceSchema = ItemsSchema(&schema);
+  }
+  for (CLEANUP_ACTIONS action : actions) {
+    if (action == CLEANUP_REMOVE_GENERATED_ID) {
+      if (value.IsObject()) value.EraseMember(kGeneratedId);
+      continue;
+    }
+    Clean(value, instanceSchema, action);
+  }
+}
+
+void ConfigStoreDocument::NormalizeValue(rapidjson::Value& value, rapidjson::MemoryPoolAllocator<>& allocator) {
+  if (value.IsArray()) {
+    for (Value& element : value.GetArray()) NormalizeValue(element, allocator);
+    return;
+  }
+  if (!value.IsObject()) return;
+  std::vector<rapidjson::Value::Member*> members;
+  members.reserve(value.MemberCount());
+  for (auto& member : value.GetObject()) {
+    NormalizeValue(member.value, allocator);
+    members.push_back(&member);
+  }
+  std::stable_sort(members.begin(), members.end(),
+                   [](const auto* a, const auto* b) { return Name(a->name) < Name(b->name); });
+  Value sorted(rapidjson::kObjectType);
+  for (auto* member : members) sorted.AddMember(member->name, member->value, allocator);
+  value = sorted;
+}
+
+void ConfigStoreDocument::PatchRequiredProperty(rapidjson::Value& value, const std::string& field,
+                                                const rapidjson::Value& autoConf,
+                                                rapidjson::MemoryPoolAllocator<>& allocator) {
+  const rapidjson::Pointer pointer = FieldPointer(field);
+  if (!pointer.IsValid()) return;
+  const Value* source = pointer.Get(autoConf);
+  if (source == nullptr) {
+    CSLogger::Log(CSLogger::kDetail, "No auto configuration value for '%s'", field.c_str());
+    return;
+  }
+  Value* existing = pointer.Get(value);
+  if (existing == nullptr) {
+    pointer.Set(value, Value(*source, allocator), allocator);
+    return;
+  }
+  // The field names an object: fill the members it lacks.
+  if (!existing->IsObject() || !source->IsObject()) return;
+  for (const auto& member : source->GetObject()) {
+    if (!existing->HasMember(member.name)) {
+      existing->AddMember(Value(member.name, allocator), Value(member.value, allocator), allocator);
+    }
+  }
+}
+
+void ConfigStoreDocument::PatchUnionTagProperty(rapidjson::Value& value, const std::string& field,
+                                                const rapidjson::Value& autoConf,
+                                                rapidjson::MemoryPoolAllocator<>& allocator) {
+  const rapidjson::Pointer pointer = FieldPointer(field);
+  if (!pointer.IsValid()) return;
+  const Value* source = pointer.Get(autoConf);
+  if (source == nullptr) {
+    CSLogger::Log(CSLogger::kDetail, "No auto configuration value for '%s'", field.c_str());
+    return;
+  }
+  // The tag is missing or names no variant: the auto-configured tag wins.
+  pointer.Set(value, Value(*source, allocator), allocator);
+}
+
+rapidjson::Document ConfigStoreDocument::CreateDocument(const std::string& text) {
+  rapidjson::Document doc;
+  if (!HoxConfigManager::detail::ParseJson(text.data(), text.size(), doc)) {
+    HoxConfigManager::ThrowException<HoxConfigManager::InvalidArgumentException>(
+        HoxConfigManager::JsonParseFailed);
+  }
+  return doc;
+}
+
+void ConfigStoreDocument::SerializeValue(const rapidjson::Value& value, std::string& out) {
+  rapidjson::StringBuffer buffer;
+  rapidjson::Writer<rapidjson::StringBuffer> writer(buffer);
+  value.Accept(writer);
+  out.assign(buffer.GetString(), buffer.GetSize());
 }
 
 }  // namespace HoxConfigStore

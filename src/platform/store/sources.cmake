@@ -1,4 +1,7 @@
 list(APPEND HOXCM_SOURCES
   src/platform/store/config_store_document.cc
-  src/platform/store/stubs.cc
+  src/platform/store/contents.cc
+  src/platform/store/database.cc
+  src/platform/store/host_state.cc
+  src/platform/store/objects.cc
 )
