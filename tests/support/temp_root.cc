@@ -77,4 +77,11 @@ void TempRoot::InstallRunners() const {
   fs::create_symlink(SourcePath("runners/py_plugin_runner"), bin / "py_plugin_runner");
 }
 
+void TempRoot::InstallSamplePlugins() const {
+  const std::string modules = "/usr/lib/tarvik/configmanager/apply_modules";
+  CopyTree("data/sample-plugins", modules);
+  fs::copy_file(BuildPath("sample-plugins/network/libnetwork.so"), Path(modules + "/network/libnetwork.so"),
+                fs::copy_options::overwrite_existing);
+}
+
 }  // namespace hoxcm_test

@@ -29,6 +29,9 @@ class TempRoot {
   void InstallPluginSchemas() const;
   // The built runner programs into the runner directory.
   void InstallRunners() const;
+  // The sample plugins (manifests, Python modules and the built C++
+  // plugin) into the manifest directory.
+  void InstallSamplePlugins() const;
 
  private:
   std::string path_;

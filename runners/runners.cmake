@@ -1,0 +1,13 @@
+# The shared-object runner links the library for the request and result
+# formats and the store; the script runner is installed as it is.
+add_executable(cpp_plugin_runner
+  ${CMAKE_CURRENT_LIST_DIR}/cpp_plugin_runner.cc
+  ${CMAKE_CURRENT_LIST_DIR}/runner_support.cc
+  ${CMAKE_SOURCE_DIR}/src/platform/process/process.cc)
+target_include_directories(cpp_plugin_runner PRIVATE ${CMAKE_SOURCE_DIR}/src ${CMAKE_CURRENT_LIST_DIR})
+target_link_libraries(cpp_plugin_runner PRIVATE hoxcm ${CMAKE_DL_LIBS})
+# Installed runners live beside the plugins' lib directory; the library is
+# found through the usual search path of the installation.
+install(TARGETS cpp_plugin_runner RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR}/hoxcm)
+install(PROGRAMS ${CMAKE_CURRENT_LIST_DIR}/py_plugin_runner DESTINATION ${CMAKE_INSTALL_LIBEXECDIR}/hoxcm)
+set_target_properties(cpp_plugin_runner PROPERTIES INSTALL_RPATH "${CMAKE_INSTALL_FULL_LIBDIR}")

@@ -1,0 +1,44 @@
+"""The Python half of the runner conformance suite: behaves exactly like
+conformance_plugin.cc."""
+
+import os
+
+
+def _items(request, host):
+    items = host.items(request)
+    behaviour = "ok"
+    if items and isinstance(items[0]["config"], dict):
+        behaviour = items[0]["config"].get("behaviour", "ok")
+    if behaviour == "throw":
+        raise RuntimeError("thrown on purpose")
+    return items, behaviour
+
+
+def apply(request, host):
+    items, behaviour = _items(request, host)
+    if behaviour == "garbage":
+        return "not json"
+    if behaviour == "fail":
+        return {"id": "conformance.failed", "args": ["a1"], "message": "failed on purpose"}
+    with open(os.path.join(host.root, "applied"), "w") as f:
+        f.write("%d\n" % len(items))
+    return None
+
+
+def impact(request, host):
+    items, behaviour = _items(request, host)
+    if behaviour == "garbage":
+        return "not json"
+    if behaviour == "fail":
+        return {"error": {"id": "conformance.failed", "args": [], "message": "m"}}
+    return [{"impact": i["config"].get("impact", 0), "component": i["component"], "group": i["group"],
+             "key": i["key"], "reason": "r"} for i in items]
+
+
+def validate(request, host):
+    items, behaviour = _items(request, host)
+    if behaviour == "garbage":
+        return "not json"
+    return [{"field": "/%s/%s/%s/bad" % (i["component"], i["group"], i["key"]),
+             "errors": [{"id": "conformance.bad", "args": ["x"], "message": "bad"}]}
+            for i in items if "bad" in i["config"]]

@@ -1,0 +1,210 @@
+// Plugin runs against real runner processes: stand-in runners (small
+// scripts installed at the runner paths) exercise each way a run can end.
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <filesystem>
+
+#include "plugins/plugin_fixture.h"
+
+namespace hoxcm_test {
+namespace {
+
+using namespace HoxConfigManager;
+using Clock = std::chrono::steady_clock;
+
+constexpr const char* kApplyUnexpected = "com.tarvik.hox.settings.apply.plugin.unexpected.error";
+constexpr const char* kApplyAborted = "com.tarvik.hox.settings.apply.plugin.aborted";
+
+// Aborts once `after` calls have said no.
+class CountingMonitor final : public PluginMonitor {
+ public:
+  explicit CountingMonitor(int after, std::string taskId = "task-1") : left_(after), taskId_(std::move(taskId)) {}
+  bool IsAborted() override { return left_.fetch_sub(1) <= 0; }
+  std::string GetTaskId() override { return taskId_; }
+
+ private:
+  std::atomic<int> left_;
+  std::string taskId_;
+};
+
+// Aborts once a deadline has passed.
+class TimedMonitor final : public PluginMonitor {
+ public:
+  explicit TimedMonitor(std::chrono::milliseconds delay) : deadline_(Clock::now() + delay) {}
+  bool IsAborted() override { return Clock::now() >= deadline_; }
+
+ private:
+  const Clock::time_point deadline_;
+};
+
+class PluginRunTest : public PluginTest {
+ protected:
+  PluginRunTest() {
+    plugin_ = std::make_shared<Plugin>(
+        Manifest("t/plugin.json",
+                 V3Manifest("python", {"network:dns:config"}, "network", "REMEDIATE:t", {},
+                            R"(,"impact":{"supports":true},"validation":{"supports":true})"))
+            .c_str());
+    HoxConfigStore::ConfigStoreObjectId id("network", "dns", "config");
+    Document value;
+    ParseDocument(R"({"servers":["10.0.0.1"],"search":["example.org"]})", value);
+    inputs_.push_back({std::make_shared<HoxConfigStore::ConfigStoreObject>(id, value), nullptr, "SET"});
+  }
+
+  // Installs a shell script as the script runner. `body` runs with $root
+  // set to the root and $out to the result file.
+  void Runner(const std::string& body) {
+    const std::string path = "/usr/lib/tarvik/configmanager/bin/py_plugin_runner";
+    root.WriteFile(path, "#!/bin/sh\nroot=\"${0%/usr/lib/tarvik/configmanager/bin/*}\"\n"
+                         "out=\"$root/var/tarvik/lifecycle/cm-plugin-output.json\"\n" +
+                             body + "\n");
+    ::chmod(root.Path(path).c_str(), 0755);
+  }
+  ErrorInfo Apply(std::shared_ptr<PluginMonitor> monitor = std::make_shared<CountingMonitor>(1 << 30)) {
+    return plugin_->Apply(inputs_, "ctx", monitor);
+  }
+
+  std::shared_ptr<Plugin> plugin_;
+  std::vector<DesiredConfigInput> inputs_;
+};
+
+constexpr const char* kSuccess = R"(echo '{"id":"","args":[],"message":""}' > "$out")";
+
+TEST_F(PluginRunTest, ASuccessfulRunReturnsTheResultFile) {
+  Runner(kSuccess);
+  EXPECT_EQ(Apply(), ErrorInfo());
+  // The request carried the task and the context and was private.
+  PluginRequest request;
+  request.Load(PluginRequestPath());
+  EXPECT_EQ(request.GetTaskId(), "task-1");
+  EXPECT_EQ(request.GetClusterContext(), "ctx");
+  EXPECT_EQ(request.GetType(), "APPLY");
+  struct stat st;
+  ASSERT_EQ(::stat(PluginRequestPath().c_str(), &st), 0);
+  EXPECT_EQ(st.st_mode & 0777, 0600u);
+
+  Runner(R"(echo '{"impacts":[{"impact":1,"component":"network","group":"dns","key":"config","reason":"r"}]}' > "$out")");
+  const auto impact = plugin_->Impact(inputs_, "ctx", PluginMonitor::Dummy());
+  EXPECT_EQ(impact.error, ErrorInfo());
+  ASSERT_EQ(impact.impacts.size(), 1u);
+  EXPECT_EQ(impact.impacts[0].impact, 1);
+
+  Runner(R"(echo '{"errors":[{"field":"/f","errors":[{"id":"e","args":["a"]}]}]}' > "$out")");
+  const auto validation = plugin_->Validate({inputs_[0].object}, {}, "ctx", PluginMonitor::Dummy());
+  EXPECT_EQ(validation.error, ErrorInfo());
+  ASSERT_EQ(validation.errors.size(), 1u);
+  EXPECT_EQ(validation.errors[0].field, "/f");
+  EXPECT_EQ(validation.errors[0].errors[0], ErrorInfo("e", {"a"}));
+}
+
+TEST_F(PluginRunTest, RunnerFailuresBecomeUnexpectedErrors) {
+  const struct {
+    const char* body;
+    std::string message;  // a part of the error's message
+  } cases[] = {
+      {"exit 2", "Config Manager plugin failed: t, pid="},
+      {"exit 2", ", status=No such file or directory"},
+      {"kill -9 $$", "terminated with signal=9"},
+      {"exit 0", "cannot open"},  // no result file
+      {R"(printf '{"id":' > "$out")", "Invalid JSON"},
+      {R"(printf '' > "$out")", "Invalid JSON"},
+      {R"(echo '{"id":5}' > "$out")", "Invalid JSON"},
+      {R"(echo '[]' > "$out")", "Invalid JSON"},
+  };
+  for (const auto& c : cases) {
+    // A result left by an earlier run must never be taken for this run's.
+    root.WriteFile("/var/tarvik/lifecycle/cm-plugin-output.json", R"({"id":"","args":[],"message":""})");
+    Runner(c.body);
+    const ErrorInfo error = Apply();
+    EXPECT_EQ(error.id, kApplyUnexpected) << c.body;
+    EXPECT_EQ(error.args, std::vector<std::string>{"t"}) << c.body;
+    EXPECT_NE(error.message.find(c.message), std::string::npos) << c.body << ": " << error.message;
+  }
+  // Impact and validation results are checked just as strictly.
+  Runner(R"(echo '{}' > "$out")");
+  EXPECT_EQ(plugin_->Impact(inputs_, "", PluginMonitor::Dummy()).error.id,
+            "com.tarvik.hox.settings.impact.plugin.unexpected.error");
+  const auto validation = plugin_->Validate({}, {}, "", PluginMonitor::Dummy());
+  EXPECT_EQ(validation.error.id, "com.tarvik.hox.settings.validation.plugin.unexpected.error");
+  EXPECT_FALSE(validation.error.message.empty());
+}
+
+TEST_F(PluginRunTest, AnAbortTerminatesASleepingRunnerWithinAboutASecond) {
+  Runner("touch \"$root/started\"; exec /bin/sleep 30");
+  const auto start = Clock::now();
+  const ErrorInfo error = Apply(std::make_shared<TimedMonitor>(std::chrono::milliseconds(200)));
+  const auto elapsed = Clock::now() - start;
+  EXPECT_EQ(error.id, kApplyAborted);
+  EXPECT_EQ(error.args, std::vector<std::string>{"t"});
+  EXPECT_LT(elapsed, std::chrono::milliseconds(2500));
+  EXPECT_TRUE(std::filesystem::exists(root.Path("/started")));
+}
+
+TEST_F(PluginRunTest, AnAbortAfterTheRunnerExitedStillAbortsTheRun) {
+  // The monitor thread asks once and sees no abort; the runner then
+  // succeeds, and the abort is noticed when the run is judged.
+  Runner(kSuccess);
+  EXPECT_EQ(Apply(std::make_shared<CountingMonitor>(1)).id, kApplyAborted);
+}
+
+TEST_F(PluginRunTest, ASuccessfulRunHasNoSecondLongTail) {
+  Runner(kSuccess);
+  const auto start = Clock::now();
+  EXPECT_EQ(Apply(), ErrorInfo());
+  EXPECT_LT(Clock::now() - start, std::chrono::milliseconds(900));
+}
+
+TEST_F(PluginRunTest, ACppPluginWithoutModuleFailsBeforeAnythingIsWritten) {
+  Plugin cpp(Manifest("c/plugin.json", V3Manifest("cpp", {"network:dns:config"}, "network", "REMEDIATE:c", {})).c_str());
+  Runner("touch \"$root/ran\"");
+  const ErrorInfo error = cpp.Apply(inputs_, "", PluginMonitor::Dummy());
+  EXPECT_EQ(error.id, kApplyUnexpected);
+  EXPECT_EQ(error.message, "Cpp plugin must specify the shared object name.");
+  EXPECT_FALSE(std::filesystem::exists(PluginRequestPath()));
+  EXPECT_FALSE(std::filesystem::exists(root.Path("/ran")));
+}
+
+TEST_F(PluginRunTest, TheRunnerGetsOnlyStandardDescriptorsAndNoEnvironment) {
+  // Given a descriptor the caller forgot to mark close-on-exec.
+  const int leaked = ::open("/dev/null", O_RDONLY);
+  ASSERT_GE(leaked, 3);
+  Runner("/bin/ls /proc/$$/fd > \"$root/fds\"; /usr/bin/env > \"$root/env\"; " + std::string(kSuccess));
+  EXPECT_EQ(Apply(), ErrorInfo());
+  ::close(leaked);
+  // The shell may keep its script open on a descriptor of its own; none
+  // of ours may appear.
+  std::string fds = root.ReadFile("/fds");
+  EXPECT_EQ(fds.find(std::to_string(leaked) + "\n"), std::string::npos) << fds;
+  EXPECT_EQ(root.ReadFile("/env").find("HOX_ROOT"), std::string::npos);
+}
+
+TEST_F(PluginRunTest, RunsOfTwoProcessesNeverOverlap) {
+  // Each runner logs its request's task id on entry and exit, with a pause
+  // in between; the host lock must keep the two pairs apart.
+  Runner(R"(id=$(/bin/sed -n 's/.*"taskId":"\([^"]*\)".*/\1/p' "$root/var/tarvik/lifecycle/cm-plugin-input.json")
+echo "start $id" >> "$root/log"; /bin/sleep 0.3; echo "end $id" >> "$root/log")"
+         "\n" + std::string(kSuccess));
+  const pid_t child = ::fork();
+  ASSERT_GE(child, 0);
+  if (child == 0) {
+    const ErrorInfo error = plugin_->Apply(inputs_, "", std::make_shared<CountingMonitor>(1 << 30, "child"));
+    ::_exit(error.id.empty() ? 0 : 1);
+  }
+  const ErrorInfo error = plugin_->Apply(inputs_, "", std::make_shared<CountingMonitor>(1 << 30, "parent"));
+  int status = 0;
+  ASSERT_EQ(::waitpid(child, &status, 0), child);
+  EXPECT_EQ(error, ErrorInfo());
+  EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+  const std::string log = root.ReadFile("/log");
+  EXPECT_TRUE(log == "start child\nend child\nstart parent\nend parent\n" ||
+              log == "start parent\nend parent\nstart child\nend child\n")
+      << log;
+}
+
+}  // namespace
+}  // namespace hoxcm_test

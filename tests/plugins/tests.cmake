@@ -1,0 +1,16 @@
+hoxcm_add_test(plugins_test
+  plugins/plugin_manifest_test.cc
+  plugins/plugin_manager_test.cc
+  plugins/plugin_request_test.cc
+  plugins/plugin_launcher_test.cc
+  plugins/runner_conformance_test.cc)
+# The runners, the sample plugins and the conformance plugin must be built
+# before the tests that start them.
+add_library(hoxcm_conformance_plugin MODULE plugins/conformance_plugin.cc)
+set_target_properties(hoxcm_conformance_plugin PROPERTIES
+  OUTPUT_NAME conformance
+  LIBRARY_OUTPUT_DIRECTORY ${CMAKE_BINARY_DIR}/tests/plugins)
+target_link_libraries(hoxcm_conformance_plugin PRIVATE hoxcm)
+if(TARGET cpp_plugin_runner AND TARGET hoxcm_sample_network)
+  add_dependencies(plugins_test cpp_plugin_runner hoxcm_sample_network hoxcm_conformance_plugin)
+endif()
