@@ -73,12 +73,21 @@ std::string FirstNumber(std::string_view text) {
   return number;
 }
 
-// The quoted name in "Missing required property 'name'." and alike.
+// The member named by a report: the text between the report's fixed
+// opening and its closing "'." (names may themselves hold quotes).
 std::string QuotedName(const std::string& text) {
-  std::size_t first = text.find('\'');
-  std::size_t last = text.rfind('\'');
-  if (first == std::string::npos || last <= first) return std::string();
-  return text.substr(first + 1, last - first - 1);
+  static constexpr std::string_view kOpenings[] = {
+      "Missing required property '",
+      "Object contains a property that could not be validated using 'properties' or "
+      "'additionalProperties' constraints: '",
+      "Missing dependency '",
+  };
+  for (std::string_view opening : kOpenings) {
+    if (text.starts_with(opening) && text.ends_with("'.") && text.size() >= opening.size() + 2) {
+      return text.substr(opening.size(), text.size() - opening.size() - 2);
+    }
+  }
+  return std::string();
 }
 
 }  // namespace

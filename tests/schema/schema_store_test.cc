@@ -1,0 +1,214 @@
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <string>
+#include <vector>
+
+#include <hoxcm/documents.h>
+#include <hoxcm/schema_store.h>
+
+#include "support/temp_root.h"
+
+using HoxSchemaStore::SchemaObjectId;
+using HoxSchemaStore::SchemaStore;
+
+namespace {
+
+constexpr const char* kSchemaDir = "/usr/lib/tarvik/configmanager/schemas";
+
+std::string SchemaPath(const std::string& cgk) { return std::string(kSchemaDir) + "/" + cgk + ".json"; }
+
+}  // namespace
+
+TEST(SchemaStoreTest, SampleKeysAnswerEveryQueryAsTheirFilesDeclare) {
+  // Given the sample schemas, every key should load and describe itself as
+  // its file says, with the property-level flags derived from the properties.
+  hoxcm_test::TempRoot root;
+  root.InstallSampleSchemas();
+  auto store = SchemaStore::GetStore();
+  ASSERT_TRUE(store);
+  EXPECT_TRUE(store->GetLoadErrors().empty());
+  EXPECT_EQ(store->ListKeys().size(), 16u);
+
+  struct Case {
+    const char* c;
+    const char* g;
+    const char* k;
+    bool multi;
+    const char* identity;
+    bool defaults;
+    bool mutableDefault;
+    std::vector<std::string> reboot;
+    bool rebootProps;
+    std::vector<std::string> mm;
+    bool mmProps;
+  };
+  const Case cases[] = {
+      {"network", "dns", "config", false, "", true, false, {}, false, {}, false},
+      {"network", "interfaces", "vnic", true, "name", false, false, {}, false, {"SET"}, true},
+      {"network", "routes", "static", true, "cs_generated_id", false, false, {}, false, {}, false},
+      {"network", "firewall", "rules", true, "name", false, false, {}, false, {"ADD", "DELETE"}, false},
+      {"storage", "iscsi", "targets", true, "iqn", false, false, {}, false, {}, false},
+      {"system", "kernel", "boot_options", false, "", false, false, {"SET"}, true, {}, false},
+      {"security", "accounts", "users", true, "name", true, false, {}, false, {}, false},
+      {"services", "time", "ntp", false, "", true, true, {}, false, {}, false},
+      {"services", "syslog", "config", false, "", true, false, {}, false, {}, false},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(std::string(c.c) + "/" + c.g + "/" + c.k);
+    auto schema = HoxSchemaStore::GetSchema(c.c, c.g, c.k, store);
+    ASSERT_TRUE(schema);
+    EXPECT_EQ(schema->GetId(), SchemaObjectId(c.c, c.g, c.k));
+    EXPECT_EQ(schema->IsMultiInstance(), c.multi);
+    EXPECT_EQ(schema->GetIdentityMember(), c.identity);
+    EXPECT_EQ(schema->HasDefaultUserConfig(), c.defaults);
+    EXPECT_EQ(schema->IsMutableDefault(), c.mutableDefault);
+    std::vector<std::string> ops;
+    bool props = !c.rebootProps;
+    EXPECT_EQ(schema->GetRebootOperations(ops, props), 0);
+    EXPECT_EQ(ops, c.reboot);
+    EXPECT_EQ(props, c.rebootProps);
+    props = !c.mmProps;
+    EXPECT_EQ(schema->GetMaintenanceModeOperations(ops, props), 0);
+    EXPECT_EQ(ops, c.mm);
+    EXPECT_EQ(props, c.mmProps);
+    // A multi-instance key is an array of instances; a singleton is its instance.
+    const auto& json = schema->GetJsonSchema();
+    EXPECT_STREQ(json["type"].GetString(), c.multi ? "array" : "object");
+    EXPECT_EQ(&schema->GetInstanceSchema(), c.multi ? &json["items"] : &json);
+  }
+}
+
+TEST(SchemaStoreTest, SolutionUsersMutableDefaultsAndInfo) {
+  hoxcm_test::TempRoot root;
+  root.InstallSampleSchemas();
+  auto store = SchemaStore::GetStore();
+  ASSERT_TRUE(store);
+  auto users = store->Find("security", "accounts", "users");
+  ASSERT_TRUE(users);
+  EXPECT_EQ(users->GetSolutionUserNames(), (std::vector<std::string>{"vpxuser", "dcui"}));
+  EXPECT_EQ(users->GetSolutionInstanceIds(), (std::vector<std::string>{"vpxuser"}));
+  EXPECT_TRUE(users->GetInstanceSchema()["properties"]["password"]["sensitive"].GetBool());
+  EXPECT_EQ(store->GetMutableDefaultIds(), (std::set<SchemaObjectId>{{"services", "time", "ntp"}}));
+  // Instances of store-generated identities may carry that member.
+  auto routes = store->Find("network", "routes", "static");
+  EXPECT_TRUE(routes->GetInstanceSchema()["properties"].HasMember("cs_generated_id"));
+  EXPECT_TRUE(store->Find("network", "interfaces", "vnic")->IsHostSpecific());
+  EXPECT_FALSE(store->Find("network", "dns", "config")->IsHostSpecific());
+
+  EXPECT_EQ(SchemaObjectId("a", "b", "c").toString(), "a:b:c");
+  const std::string info = store->GetSchemaInfo("network", "routes", "static");
+  EXPECT_NE(info.find("\"file\":\"/usr/lib/tarvik/configmanager/schemas/network/routes/static.json\""),
+            std::string::npos)
+      << info;
+  EXPECT_NE(info.find("\"identity\":\"cs_generated_id\""), std::string::npos) << info;
+  try {
+    store->GetSchemaInfo("network", "routes", "dynamic");
+    FAIL() << "unknown key accepted";
+  } catch (const HoxConfigStore::ConfigStoreException& e) {
+    EXPECT_EQ(e.GetErrorCode(), 2021);
+    EXPECT_STREQ(e.what(), "Schema object not found: network:routes:dynamic");
+  }
+  EXPECT_FALSE(store->Find("network", "routes", "dynamic"));
+}
+
+TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) {
+  // Given a tree with good and bad schema files, each bad file should be
+  // named in the load errors and every good key should still be served.
+  hoxcm_test::TempRoot root;
+  root.InstallSampleSchemas();
+  const std::string object = R"("schema": {"type": "object", "properties": {"a": {"type": "string"}}, "required": ["a"]})";
+  struct Bad {
+    const char* key;
+    std::string content;
+    const char* reason;
+  };
+  const Bad bad[] = {
+      {"bad/x/syntax", "{\"multiInstance\": false,", "not valid JSON"},
+      {"bad/x/unknown", "{\"multiInstance\": false, \"multi\": true, " + object + "}", "unknown member \"multi\""},
+      {"bad/x/noidentity", "{\"multiInstance\": true, " + object + "}", "needs \"identity\""},
+      {"bad/x/optional_identity",
+       R"({"multiInstance": true, "identity": "a", "schema": {"type": "object", "properties": {"a": {"type": "string"}}}})",
+       "must be a required property"},
+      {"bad/x/operation", "{\"multiInstance\": false, \"rebootRequired\": [\"REBOOT\"], " + object + "}", "\"REBOOT\""},
+      {"bad/x/trigger",
+       R"({"multiInstance": false, "schema": {"type": "object", "properties": {"a": {"type": "integer", "rebootRequired": [1]}}}})",
+       "must be {\"SET\""},
+      {"bad/x/regex",
+       R"({"multiInstance": false, "schema": {"type": "object", "properties": {"a": {"type": "string", "pattern": "(["}}}})",
+       "invalid regular expression"},
+      {"bad/x/engine", R"({"multiInstance": false, "schema": {"type": "object", "minLength": "x"}})", "not usable"},
+      {"bad/x/array", R"({"multiInstance": false, "schema": {"type": "array"}})", "\"type\": \"object\""},
+      {"bad/x/mutable", "{\"multiInstance\": false, \"mutableDefault\": true, " + object + "}", "needs \"defaultUserConfig\""},
+      {"bad/shallow", "{}", "not at <component>/<group>/<key>.json"},
+  };
+  for (const Bad& b : bad) root.WriteFile(SchemaPath(b.key), b.content);
+  root.WriteFile(SchemaPath("good/x/fine"), "{\"multiInstance\": false, " + object + "}");
+
+  auto store = SchemaStore::GetStore();
+  ASSERT_TRUE(store);
+  const auto errors = store->GetLoadErrors();
+  EXPECT_EQ(errors.size(), std::size(bad));
+  for (const Bad& b : bad) {
+    const std::string path = root.Path(SchemaPath(b.key));
+    auto it = std::find_if(errors.begin(), errors.end(), [&](const std::string& e) { return e.rfind(path + ": ", 0) == 0; });
+    ASSERT_NE(it, errors.end()) << b.key;
+    EXPECT_NE(it->find(b.reason), std::string::npos) << *it;
+  }
+  EXPECT_TRUE(store->Find("good", "x", "fine"));
+  EXPECT_TRUE(store->Find("network", "dns", "config"));
+  EXPECT_FALSE(store->Find("bad", "x", "unknown"));
+  EXPECT_EQ(store->ListKeys().size(), 17u);
+}
+
+TEST(SchemaStoreTest, StoresAreCachedPerRoot) {
+  std::shared_ptr<SchemaStore> first;
+  {
+    hoxcm_test::TempRoot root;
+    // No schema directory: no store, and the answer is not remembered.
+    EXPECT_FALSE(SchemaStore::GetStore());
+    EXPECT_FALSE(SchemaStore::GetCache());
+    root.InstallSampleSchemas();
+    first = SchemaStore::GetStore();
+    ASSERT_TRUE(first);
+    EXPECT_EQ(SchemaStore::GetStore(), first);
+    EXPECT_EQ(SchemaStore::GetCache()->GetStore(), first);
+    // Loaded once: a file added later is not seen by this process.
+    root.WriteFile(SchemaPath("late/x/key"), R"({"multiInstance": false, "schema": {"type": "object"}})");
+    EXPECT_FALSE(SchemaStore::GetStore()->Find("late", "x", "key"));
+  }
+  hoxcm_test::TempRoot other;
+  other.WriteFile(SchemaPath("only/x/key"), R"({"multiInstance": false, "schema": {"type": "object"}})");
+  auto second = SchemaStore::GetStore();
+  ASSERT_TRUE(second);
+  EXPECT_NE(second, first);
+  EXPECT_EQ(second->ListKeys(), (std::vector<SchemaObjectId>{{"only", "x", "key"}}));
+}
+
+TEST(SchemaStoreTest, HostDocumentSchemaCoversKeysOrNamesTheUnknownOnes) {
+  hoxcm_test::TempRoot root;
+  root.InstallSampleSchemas();
+  HoxConfigManager::Document user;
+  HoxConfigManager::CreateDocumentFromFile(hoxcm_test::SourcePath("data/sample-host/user-config.json").c_str(), user);
+
+  // A "profile" wrapper is looked through.
+  HoxConfigManager::Document wrapped;
+  wrapped.SetObject();
+  wrapped.AddMember("profile", HoxConfigManager::Value(user, wrapped.GetAllocator()), wrapped.GetAllocator());
+  HoxConfigManager::Document schema;
+  ASSERT_TRUE(HoxConfigManager::GenerateHostDocumentSchema(wrapped, schema));
+  const auto& keys = schema["properties"]["network"]["properties"]["interfaces"]["properties"];
+  EXPECT_STREQ(keys["vnic"]["type"].GetString(), "array");
+  EXPECT_TRUE(keys["vnic"]["hostSpecific"].GetBool());
+
+  user["network"]["dns"].AddMember("resolver", HoxConfigManager::Value(rapidjson::kObjectType), user.GetAllocator());
+  user["storage"].AddMember("fc", HoxConfigManager::Value(rapidjson::kObjectType), user.GetAllocator());
+  user["storage"]["fc"].AddMember("ports", HoxConfigManager::Value(rapidjson::kArrayType), user.GetAllocator());
+  HoxConfigManager::Document errors;
+  ASSERT_FALSE(HoxConfigManager::GenerateHostDocumentSchema(user, errors));
+  ASSERT_TRUE(errors.IsArray());
+  ASSERT_EQ(errors.Size(), 2u);
+  EXPECT_STREQ(errors[0]["field"].GetString(), "/network/dns/resolver");
+  EXPECT_EQ(errors[0]["errId"].GetInt(), 30);
+  EXPECT_STREQ(errors[1]["errArgs"][0].GetString(), "storage:fc:ports");
+}

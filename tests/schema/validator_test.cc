@@ -1,0 +1,175 @@
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <set>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include <hoxcm/documents.h>
+#include <hoxcm/schema_store.h>
+
+#include "support/temp_root.h"
+
+using HoxConfigManager::Document;
+
+namespace {
+
+Document Parse(const std::string& text) {
+  Document doc;
+  HoxConfigManager::ParseDocument(text, doc);
+  return doc;
+}
+
+using Findings = std::vector<std::pair<std::string, int>>;
+
+Findings Check(const Document& schema, const Document& doc) {
+  Document result;
+  int n = JsonValidator::Validate(schema, doc, result, {}, "");
+  EXPECT_TRUE(result.IsArray());
+  EXPECT_EQ(static_cast<int>(result.Size()), n);
+  Findings out;
+  for (const auto& e : result.GetArray()) {
+    EXPECT_TRUE(e["errArgs"].IsArray());
+    EXPECT_TRUE(e["error"].IsString());
+    out.emplace_back(e["field"].GetString(), e["errId"].GetInt());
+  }
+  return out;
+}
+
+std::string Serialize(const rapidjson::Value& v) {
+  std::string out;
+  HoxConfigManager::SerializeValue(v, out);
+  return out;
+}
+
+// The syslog schema of the sample host: "protocol" is a union tag.
+const char* kUnionSchema = R"({
+  "type": "object",
+  "properties": {
+    "remoteHost": {"type": "string"}, "protocol": {"type": "string"}, "caFile": {"type": "string"}
+  },
+  "unionTag": "protocol",
+  "oneOf": [
+    {"properties": {"protocol": {"enum": ["udp", "tcp"]}}},
+    {"properties": {"protocol": {"enum": ["tls"]}}, "required": ["caFile"]}
+  ]
+})";
+
+}  // namespace
+
+TEST(ValidatorTest, ReportsEachFaultAtItsFieldWithItsKind) {
+  struct Case {
+    std::string schema;
+    const char* doc;
+    Findings expected;
+  };
+  const char* object = R"({"type": "object", "properties": {
+      "name": {"type": "string", "pattern": "^[a-z]+$", "maxLength": 8},
+      "mtu": {"type": "integer", "minimum": 1280, "maximum": 9000},
+      "mode": {"enum": ["a", "b"]},
+      "tags": {"type": "array", "items": {"type": "string"}, "minItems": 1, "uniqueItems": true},
+      "user": {"type": "string"}, "secret": {"type": "string"}},
+    "required": ["name"], "additionalProperties": false, "dependencies": {"secret": ["user"]}})";
+  const Case cases[] = {
+      {object, R"({"name": "ok", "mtu": 1500, "tags": ["x"]})", {}},
+      {object, R"({"mtu": 1500})", {{"/name", 9}}},
+      {object, R"({"name": 5})", {{"/name", 2}}},
+      {object, R"({"name": "Bad!"})", {{"/name", 8}}},
+      {object, R"({"name": "abcdefghij"})", {{"/name", 7}}},
+      {object, R"({"name": "a", "mtu": 100})", {{"/mtu", 4}}},
+      {object, R"({"name": "a", "mtu": 9001})", {{"/mtu", 5}}},
+      {object, R"({"name": "a", "mode": "c"})", {{"/mode", 3}}},
+      {object, R"({"name": "a", "tags": []})", {{"/tags", 11}}},
+      {object, R"({"name": "a", "tags": ["x", "x"]})", {{"/tags", 13}}},
+      {object, R"({"name": "a", "tags": ["x", 1]})", {{"/tags/1", 2}}},
+      {object, R"({"name": "a", "extra": 1})", {{"/extra", 10}}},
+      {object, R"({"name": "a", "secret": "s"})", {{"/user", 20}}},
+      {kUnionSchema, R"({"remoteHost": "h", "protocol": "udp"})", {}},
+      {kUnionSchema, R"({"remoteHost": "h", "protocol": "tls", "caFile": "/ca"})", {}},
+      {kUnionSchema, R"({"remoteHost": "h"})", {{"/protocol", 32}}},
+      {kUnionSchema, R"({"remoteHost": "h", "protocol": "smtp"})", {{"/protocol", 32}}},
+      {kUnionSchema, R"({"remoteHost": "h", "protocol": "tls"})", {{"/caFile", 9}}},
+      {R"({"type": "array", "items": )" + std::string(kUnionSchema) + "}", R"([{"protocol": "udp"}, {"protocol": 1}])",
+       {{"/1/protocol", 2}, {"/1/protocol", 32}}},
+      {R"({"type": "object", "minLength": "x"})", "{}", {{"", 31}}},
+      {R"({"type": "string", "pattern": "(["})", R"("x")", {{"", 31}}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.schema + " / " + c.doc);
+    EXPECT_EQ(Check(Parse(c.schema), Parse(c.doc)), c.expected);
+  }
+}
+
+TEST(ValidatorTest, ArgumentsNameTheMemberAndTheLimit) {
+  Document result;
+  JsonValidator::Validate(Parse(R"({"properties": {"mtu": {"maximum": 9000}}, "required": ["name"]})"),
+                          Parse(R"({"mtu": 9600})"), result, {}, "/network/interfaces/vnic/0");
+  ASSERT_EQ(result.Size(), 2u);
+  EXPECT_EQ(Serialize(result[0]["errArgs"]), R"(["mtu","9000"])");
+  EXPECT_STREQ(result[0]["field"].GetString(), "/network/interfaces/vnic/0/mtu");
+  EXPECT_EQ(Serialize(result[1]["errArgs"]), R"(["name"])");
+  EXPECT_STREQ(result[1]["error"].GetString(), "Missing required property 'name'.");
+  // Ignored kinds are dropped and not counted.
+  EXPECT_EQ(JsonValidator::Validate(Parse(R"({"required": ["a", "b"], "maxProperties": 0})"), Parse(R"({"c": 1})"),
+                                    result, {9}, ""),
+            1);
+  EXPECT_EQ(result[0]["errId"].GetInt(), 22);
+}
+
+TEST(ValidatorTest, HostDocumentReportsEveryFaultyItemWithoutSensitiveValues) {
+  // Given the sample configuration with several faults in different keys,
+  // every one of them should be reported, and no sensitive value shown.
+  hoxcm_test::TempRoot root;
+  root.InstallSampleSchemas();
+  Document doc;
+  HoxConfigManager::CreateDocumentFromFile(hoxcm_test::SourcePath("data/sample-host/user-config.json").c_str(), doc);
+  auto& a = doc.GetAllocator();
+  doc["network"]["interfaces"]["vnic"][1]["mtu"] = 9600;
+  doc["network"]["interfaces"]["vnic"][2].RemoveMember("name");
+  doc["storage"]["iscsi"]["targets"][0]["chapSecret"].SetString("tiny-secret", a);
+  doc["services"]["syslog"]["config"]["protocol"] = "tls";
+  doc["system"].AddMember("ghost", rapidjson::Value(rapidjson::kObjectType), a);
+
+  Document schema;
+  // The host document schema is generated without the unknown group, which
+  // the validator then reports as a key without schema.
+  doc["system"].RemoveMember("ghost");
+  ASSERT_TRUE(HoxConfigManager::GenerateHostDocumentSchema(doc, schema));
+  doc["system"].AddMember("ghost", rapidjson::Value(rapidjson::kObjectType), a);
+  Document result;
+  JsonValidator::ValidateCMDocument(schema, doc, result, {}, "");
+  Findings found;
+  for (const auto& e : result.GetArray()) found.emplace_back(e["field"].GetString(), e["errId"].GetInt());
+  std::sort(found.begin(), found.end());
+  const Findings expected = {
+      {"/network/interfaces/vnic/1/mtu", 5},
+      {"/network/interfaces/vnic/2/name", 9},
+      {"/services/syslog/config/caFile", 9},
+      {"/storage/iscsi/targets/0/chapSecret", 6},
+      {"/system/ghost", 30},
+  };
+  EXPECT_EQ(found, expected) << Serialize(result);
+  EXPECT_EQ(Serialize(result).find("tiny-secret"), std::string::npos);
+}
+
+TEST(ValidatorTest, SampleConfigurationsMatchTheirSchemas) {
+  hoxcm_test::TempRoot root;
+  root.InstallSampleSchemas();
+  for (const char* file : {"data/sample-host/user-config.json", "data/sample-host/default-config.json"}) {
+    SCOPED_TRACE(file);
+    Document doc;
+    HoxConfigManager::CreateDocumentFromFile(hoxcm_test::SourcePath(file).c_str(), doc);
+    Document schema;
+    ASSERT_TRUE(HoxConfigManager::GenerateHostDocumentSchema(doc, schema));
+    Document result;
+    EXPECT_EQ(JsonValidator::ValidateCMDocument(schema, doc, result, {}, ""), 0) << Serialize(result);
+  }
+}
+
+TEST(ValidatorTest, ErrorCodesMapToMessageIds) {
+  EXPECT_EQ(JsonValidator::ConvertErrorCodeToMsgId(9), "com.tarvik.hox.settings.validation.required");
+  EXPECT_EQ(JsonValidator::ConvertErrorCodeToMsgId(32), "com.tarvik.hox.settings.validation.union.tag");
+  EXPECT_EQ(JsonValidator::ConvertErrorCodeToMsgId(30), "com.tarvik.hox.settings.validation.unknown.key");
+  EXPECT_EQ(JsonValidator::ConvertErrorCodeToMsgId(999), "com.tarvik.hox.settings.validation.invalid");
+}
