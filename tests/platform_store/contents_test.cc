@@ -1,0 +1,243 @@
+// Configuration contents, namespace objects and host state as readers and
+// writers of the store see them.
+#include "platform_store/store_fixture.h"
+#include "support/fake_schema.h"
+
+namespace hoxcm_test {
+namespace {
+
+using namespace HoxConfigStore;
+
+rapidjson::Document SampleUserConfig() {
+  rapidjson::Document doc;
+  HoxConfigManager::CreateDocumentFromFile(SourcePath("data/sample-host/user-config.json").c_str(), doc);
+  return doc;
+}
+
+std::vector<std::string> Identifiers(const std::vector<RowTuple>& rows, const std::string& key) {
+  std::vector<std::string> ids;
+  for (const auto& row : rows) {
+    if (std::get<2>(row) == key) ids.push_back(std::get<3>(row));
+  }
+  return ids;
+}
+
+TEST_F(StoreTest, ImportedDocumentIsReadBackOneRowPerObjectInKeyThenDocumentOrder) {
+  ImportConfiguration(ConfigKind::User, SampleUserConfig());
+  const auto rows = Rows(ConfigKind::User);
+  ASSERT_FALSE(rows.empty());
+  // Ordered by component, group, key.
+  for (std::size_t i = 1; i < rows.size(); ++i) {
+    const auto a = std::make_tuple(std::get<0>(rows[i - 1]), std::get<1>(rows[i - 1]), std::get<2>(rows[i - 1]));
+    const auto b = std::make_tuple(std::get<0>(rows[i]), std::get<1>(rows[i]), std::get<2>(rows[i]));
+    EXPECT_LE(a, b);
+  }
+  // Instances keep document order and are identified by their identity
+  // member; singletons have no identifier.
+  EXPECT_EQ(Identifiers(rows, "vnic"), (std::vector<std::string>{"vmk0", "vmk1", "vmk2"}));
+  EXPECT_EQ(Identifiers(rows, "static"), (std::vector<std::string>{"5f0c1c9e-6a3b-4b8e-9d7a-1e2f3a4b5c6d",
+                                                                    "a1b2c3d4-e5f6-4a7b-8c9d-0e1f2a3b4c5d"}));
+  EXPECT_EQ(Identifiers(rows, "hostname"), (std::vector<std::string>{""}));
+
+  // The contents rebuild the document exactly.
+  auto db = GetDBStore();
+  const rapidjson::Document source = SampleUserConfig();
+  for (const auto& component : source.GetObject()) {
+    for (const auto& group : component.value.GetObject()) {
+      for (const auto& key : group.value.GetObject()) {
+        const rapidjson::Document item = GetCurrentConfigInternal(db, component.name.GetString(),
+                                                                  group.name.GetString(), key.name.GetString());
+        EXPECT_TRUE(item == key.value) << key.name.GetString();
+      }
+    }
+  }
+  EXPECT_TRUE(GetCurrentConfigInternal(db, "no", "such", "key").IsNull());
+}
+
+TEST_F(StoreTest, GeneratedIdentitiesAreKeptOrCreatedAndStoredInTheValue) {
+  ImportConfiguration(ConfigKind::User, Json(R"({"network":{"routes":{"static":[
+      {"cs_generated_id":"r-1","destination":"10.0.0.0/8","gateway":"10.0.0.1"},
+      {"destination":"10.1.0.0/16","gateway":"10.0.0.1"}]}}})"));
+  const auto rows = Rows(ConfigKind::User);
+  ASSERT_EQ(rows.size(), 2u);
+  EXPECT_EQ(std::get<3>(rows[0]), "r-1");
+  const std::string generated = std::get<3>(rows[1]);
+  EXPECT_EQ(generated.size(), 36u);
+  EXPECT_EQ(Json(std::get<4>(rows[1]))["cs_generated_id"].GetString(), generated);
+}
+
+TEST_F(StoreTest, KindsAreSeparateAndDesiredConfigurationIsReplacedWhole) {
+  ImportConfiguration(ConfigKind::User, SampleUserConfig());
+  rapidjson::Document first = Json(R"({"profile":{"system":{"identity":{"hostname":{"hostname":"a"}}},
+      "storage":{"nfs":{"mounts":[{"name":"m1","server":"s","export":"/e"}]}}}})");
+  SetDesiredUserConfig(first);
+  EXPECT_EQ(Rows(ConfigKind::Desired).size(), 2u);
+  rapidjson::Document second = Json(R"({"system":{"identity":{"hostname":{"hostname":"b"}}}})");
+  SetDesiredUserConfig(second);
+  const auto desired = Rows(ConfigKind::Desired);
+  ASSERT_EQ(desired.size(), 1u);
+  EXPECT_EQ(std::get<4>(desired[0]), R"({"hostname":"b"})");
+
+  rapidjson::Document nic = Json(R"({"nic":{"port":{"speed":{"gbps":25}}}})");
+  SetDesiredSmartnicConfiguration(nic);
+  EXPECT_EQ(GetDesiredSmartnicConfiguration(GetDBStore()).size(), 1u);
+  EXPECT_TRUE(GetSmartnicConfiguration(GetDBStore()).empty());
+  EXPECT_EQ(Rows(ConfigKind::User), Rows(GetUserConfigContents(GetDBStore())));
+  EXPECT_EQ(Identifiers(Rows(ConfigKind::User), "vnic").size(), 3u);
+}
+
+TEST_F(StoreTest, UserConfigChangesUpsertKeepingPositionAndDeleteById) {
+  ImportConfiguration(ConfigKind::User, Json(R"({"storage":{"nfs":{"mounts":[
+      {"name":"a","server":"s","export":"/a"},{"name":"b","server":"s","export":"/b"}]}}})"));
+  ApplyUserConfigChanges({
+      {"SET", {"storage", "nfs", "mounts", "a"}, R"({"name":"a","server":"t","export":"/a"})"},
+      {"ADD", {"storage", "nfs", "mounts", "c"}, R"({"name":"c","server":"s","export":"/c"})"},
+      {"DELETE", {"storage", "nfs", "mounts", "b"}, ""},
+      {"DELETE", {"storage", "nfs", "mounts", "never-there"}, ""},
+      {"SET", {"system", "identity", "hostname"}, R"({"hostname":"h"})"},
+  });
+  const auto rows = Rows(ConfigKind::User);
+  EXPECT_EQ(Identifiers(rows, "mounts"), (std::vector<std::string>{"a", "c"}));
+  EXPECT_EQ(std::get<4>(rows[0]), R"({"name":"a","server":"t","export":"/a"})");
+
+  // A generated identity named only by the id is written into the value; a
+  // deletion may name the instance by its value instead of its id.
+  ApplyUserConfigChanges({{"ADD", {"network", "routes", "static", "g-1"}, R"({"destination":"d","gateway":"g"})"}});
+  auto route = GetCurrentConfigInternal(GetDBStore(), "network", "routes", "static");
+  ASSERT_TRUE(route.IsArray());
+  EXPECT_STREQ(route[0]["cs_generated_id"].GetString(), "g-1");
+  ApplyUserConfigChanges({{"DELETE", {"network", "routes", "static"}, R"({"cs_generated_id":"g-1"})"}});
+  EXPECT_TRUE(GetCurrentConfigInternal(GetDBStore(), "network", "routes", "static").IsNull());
+}
+
+TEST_F(StoreTest, DefaultConfigurationIsReadPerKeyAndPerInstance) {
+  ImportConfiguration(ConfigKind::Default, Json(R"({"network":{"dns":{"config":{"servers":["1.1.1.1"]}}},
+      "security":{"accounts":{"users":[{"name":"root","shell":"/bin/sh"},{"name":"dcui","shell":"/bin/sh"}]}}})"));
+  auto db = GetDBStore();
+  EXPECT_TRUE(GetDefaultUserConfigInternal(db, "network", "dns", "config").IsObject());
+  EXPECT_TRUE(GetDefaultUserConfigInstancesInternal(db, "network", "dns", "config").IsArray());
+  EXPECT_EQ(GetDefaultUserConfigInternal(db, "security", "accounts", "users").Size(), 2u);
+  EXPECT_EQ(GetDefaultUserConfigMapList({"security", "accounts", "users"}, db).size(), 2u);
+  const auto dcui = GetDefaultUserConfigMapList({"security", "accounts", "users", "dcui"}, db);
+  ASSERT_EQ(dcui.size(), 1u);
+  EXPECT_EQ(dcui[0]->at("Identifier"), "dcui");
+  EXPECT_TRUE(GetUserConfigContents(db).empty());
+}
+
+TEST_F(StoreTest, StagedObjectsAreUpsertedIntoTheDesiredConfiguration) {
+  auto db = GetDBStore();
+  auto schemas = HoxSchemaStore::SchemaStore::GetStore();
+  ASSERT_NE(schemas, nullptr);
+  auto routes = HoxSchemaStore::GetSchema("network", "routes", "static", schemas);
+  auto hostname = HoxSchemaStore::GetSchema("system", "identity", "hostname", schemas);
+  rapidjson::Document scratch;
+  ProcessDesiredObject(scratch.GetAllocator(), db, "system", "identity", "hostname", hostname,
+                       Json(R"({"hostname":"a"})"));
+  ProcessDesiredObject(scratch.GetAllocator(), db, "system", "identity", "hostname", hostname,
+                       Json(R"({"hostname":"b"})"));
+  ProcessDesiredObject(scratch.GetAllocator(), db, "network", "routes", "static", routes,
+                       Json(R"({"destination":"d","gateway":"g"})"));
+  const auto rows = Rows(ConfigKind::Desired);
+  ASSERT_EQ(rows.size(), 2u);
+  EXPECT_EQ(std::get<4>(rows[1]), R"({"hostname":"b"})");
+  EXPECT_EQ(std::get<3>(rows[0]).size(), 36u);
+}
+
+TEST_F(StoreTest, RowsKeepAutoConfigurationValuesAndBadValuesFailOnlyTheirReader) {
+  ApplyUserConfigChanges({{"SET", {"services", "syslog", "config"}, R"({"remoteHost":"h"})"}});
+  SetAutoConfValue(ConfigKind::User, {"services", "syslog", "config"}, R"({"protocol":"udp"})");
+  auto rows = GetUserConfigContents(GetDBStore());
+  ASSERT_EQ(rows.size(), 1u);
+  EXPECT_EQ(rows[0]->at("AutoConfValue"), R"({"protocol":"udp"})");
+  SetAutoConfValue(ConfigKind::User, {"services", "syslog", "config"}, "");
+  EXPECT_EQ(GetUserConfigContents(GetDBStore())[0]->count("AutoConfValue"), 0u);
+
+  // A row written by someone else whose value is not JSON.
+  RawSql(StorePath(), "UPDATE config_item SET value = '{broken' WHERE name = 'config'");
+  EXPECT_EQ(GetUserConfigContents(GetDBStore())[0]->at("Value"), "{broken");
+  try {
+    GetCurrentConfigInternal(GetDBStore(), "services", "syslog", "config");
+    FAIL() << "expected 2080";
+  } catch (const HoxConfigManager::InvalidArgumentException& e) {
+    EXPECT_EQ(e.GetErrorCode(), 2080);
+  }
+}
+
+TEST_F(StoreTest, NamespaceObjectsKeepTheirValuesByteForByte) {
+  auto global = ConfigStore::GetStore(sGlobalNamespace);
+  auto other = ConfigStore::GetStore("elsewhere");
+  const ConfigStoreObjectId id("autodeploy", "bootstrap", "hox");
+  const std::string xml = "<?xml version=\"1.0\"?>\r\n<rules>\n\t<rule name=\"ünï\"/>\n</rules>\n";
+  ConfigStoreObject object(id);
+  object.SetValue("waiter_notify", R"({"url":"https://x"})");
+  object.SetValue("firewall", xml);
+  global->SetObject(object);
+  EXPECT_EQ(other->GetObject(id), nullptr);
+
+  auto read = global->GetObject(id);
+  ASSERT_NE(read, nullptr);
+  std::string value;
+  ASSERT_TRUE(read->GetValue("firewall", &value));
+  EXPECT_EQ(value, xml);
+  EXPECT_STREQ(read->GetData()["waiter_notify"].GetString(), R"({"url":"https://x"})");
+  EXPECT_FALSE(read->GetValue("missing", &value));
+
+  // Setting an object replaces all its values.
+  ConfigStoreObject smaller(id);
+  smaller.SetValue("firewall", "");
+  global->SetObject(smaller);
+  EXPECT_EQ(global->GetObject(id)->GetValues().size(), 1u);
+  global->DeleteObject(id);
+  EXPECT_EQ(global->GetObject(id), nullptr);
+}
+
+TEST_F(StoreTest, HostStateHasDefaultsAndKeepsWhatIsSet) {
+  EXPECT_EQ(GetBootMode(), BOOTMODE_NORMAL);
+  EXPECT_FALSE(GetMaintenanceMode());
+  rapidjson::Document record = getBootApplyRecord();
+  EXPECT_FALSE(record["isBootComplete"].GetBool());
+  EXPECT_STREQ(record["bootApplyRecord"].GetString(), "");
+  EXPECT_TRUE(GetBootTimeRestoreFailures().empty());
+
+  SetBootMode(BOOTMODE_DESIRED_STAGED);
+  SetMaintenanceMode(true);
+  setBootApplyRecord(R"({"errorInfo":"","time":"01-01-2026 10-00-00"})");
+  SetBootComplete(true);
+  AddBootTimeRestoreFailure({"network", "dns", "config"});
+  AddBootTimeRestoreFailure({"system", "kernel", "boot_options"});
+
+  EXPECT_EQ(GetBootMode(), BOOTMODE_DESIRED_STAGED);
+  EXPECT_TRUE(GetMaintenanceMode());
+  record = getBootApplyRecord();
+  EXPECT_TRUE(record["isBootComplete"].GetBool());
+  EXPECT_STREQ(record["bootApplyRecord"].GetString(), R"({"errorInfo":"","time":"01-01-2026 10-00-00"})");
+  const auto failures = GetBootTimeRestoreFailures();
+  ASSERT_EQ(failures.size(), 2u);
+  EXPECT_EQ(failures[1].key, "boot_options");
+  ClearBootTimeRestoreFailures();
+  EXPECT_TRUE(GetBootTimeRestoreFailures().empty());
+}
+
+TEST(StoreObjectTest, ObjectsOwnCopiesOfTheirData) {
+  rapidjson::Document drift = Json(R"({"INSTANCEID":"a","DRIFTOP":"SET"})");
+  DriftObject driftObject({"c", "g", "k", "a"}, "SET", drift);
+  drift.SetNull();
+  EXPECT_EQ(driftObject.Serialize(), R"({"INSTANCEID":"a","DRIFTOP":"SET"})");
+  EXPECT_EQ(driftObject.GetAction(), "SET");
+
+  auto schema = std::make_shared<FakeSchemaObject>();
+  schema->multiInstance = true;
+  schema->identity = "name";
+  rapidjson::Document value = Json(R"({"name":"vmk1","mtu":9000})");
+  auto object = CreateObject({"network", "interfaces", "vnic"}, value, schema, 7);
+  value.SetNull();
+  EXPECT_EQ(object->GetConfigStoreObjectId().instanceId, "vmk1");
+  EXPECT_EQ(object->GetConfigStoreObjectId().toString(), "comp network grp interfaces key vnic id vmk1");
+  EXPECT_EQ(object->Serialize(), R"({"name":"vmk1","mtu":9000})");
+  std::string version;
+  EXPECT_TRUE(object->GetValue("version", &version));
+  EXPECT_EQ(version, "7");
+}
+
+}  // namespace
+}  // namespace hoxcm_test

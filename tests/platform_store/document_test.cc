@@ -1,0 +1,215 @@
+// Document building and reshaping: host sections, items, clean-up,
+// normalisation, auto-configuration patches, parsing and instance ids.
+#include <regex>
+#include <set>
+
+#include "platform_store/store_fixture.h"
+
+namespace hoxcm_test {
+namespace {
+
+using HoxConfigStore::ConfigStoreDocument;
+using namespace HoxConfigStore;
+
+std::string Compact(const rapidjson::Value& value) {
+  std::string out;
+  ConfigStoreDocument::SerializeValue(value, out);
+  return out;
+}
+
+TEST(ConfigStoreDocumentTest, HostIdsNormaliseToLowerCaseHyphenatedForm) {
+  const std::vector<std::pair<std::string, std::string>> cases = {
+      {"4C4C4544-0042-3510-8053-B4C04F4E3132", "4c4c4544-0042-3510-8053-b4c04f4e3132"},
+      {"4c4c454400423510 8053b4c04f4e3132\n", "4c4c4544-0042-3510-8053-b4c04f4e3132"},
+      {"{4C4C4544-0042-3510-8053-B4C04F4E3132}", "4c4c4544-0042-3510-8053-b4c04f4e3132"},
+      {"Not-A-UUID", "not-a-uuid"},
+      {"", ""},
+  };
+  for (const auto& [input, expected] : cases) EXPECT_EQ(ConfigStoreDocument::NormalizeHostId(input), expected) << input;
+}
+
+TEST(ConfigStoreDocumentTest, DocumentForHostKeepsOnlyThatHostsSectionMergedOverTheSharedItems) {
+  const rapidjson::Document source = Json(R"({
+    "profile": {"system": {"identity": {"hostname": {"hostname": "shared"}}},
+                "network": {"dns": {"config": {"servers": []}}}},
+    "hostSpecific": {
+      "4C4C4544-0042-3510-8053-B4C04F4E3132": {"system": {"identity": {"hostname": {"hostname": "mine"}},
+                                                            "kernel": {"boot_options": {"iommu": true}}}},
+      "00000000-0000-0000-0000-000000000001": {"system": {"identity": {"hostname": {"hostname": "other"}}}}
+    },
+    "metadata": {"note": "kept"}})");
+  rapidjson::Document mine;
+  ConfigStoreDocument::GetDocumentForHost(source, mine, "4c4c4544-0042-3510-8053-b4c04f4e3132");
+  EXPECT_EQ(Compact(mine),
+            R"({"profile":{"system":{"identity":{"hostname":{"hostname":"mine"}},"kernel":{"boot_options":)"
+            R"({"iommu":true}}},"network":{"dns":{"config":{"servers":[]}}}},"metadata":{"note":"kept"}})");
+  rapidjson::Document stranger;
+  ConfigStoreDocument::GetDocumentForHost(source, stranger, "ffffffff-0000-0000-0000-000000000000");
+  EXPECT_EQ(Compact(stranger),
+            R"({"profile":{"system":{"identity":{"hostname":{"hostname":"shared"}}},)"
+            R"("network":{"dns":{"config":{"servers":[]}}}},"metadata":{"note":"kept"}})");
+
+  rapidjson::Document out;
+  EXPECT_THROW(ConfigStoreDocument::GetDocumentForHost(Json(R"({"hostSpecific": []})"), out, "x"),
+               ConfigStoreException);
+}
+
+TEST(ConfigStoreDocumentTest, SplitDocumentMovesHostSpecificKeysAndIsUndoneByDocumentForHost) {
+  const rapidjson::Document profile = Json(R"({
+    "system": {"identity": {"hostname": {"hostname": "h1"}}, "kernel": {"boot_options": {"iommu": true}}},
+    "network": {"interfaces": {"vnic": [{"name": "vmk0"}]}}})");
+  const rapidjson::Document schemaDocument = Json(R"({"type": "object", "properties": {
+    "system": {"type": "object", "properties": {
+      "identity": {"type": "object", "properties": {"hostname": {"type": "object", "hostSpecific": true}}},
+      "kernel": {"type": "object", "properties": {"boot_options": {"type": "object"}}}}},
+    "network": {"type": "object", "properties": {
+      "interfaces": {"type": "object", "properties": {"vnic": {"type": "array", "hostSpecific": true}}}}}}})");
+  rapidjson::Document split;
+  ConfigStoreDocument::SplitDocument(profile, schemaDocument, "4C4C4544-0042-3510-8053-B4C04F4E3132", split);
+  EXPECT_EQ(Compact(split),
+            R"({"profile":{"system":{"kernel":{"boot_options":{"iommu":true}}}},"hostSpecific":)"
+            R"({"4c4c4544-0042-3510-8053-b4c04f4e3132":{"system":{"identity":{"hostname":{"hostname":"h1"}}},)"
+            R"("network":{"interfaces":{"vnic":[{"name":"vmk0"}]}}}}})");
+
+  rapidjson::Document merged;
+  ConfigStoreDocument::GetDocumentForHost(split, merged, "4c4c4544-0042-3510-8053-b4c04f4e3132");
+  rapidjson::Document expected;
+  expected.SetObject();
+  expected.AddMember("profile", rapidjson::Value(profile, expected.GetAllocator()), expected.GetAllocator());
+  ConfigStoreDocument::NormalizeValue(merged, merged.GetAllocator());
+  ConfigStoreDocument::NormalizeValue(expected, expected.GetAllocator());
+  EXPECT_EQ(Compact(merged), Compact(expected));
+}
+
+TEST(ConfigStoreDocumentTest, AddObjectPlacesSingletonsAndAppendsInstancesUnderTheProfile) {
+  rapidjson::Document doc;
+  ConfigStoreDocument::AddProfile(doc);
+  auto& a = doc.GetAllocator();
+  rapidjson::Value v1(rapidjson::kObjectType), v2(rapidjson::kObjectType), v3(rapidjson::kObjectType);
+  v1.AddMember("hostname", "h", a);
+  v2.AddMember("name", "a", a);
+  v3.AddMember("name", "b", a);
+  ConfigStoreDocument::AddObject(doc, "system", "identity", "hostname", "", v1, a);
+  ConfigStoreDocument::AddObject(doc, "storage", "nfs", "mounts", "a", v2, a);
+  ConfigStoreDocument::AddObject(doc, "storage", "nfs", "mounts", "b", v3, a);
+  EXPECT_EQ(Compact(doc), R"({"profile":{"system":{"identity":{"hostname":{"hostname":"h"}}},)"
+                          R"("storage":{"nfs":{"mounts":[{"name":"a"},{"name":"b"}]}}}})");
+  // A singleton stored where instances already are is malformed input.
+  rapidjson::Value v4(rapidjson::kObjectType);
+  ConfigStoreDocument::AddObject(doc, "storage", "nfs", "mounts", "", v4, a);
+  EXPECT_TRUE(doc["profile"]["storage"]["nfs"]["mounts"].IsObject());
+  rapidjson::Value v5(rapidjson::kObjectType);
+  EXPECT_THROW(ConfigStoreDocument::AddObject(doc, "storage", "nfs", "mounts", "c", v5, a), ConfigStoreException);
+}
+
+TEST(ConfigStoreDocumentTest, CleanupActionsDropWhatEachPromises) {
+  const rapidjson::Document schema = Json(R"({"type": "object",
+    "properties": {
+      "name": {"type": "string", "default": "x"},
+      "mtu": {"type": "integer", "default": 1500},
+      "ipv4": {"type": "object", "properties": {"address": {"type": "string"}, "dhcp": {"default": false}}},
+      "tags": {"type": "array", "items": {"type": "object", "properties": {"k": {}}}},
+      "options": {"type": "object", "additionalProperties": {"type": "string"}}
+    },
+    "required": ["name"], "additionalProperties": false})");
+  const std::string input = R"({"cs_generated_id":"g","name":"x","mtu":1500,"extra":1,"gone":null,)"
+                            R"("ipv4":{"address":null,"dhcp":false,"junk":2},"tags":[{"k":1,"z":null,"q":3}],)"
+                            R"("options":{"Port":"22"},"empty":{}})";
+  struct Case {
+    std::vector<CLEANUP_ACTIONS> actions;
+    std::string expected;
+  };
+  const std::vector<Case> cases = {
+      {{CLEANUP_REMOVE_GENERATED_ID},
+       R"({"name":"x","mtu":1500,"extra":1,"gone":null,"ipv4":{"address":null,"dhcp":false,"junk":2},)"
+       R"("tags":[{"k":1,"z":null,"q":3}],"options":{"Port":"22"},"empty":{}})"},
+      {{CLEANUP_REMOVE_NULLS},
+       R"({"cs_generated_id":"g","name":"x","mtu":1500,"extra":1,"ipv4":{"dhcp":false,"junk":2},)"
+       R"("tags":[{"k":1,"q":3}],"options":{"Port":"22"},"empty":{}})"},
+      // Required members stay even at their default.
+      {{CLEANUP_REMOVE_DEFAULTS},
+       R"({"cs_generated_id":"g","name":"x","extra":1,"gone":null,"ipv4":{"address":null,"junk":2},)"
+       R"("tags":[{"k":1,"z":null,"q":3}],"options":{"Port":"22"},"empty":{}})"},
+      // The generated identity is removed only by its own action.
+      {{CLEANUP_REMOVE_UNKNOWN},
+       R"({"cs_generated_id":"g","name":"x","mtu":1500,"ipv4":{"address":null,"dhcp":false},)"
+       R"("tags":[{"k":1}],"options":{"Port":"22"}})"},
+      // Objects emptied by earlier actions go as well.
+      {{CLEANUP_REMOVE_GENERATED_ID, CLEANUP_REMOVE_NULLS, CLEANUP_REMOVE_DEFAULTS, CLEANUP_REMOVE_UNKNOWN,
+        CLEANUP_REMOVE_EMPTY_OBJECTS},
+       R"({"name":"x","tags":[{"k":1}],"options":{"Port":"22"}})"},
+  };
+  for (const Case& c : cases) {
+    rapidjson::Document value = Json(input);
+    ConfigStoreDocument::CleanupObject(value, schema, c.actions, value.GetAllocator());
+    EXPECT_EQ(Compact(value), c.expected);
+  }
+  // A multi-instance key's array schema cleans its instances by "items".
+  rapidjson::Document arraySchema(rapidjson::kObjectType);
+  arraySchema.AddMember("type", "array", arraySchema.GetAllocator());
+  arraySchema.AddMember("items", rapidjson::Value(schema, arraySchema.GetAllocator()), arraySchema.GetAllocator());
+  rapidjson::Document instance = Json(R"({"name":"a","extra":1})");
+  ConfigStoreDocument::CleanupObject(instance, arraySchema, {CLEANUP_REMOVE_UNKNOWN}, instance.GetAllocator());
+  EXPECT_EQ(Compact(instance), R"({"name":"a"})");
+}
+
+TEST(ConfigStoreDocumentTest, NormalizeValueSortsMembersAtEveryDepthAndKeepsArrayOrder) {
+  rapidjson::Document value = Json(R"({"b":{"z":1,"a":[{"y":1,"x":2},3]},"a":null,"B":true})");
+  ConfigStoreDocument::NormalizeValue(value, value.GetAllocator());
+  EXPECT_EQ(Compact(value), R"({"B":true,"a":null,"b":{"a":[{"x":2,"y":1},3],"z":1}})");
+}
+
+TEST(ConfigStoreDocumentTest, PatchesFillFromAutoConfigurationValues) {
+  const rapidjson::Document autoConf = Json(R"({"protocol":"udp","port":514,"tls":{"caFile":"/ca","verify":true}})");
+  struct Case {
+    bool unionTag;
+    std::string value;
+    std::string field;
+    std::string expected;
+  };
+  const std::vector<Case> cases = {
+      {false, R"({"remoteHost":"h"})", "/port", R"({"remoteHost":"h","port":514})"},
+      {false, R"({"remoteHost":"h"})", "port", R"({"remoteHost":"h","port":514})"},
+      {false, R"({"port":1})", "/port", R"({"port":1})"},              // present: kept
+      {false, R"({"remoteHost":"h"})", "/missing", R"({"remoteHost":"h"})"},  // nothing to patch from
+      {false, R"({"tls":{"caFile":"/mine"}})", "/tls", R"({"tls":{"caFile":"/mine","verify":true}})"},
+      {true, R"({"protocol":"carrier-pigeon"})", "/protocol", R"({"protocol":"udp"})"},
+      {true, R"({"remoteHost":"h"})", "/protocol", R"({"remoteHost":"h","protocol":"udp"})"},
+  };
+  for (const Case& c : cases) {
+    rapidjson::Document value = Json(c.value);
+    if (c.unionTag) {
+      ConfigStoreDocument::PatchUnionTagProperty(value, c.field, autoConf, value.GetAllocator());
+    } else {
+      ConfigStoreDocument::PatchRequiredProperty(value, c.field, autoConf, value.GetAllocator());
+    }
+    EXPECT_EQ(Compact(value), c.expected) << c.value << " " << c.field;
+  }
+}
+
+TEST(ConfigStoreDocumentTest, CreateDocumentParsesOrThrowsJsonParseFailed) {
+  EXPECT_EQ(Compact(ConfigStoreDocument::CreateDocument(R"( {"a": [1, "\u00e9"]} )")), "{\"a\":[1,\"\xc3\xa9\"]}");
+  const std::vector<std::string> malformed = {"", "{", "{\"a\":1} x", "\"\xff\"", std::string(600, '[')};
+  for (const std::string& bad : malformed) {
+    try {
+      ConfigStoreDocument::CreateDocument(bad);
+      FAIL() << "accepted " << bad;
+    } catch (const HoxConfigManager::InvalidArgumentException& e) {
+      EXPECT_EQ(e.GetErrorCode(), 2080);
+    }
+  }
+}
+
+TEST(ConfigStoreDocumentTest, GeneratedInstanceIdsAreDistinctVersion4Uuids) {
+  const std::regex uuid("[0-9a-f]{8}-[0-9a-f]{4}-4[0-9a-f]{3}-[89ab][0-9a-f]{3}-[0-9a-f]{12}");
+  std::set<std::string> ids;
+  for (int i = 0; i < 2000; ++i) {
+    const std::string id = GenerateInstanceId();
+    ASSERT_TRUE(std::regex_match(id, uuid)) << id;
+    ids.insert(id);
+  }
+  EXPECT_EQ(ids.size(), 2000u);
+}
+
+}  // namespace
+}  // namespace hoxcm_test
