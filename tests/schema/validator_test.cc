@@ -173,3 +173,26 @@ TEST(ValidatorTest, ErrorCodesMapToMessageIds) {
   EXPECT_EQ(JsonValidator::ConvertErrorCodeToMsgId(30), "com.tarvik.hox.settings.validation.unknown.key");
   EXPECT_EQ(JsonValidator::ConvertErrorCodeToMsgId(999), "com.tarvik.hox.settings.validation.invalid");
 }
+
+TEST(ValidatorTest, LongStringsNeverReachThePatternMatcher) {
+  // Given strings far longer than a backtracking matcher can take on a
+  // stack, the validator should report those under a pattern and leave the
+  // others to the usual checks, without crashing.
+  const std::string huge(200000, 'a');
+  const Document schema = Parse(R"({"properties": {
+      "name": {"type": "string", "pattern": "^(a|b)*$"},
+      "cert": {"type": "string", "maxLength": 300000},
+      "tags": {"type": "object", "patternProperties": {"^[a-z]+$": {"type": "string"}}}}})");
+  Document doc(rapidjson::kObjectType);
+  auto& a = doc.GetAllocator();
+  doc.AddMember("name", Document::ValueType(huge, a), a);
+  doc.AddMember("cert", Document::ValueType(huge, a), a);
+  doc.AddMember("tags", Document::ValueType(rapidjson::kObjectType), a);
+  Document::ValueType name(huge, a), value("x");
+  doc["tags"].AddMember(name, value, a);
+  const Findings found = Check(schema, doc);
+  ASSERT_EQ(found.size(), 2u);
+  EXPECT_EQ(found[0], (std::pair<std::string, int>("/name", 8)));
+  EXPECT_EQ(found[1].second, 8);
+  EXPECT_EQ(found[1].first.size(), std::string("/tags/").size() + huge.size());
+}

@@ -7,6 +7,7 @@
 #include <hoxcm/json.h>
 #include <hoxcm/schema_store.h>
 
+#include "platform/schema/pattern_guard.h"
 #include "platform/schema/validator_errors.h"
 #include "platform/schema/valijson.h"
 
@@ -66,15 +67,19 @@ std::string ContextToPath(const std::string& base, const std::vector<std::string
 }
 
 void RunEngine(const Value& schema, const Value& document, const std::string& path, std::vector<Finding>& out) {
+  rapidjson::Document guarded;
+  const Value& subject = detail::GuardPatternSubjects(schema, document, path, guarded, out) ? guarded : document;
   valijson::ValidationResults results;
   try {
-    valijson::Schema compiled;
-    valijson::SchemaParser parser(valijson::SchemaParser::kDraft4);
-    valijson::adapters::RapidJsonAdapter schemaAdapter(schema);
-    parser.populateSchema(schemaAdapter, compiled);
-    valijson::Validator validator;
-    valijson::adapters::RapidJsonAdapter target(document);
-    validator.validate(compiled, target, &results);
+    detail::RunOnLargeStack([&] {
+      valijson::Schema compiled;
+      valijson::SchemaParser parser(valijson::SchemaParser::kDraft4);
+      valijson::adapters::RapidJsonAdapter schemaAdapter(schema);
+      parser.populateSchema(schemaAdapter, compiled);
+      valijson::Validator validator;
+      valijson::adapters::RapidJsonAdapter target(subject);
+      validator.validate(compiled, target, &results);
+    });
   } catch (const std::exception& e) {
     out.push_back(SchemaInvalid(path, e.what()));
     return;

@@ -1,0 +1,34 @@
+// Keeps the schema engine's regular expressions safe. The engine matches
+// "pattern" and "patternProperties" with a backtracking matcher whose
+// recursion grows with the length of the subject: a long enough string would
+// exhaust the stack. So strings that a pattern may be applied to are limited
+// to kMaxPatternSubject bytes, and the engine runs on a thread with a stack
+// large enough for that limit. Stateless and thread-safe.
+#pragma once
+
+#include <cstddef>
+#include <functional>
+#include <string>
+#include <vector>
+
+#include <hoxcm/json.h>
+
+#include "platform/schema/validator_errors.h"
+
+namespace JsonValidator::detail {
+
+constexpr std::size_t kMaxPatternSubject = 4096;
+
+// When `document` holds strings (values or member names) longer than the
+// limit that a pattern of `schema` may be applied to, reports each one as a
+// pattern finding, fills `guarded` with a copy in which they are cut to the
+// limit and returns true. Returns false when the document may be given to the
+// engine as it is.
+bool GuardPatternSubjects(const rapidjson::Value& schema, const rapidjson::Value& document, const std::string& path,
+                          rapidjson::Document& guarded, std::vector<Finding>& out);
+
+// Runs `work` on a thread with a large stack and waits for it; rethrows what
+// `work` throws.
+void RunOnLargeStack(const std::function<void()>& work);
+
+}  // namespace JsonValidator::detail
