@@ -1,4 +1,6 @@
 // The SSH files read into their store objects.
+#include <filesystem>
+
 #include <gtest/gtest.h>
 #include <hoxcm/config_store.h>
 #include <hoxcm/host.h>
@@ -89,6 +91,12 @@ TEST(SshSyncTest, FilesReplaceTheirObjectsAndMissingFilesLeaveTheStoreAlone) {
   EXPECT_EQ(Current("authorized_keys"), "null");
   EXPECT_EQ(Current("client"), "null");
   EXPECT_EQ(Current("server"), R"({"options":{"Port":"2200"}})");
+  // A file that exists but cannot be read fails the synchronisation and
+  // leaves the store alone as well.
+  root.WriteFile("/etc/ssh/sshd_config/placeholder", "");
+  EXPECT_THROW(server.UpgradeConfigToConfigStore(), HostCtl::Lib::HostCtlException);
+  EXPECT_EQ(Current("server"), R"({"options":{"Port":"2200"}})");
+  std::filesystem::remove_all(root.Path("/etc/ssh"));
 
   root.CopyTree("data/sample-host/etc/ssh", "/etc/ssh");
   root.CopyTree("data/sample-host/root/.ssh", "/root/.ssh");

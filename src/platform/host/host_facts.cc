@@ -1,15 +1,15 @@
 // Hardware identity, kernel version, quick-boot support, feature switches and
 // the maintenance-mode node, read from files under the host root.
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <sys/utsname.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cctype>
 #include <cerrno>
 #include <cstring>
-#include <fstream>
 #include <mutex>
-#include <sstream>
 
 #include <hoxcm/config_store.h>
 #include <hoxcm/errors.h>
@@ -26,6 +26,21 @@ constexpr const char* kProductUuidPath = "/sys/class/dmi/id/product_uuid";
 constexpr const char* kMachineIdPath = "/etc/machine-id";
 constexpr const char* kVendorPath = "/sys/class/dmi/id/sys_vendor";
 constexpr const char* kProductPath = "/sys/class/dmi/id/product_name";
+
+// Closes its descriptor when it goes out of scope.
+class FileDescriptor {
+ public:
+  explicit FileDescriptor(int fd) : fd_(fd) {}
+  ~FileDescriptor() {
+    if (fd_ >= 0) ::close(fd_);
+  }
+  FileDescriptor(const FileDescriptor&) = delete;
+  FileDescriptor& operator=(const FileDescriptor&) = delete;
+  int get() const { return fd_; }
+
+ private:
+  const int fd_;
+};
 
 std::string Trim(std::string text) {
   const auto notSpace = [](unsigned char c) { return !std::isspace(c); };
@@ -121,15 +136,27 @@ HostFacts LoadFacts(LoadMode mode) {
 }  // namespace
 
 bool ReadHostFile(const std::string& path, std::string& out) {
-  std::ifstream in(path, std::ios::binary);
-  if (!in) {
+  const auto fail = [&](int error) {
+    throw HostCtl::Lib::HostCtlException("cannot read " + path + ": " + std::strerror(error));
+  };
+  FileDescriptor fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  if (fd.get() < 0) {
     if (errno == ENOENT || errno == ENOTDIR) return false;
-    throw HostCtl::Lib::HostCtlException("cannot read " + path + ": " + std::strerror(errno));
+    fail(errno);
   }
-  std::ostringstream text;
-  text << in.rdbuf();
-  if (in.bad()) throw HostCtl::Lib::HostCtlException("cannot read " + path);
-  out = text.str();
+  struct stat st {};
+  if (::fstat(fd.get(), &st) != 0) fail(errno);
+  if (S_ISDIR(st.st_mode)) fail(EISDIR);
+  std::string text;
+  char buffer[8192];
+  for (;;) {
+    const ssize_t n = ::read(fd.get(), buffer, sizeof buffer);
+    if (n < 0 && errno == EINTR) continue;  // a signal interrupted the read
+    if (n < 0) fail(errno);
+    if (n == 0) break;
+    text.append(buffer, static_cast<std::size_t>(n));
+  }
+  out = std::move(text);
   return true;
 }
 
