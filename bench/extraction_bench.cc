@@ -36,7 +36,7 @@ constexpr int kItems = 100000;
 // The multi-instance keys of the sample host that the generator fills, with
 // one instance maker each; singletons add a handful of items on top.
 Value MakeInstance(const std::string& key, int n, HoxConfigManager::Allocator& a) {
-  char name[32];
+  char name[64];
   Value v(rapidjson::kObjectType);
   auto str = [&a](const std::string& s) { return Value(s, a); };
   if (key == "vnic") {
@@ -51,8 +51,8 @@ Value MakeInstance(const std::string& key, int n, HoxConfigManager::Allocator& a
     v.AddMember("ipv4", ip, a);
   } else if (key == "rules") {
     std::snprintf(name, sizeof name, "rule-%06d", n);
-    v.AddMember("name", str(name), a).AddMember("action", n % 3 ? "allow" : "deny", a);
-    v.AddMember("protocol", n % 2 ? "tcp" : "udp", a).AddMember("port", 1024 + n % 60000, a);
+    v.AddMember("name", str(name), a).AddMember("action", rapidjson::StringRef(n % 3 ? "allow" : "deny"), a);
+    v.AddMember("protocol", rapidjson::StringRef(n % 2 ? "tcp" : "udp"), a).AddMember("port", 1024 + n % 60000, a);
   } else if (key == "targets") {
     std::snprintf(name, sizeof name, "iqn.2024-03.com.example.san:t%06d", n);
     v.AddMember("iqn", str(name), a).AddMember("address", "10.20.8.50", a).AddMember("port", 3260, a);
@@ -210,14 +210,14 @@ void BM_ExtractCurrentConfiguration(benchmark::State& state) {
   }
 }
 
-// Console output plus, at the end, each benchmark's time per iteration
-// against the bare read's.
+// Console output plus, at the end, each benchmark's CPU time per iteration
+// against the bare read's (CPU time: the machine may be shared).
 class RatioReporter final : public benchmark::ConsoleReporter {
  public:
   void ReportRuns(const std::vector<Run>& runs) override {
     for (const Run& run : runs) {
       if (run.run_type == Run::RT_Iteration || run.aggregate_name == "mean") {
-        times_[run.run_name.function_name] = run.GetAdjustedRealTime();
+        times_[run.run_name.function_name] = run.GetAdjustedCPUTime();
       }
     }
     ConsoleReporter::ReportRuns(runs);

@@ -96,10 +96,20 @@ void ProcessMutableDefaultDeletes(Document& result, const ConfigMapList& content
                                   const std::shared_ptr<HoxSchemaStore::SchemaStore>& schemaStore) {
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "ProcessMutableDefaultDeletes");
   std::set<SchemaObjectId> missing = schemaStore->GetMutableDefaultIds();
+  // Rows come grouped by key: look at each key once.
+  const HoxConfigStore::ConfigMap* previous = nullptr;
   for (const auto& row : contents) {
     if (missing.empty()) break;
     if (!row) continue;
-    missing.erase(SchemaObjectId(Column(*row, "Component"), Column(*row, "ConfigGroup"), Column(*row, "Name")));
+    const std::string& component = Column(*row, "Component");
+    const std::string& group = Column(*row, "ConfigGroup");
+    const std::string& key = Column(*row, "Name");
+    if (previous != nullptr && Column(*previous, "Name") == key && Column(*previous, "ConfigGroup") == group &&
+        Column(*previous, "Component") == component) {
+      continue;
+    }
+    previous = row.get();
+    missing.erase(SchemaObjectId(component, group, key));
   }
   if (!missing.empty()) {
     std::string joined;

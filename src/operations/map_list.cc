@@ -4,6 +4,7 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include <hoxcm/documents.h>
@@ -15,7 +16,6 @@
 namespace HoxConfigManager {
 namespace {
 
-using detail::Column;
 using HoxConfigStore::ConfigMap;
 using HoxConfigStore::ConfigStoreDocument;
 using HoxSchemaStore::SchemaObject;
@@ -56,22 +56,79 @@ class SchemaLookup {
  public:
   explicit SchemaLookup(const std::shared_ptr<HoxSchemaStore::SchemaStore>& store) : store_(store) {}
 
-  const SchemaObject& Find(const SchemaObjectId& id) {
-    if (!schema_ || !(id == id_)) {
-      schema_ = store_->Find(id.component, id.group, id.key);
+  const SchemaObject& Find(const std::string& component, const std::string& group, const std::string& key) {
+    if (!schema_ || key != key_ || group != group_ || component != component_) {
+      schema_ = store_->Find(component, group, key);
       // A stored item without a schema cannot be cleaned, identified or
       // validated: refuse the extraction rather than guess.
-      if (!schema_) ThrowException<SchemaNotFound>(SchemaObjectNotFound, id.toString());
-      id_ = id;
+      if (!schema_) ThrowException<SchemaNotFound>(SchemaObjectNotFound, SchemaObjectId(component, group, key).toString());
+      component_ = component;
+      group_ = group;
+      key_ = key;
     }
     return *schema_;
   }
 
  private:
   const std::shared_ptr<HoxSchemaStore::SchemaStore>& store_;
-  SchemaObjectId id_;
+  std::string component_, group_, key_;
   std::shared_ptr<SchemaObject> schema_;
 };
+
+// The columns of one contents row, read in one pass over the row's members
+// (a row has at most six, and a tree lookup per column costs more).
+struct RowColumns {
+  const std::string* component = &Empty();
+  const std::string* group = &Empty();
+  const std::string* key = &Empty();
+  const std::string* identifier = &Empty();
+  const std::string* value = &Empty();
+  const std::string* autoConf = nullptr;
+
+  explicit RowColumns(const ConfigMap& row) {
+    for (const auto& [name, text] : row) {
+      const std::string_view column(name);
+      if (column == "Component") {
+        component = &text;
+      } else if (column == "ConfigGroup") {
+        group = &text;
+      } else if (column == "Name") {
+        key = &text;
+      } else if (column == "Identifier") {
+        identifier = &text;
+      } else if (column == "Value") {
+        value = &text;
+      } else if (column == "AutoConfValue") {
+        autoConf = &text;
+      }
+    }
+  }
+  static const std::string& Empty() {
+    static const std::string kEmpty;
+    return kEmpty;
+  }
+};
+
+// Whether a null sits anywhere in `value`: removing nulls is the only
+// clean-up of stored documents, and most values have none.
+bool ContainsNull(const Value& value) {
+  if (value.IsNull()) return true;
+  if (value.IsObject()) {
+    for (const auto& member : value.GetObject()) {
+      if (ContainsNull(member.value)) return true;
+    }
+  } else if (value.IsArray()) {
+    for (const Value& element : value.GetArray()) {
+      if (ContainsNull(element)) return true;
+    }
+  }
+  return false;
+}
+
+bool IsQuorlet(const std::string& component, const std::string& group, const std::string& key) {
+  const SchemaObjectId& quorlet = detail::QuorletObjectId();
+  return key == quorlet.key && group == quorlet.group && component == quorlet.component;
+}
 
 }  // namespace
 
@@ -115,30 +172,39 @@ void ProcessConfigMapList(Document& result, const HoxConfigStore::ConfigMapList&
 
   Allocator& allocator = result.GetAllocator();
   const std::vector<HoxConfigStore::CLEANUP_ACTIONS>& cleanup = CleanupActions(type);
+  const bool onlyNulls = cleanup.size() == 1 && cleanup.front() == HoxConfigStore::CLEANUP_REMOVE_NULLS;
   SchemaLookup schemas(schemaStore);
   // Read once, and only when a quorlet row shows up.
   std::optional<std::set<SchemaObjectId>> dspExcluded;
   // One parser reused for every row: its stack keeps its capacity, and the
   // parsed values land directly in the result's pool.
   Document parsed(&allocator);
+  // The per-item lines are the bulk of the log; skip formatting them when the
+  // threshold hides them anyway.
+  const bool logItems = CSLogger::IsEnabled(CSLogger::kInfo);
 
   for (const auto& rowPtr : contents) {
     RAPIDJSON_ASSERT(rowPtr != nullptr);
     const ConfigMap& row = *rowPtr;
-    const std::string& key = Column(row, "Name");
-    const std::string& component = Column(row, "Component");
-    const std::string& group = Column(row, "ConfigGroup");
-    const std::string& identifier = Column(row, "Identifier");
-    CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was found.", component.c_str(), group.c_str(),
-                  key.c_str(), identifier.c_str());
-    const SchemaObjectId id(component, group, key);
+    const RowColumns columns(row);
+    const std::string& key = *columns.key;
+    const std::string& component = *columns.component;
+    const std::string& group = *columns.group;
+    const std::string& identifier = *columns.identifier;
+    if (logItems) {
+      CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was found.", component.c_str(),
+                    group.c_str(), key.c_str(), identifier.c_str());
+    }
 
-    const std::string& text = Column(row, "Value");
-    if (text == kDeleteDefault) ThrowException<ConfigManagerException>(DeleteDefaultNotSupported, id.toString());
+    const std::string& text = *columns.value;
+    if (text == kDeleteDefault) {
+      ThrowException<ConfigManagerException>(DeleteDefaultNotSupported,
+                                             SchemaObjectId(component, group, key).toString());
+    }
 
-    if (id == detail::QuorletObjectId()) {
+    if (IsQuorlet(component, group, key)) {
       if (!dspExcluded) dspExcluded = detail::DspExcludedObjects();
-      if (dspExcluded->count(id) != 0) {
+      if (dspExcluded->count(detail::QuorletObjectId()) != 0) {
         CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s} was not extracted, since dspIntegrated=False,",
                       component.c_str(), group.c_str(), key.c_str());
         continue;
@@ -150,9 +216,10 @@ void ProcessConfigMapList(Document& result, const HoxConfigStore::ConfigMapList&
     value.Swap(parsed);
     RAPIDJSON_ASSERT(value.IsObject());
 
-    const SchemaObject& schema = schemas.Find(id);
-    auto autoConf = row.find("AutoConfValue");
-    if (autoConf != row.end()) ProcessAutoConfig(value, schema.GetInstanceSchema(), autoConf->second, allocator);
+    const SchemaObject& schema = schemas.Find(component, group, key);
+    if (columns.autoConf != nullptr) {
+      ProcessAutoConfig(value, schema.GetInstanceSchema(), *columns.autoConf, allocator);
+    }
 
     if (schema.GetIdentityMember() != kGeneratedIdMember) {
       const std::vector<std::string>& solutionIds = schema.GetSolutionInstanceIds();
@@ -165,9 +232,11 @@ void ProcessConfigMapList(Document& result, const HoxConfigStore::ConfigMapList&
       }
     }
 
-    ConfigStoreDocument::CleanupObject(value, schema.GetInstanceSchema(), cleanup, allocator);
+    if (!onlyNulls || ContainsNull(value)) {
+      ConfigStoreDocument::CleanupObject(value, schema.GetInstanceSchema(), cleanup, allocator);
+    }
     if (value.ObjectEmpty()) {
-      CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was filtered out.", component.c_str(),
+      if (logItems) CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was filtered out.", component.c_str(),
                     group.c_str(), key.c_str(), identifier.c_str());
       continue;
     }
