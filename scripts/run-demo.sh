@@ -25,7 +25,7 @@ cmake --preset "$preset" "${launcher[@]}" >/dev/null
 # needed for the demo.
 targets=(hoxcfg)
 available=$(cmake --build "$build" --target help 2>/dev/null || true)
-for t in cpp_plugin_runner hoxcm_sample_plugins; do
+for t in cpp_plugin_runner hoxcm_sample_network; do
   grep -qE "^\.\.\. $t( |$)" <<<"$available" && targets+=("$t")
 done
 cmake --build --preset "$preset" -j "$(nproc)" --target "${targets[@]}"

@@ -90,20 +90,17 @@ std::string InstallSamplePlugins(const ProductFiles& files) {
   const std::string manifests = files.dataDir + "/sample-plugins";
   if (!IsDir(manifests)) return "skipped sample plugins: none shipped (looked in " + manifests + ")";
   const int count = CopyTree(manifests, Under(kManifestDir));
-  // C++ plugins live next to their manifests; their libraries are build
-  // outputs, found beside the runner.
+  // Built C++ plugins sit in the build tree at the path they take below the
+  // manifest directory, beside their manifests; an installation ships them
+  // inside the manifest tree already.
   int libraries = 0;
-  std::error_code ec;
-  if (IsDir(files.pluginLibDir)) {
-    for (const auto& entry : fs::recursive_directory_iterator(files.pluginLibDir, ec)) {
-      if (!entry.is_regular_file() || entry.path().extension() != ".so") continue;
-      CopyFile(entry.path().string(), Under(std::string(kManifestDir) + "/" + entry.path().filename().string()),
-               kExecutable);
-      ++libraries;
-    }
+  if (IsDir(files.pluginLibDir)) libraries = CopyTree(files.pluginLibDir, Under(kManifestDir));
+  std::string line = "installed sample plugins: " + std::to_string(count) + " files";
+  if (files.fromBuildTree) {
+    line += libraries > 0 ? ", " + std::to_string(libraries) + " built plugin libraries"
+                          : "; skipped C++ plugin libraries: not built (looked in " + files.pluginLibDir + ")";
   }
-  return "installed sample plugins: " + std::to_string(count) + " files, " + std::to_string(libraries) +
-         " plugin libraries";
+  return line;
 }
 
 void ImportDocument(HoxConfigStore::ConfigKind kind, const std::string& path) {
@@ -141,13 +138,12 @@ ProductFiles LocateProductFiles() {
     const std::string sourceDir = fs::path(files.dataDir).parent_path().string();
     files.cppRunner = buildDir + "/runners/cpp_plugin_runner";
     files.pyRunner = sourceDir + "/runners/py_plugin_runner";
-    files.pluginLibDir = buildDir + "/sdk";
+    files.pluginLibDir = buildDir + "/sample-plugins";
   } else {
     files.dataDir = HOXCM_INSTALLED_DATA_DIR;
     const std::string libexec = HOXCM_INSTALLED_LIBEXEC_DIR;
     files.cppRunner = libexec + "/cpp_plugin_runner";
     files.pyRunner = libexec + "/py_plugin_runner";
-    files.pluginLibDir = libexec + "/plugins";
   }
   return files;
 }

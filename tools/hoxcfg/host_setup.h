@@ -14,7 +14,7 @@ struct ProductFiles {
   std::string dataDir;       // sample-host/, plugin_schemas/, sample-plugins/
   std::string cppRunner;     // the C++ plugin runner program
   std::string pyRunner;      // the Python plugin runner script
-  std::string pluginLibDir;  // built C++ sample plugins (*.so)
+  std::string pluginLibDir;  // build tree only: C++ sample plugins, laid out as below apply_modules
   bool fromBuildTree = false;
 };
 
