@@ -1,4 +1,5 @@
 // Opening, refusing and transacting on the configuration store file.
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -40,6 +41,13 @@ TEST_F(StoreTest, MissingStoreIsCreatedWithLayoutVersionInWalMode) {
   sqlite3_close(raw);
   // The connection is shared per root.
   EXPECT_EQ(GetDBStore().get(), db.get());
+  // The store holds sensitive values in clear: nobody else may read it.
+  SetBootMode(BOOTMODE_NORMAL);
+  for (const char* suffix : {"", "-wal"}) {
+    struct stat st {};
+    ASSERT_EQ(stat((StorePath() + suffix).c_str(), &st), 0) << suffix;
+    EXPECT_EQ(st.st_mode & 077, 0u) << suffix;
+  }
 }
 
 TEST_F(StoreTest, MissingStoreIsNotCreatedWhenCreationIsNotAllowed) {

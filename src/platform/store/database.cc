@@ -1,7 +1,11 @@
 #include "platform/store/database.h"
 
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
 
 #include <filesystem>
 #include <map>
@@ -74,6 +78,16 @@ Registry& TheRegistry() {
 bool SameFile(const Database& db, const std::string& path) {
   struct stat st {};
   return ::stat(path.c_str(), &st) == 0 && st.st_dev == db.Device() && st.st_ino == db.Inode();
+}
+
+// A store readable by others (made by an older tool, restored from a
+// backup) is made private once it is known to be a valid store.
+void MakePrivate(const std::string& path) {
+  for (const char* suffix : {"", "-wal", "-shm"}) {
+    const std::string file = path + suffix;
+    struct stat st {};
+    if (::stat(file.c_str(), &st) == 0 && (st.st_mode & 077) != 0) ::chmod(file.c_str(), st.st_mode & 0700);
+  }
 }
 
 }  // namespace
@@ -159,9 +173,19 @@ std::shared_ptr<Database> Database::Open(const std::string& path, bool create) {
   const bool exists = ::stat(path.c_str(), &st) == 0;
   if (!exists && !create) Refuse(path, "the store does not exist");
   if (!exists) {
+    // The store holds sensitive values in clear: only its owner may read it.
+    // SQLite gives its journal files the mode of the database file.
+    const std::filesystem::path directory = std::filesystem::path(path).parent_path();
     std::error_code ec;
-    std::filesystem::create_directories(std::filesystem::path(path).parent_path(), ec);
+    std::filesystem::create_directories(directory, ec);
     if (ec) Refuse(path, "cannot create its directory: " + ec.message());
+    ::chmod(directory.c_str(), 0700);
+    const int fd = ::open(path.c_str(), O_CREAT | O_EXCL | O_WRONLY | O_CLOEXEC, 0600);
+    if (fd >= 0) {
+      ::close(fd);
+    } else if (errno != EEXIST) {
+      Refuse(path, std::string("cannot create the store: ") + std::strerror(errno));
+    }
   }
   sqlite3* raw = nullptr;
   const int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | (exists ? 0 : SQLITE_OPEN_CREATE);
@@ -172,6 +196,7 @@ std::shared_ptr<Database> Database::Open(const std::string& path, bool create) {
 
   std::shared_ptr<Database> db(new Database(path, std::move(handle)));
   db->CheckAndMigrate(!exists);
+  MakePrivate(path);
   if (::stat(path.c_str(), &st) == 0) {
     db->device_ = st.st_dev;
     db->inode_ = st.st_ino;
