@@ -186,8 +186,8 @@ TEST_F(PluginRunTest, TheRunnerGetsOnlyStandardDescriptorsAndNoEnvironment) {
 TEST_F(PluginRunTest, RunsOfTwoProcessesNeverOverlap) {
   // Each runner logs its request's task id on entry and exit, with a pause
   // in between; the host lock must keep the two pairs apart.
-  Runner(R"(id=$(/bin/sed -n 's/.*"taskId":"\([^"]*\)".*/\1/p' "$root/var/tarvik/lifecycle/cm-plugin-input.json")
-echo "start $id" >> "$root/log"; /bin/sleep 0.3; echo "end $id" >> "$root/log")"
+  Runner(R"sh(id=$(/bin/sed -n 's/.*"taskId":"\([^"]*\)".*/\1/p' "$root/var/tarvik/lifecycle/cm-plugin-input.json")
+echo "start $id" >> "$root/log"; /bin/sleep 0.3; echo "end $id" >> "$root/log")sh"
          "\n" + std::string(kSuccess));
   const pid_t child = ::fork();
   ASSERT_GE(child, 0);

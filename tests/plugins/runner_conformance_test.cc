@@ -61,7 +61,7 @@ TEST_P(RunnerConformanceTest, ASuccessfulApplyIsStoredInOneGo) {
   inputs.push_back({Object(vnic, R"({"name":"vmk1","portgroup":"pg","mtu":1500})"), nullptr, "ADD"});
   EXPECT_EQ(Apply(inputs), ErrorInfo());
   EXPECT_EQ(root.ReadFile("/applied"), "2\n");
-  EXPECT_EQ(StoredUserConfig(kDns), R"({"search":[],"servers":["10.0.0.2"]})");
+  EXPECT_EQ(StoredUserConfig(kDns), R"({"servers":["10.0.0.2"],"search":[]})");
   EXPECT_NE(StoredUserConfig(vnic).find("vmk1"), std::string::npos);
 
   // Deletions are stored too.
