@@ -25,7 +25,7 @@ constexpr int kMaxRefHops = 32;
 bool ContainsUnionTag(const Value& node) {
   if (node.IsObject()) {
     for (const auto& m : node.GetObject()) {
-      if (m.name == "unionTag" || ContainsUnionTag(m.value)) return true;
+      if ((m.name == "unionTag" && m.value.IsString()) || ContainsUnionTag(m.value)) return true;
     }
   } else if (node.IsArray()) {
     for (const auto& v : node.GetArray()) {
@@ -39,7 +39,8 @@ bool ContainsUnionTag(const Value& node) {
 // variant lists of union nodes, which the union walk checks instead.
 void RemoveUnionVariants(Value& node) {
   if (node.IsObject()) {
-    if (node.HasMember("unionTag")) node.RemoveMember("oneOf");
+    auto tag = node.FindMember("unionTag");
+    if (tag != node.MemberEnd() && tag->value.IsString()) node.RemoveMember("oneOf");
     for (auto& m : node.GetObject()) RemoveUnionVariants(m.value);
   } else if (node.IsArray()) {
     for (auto& v : node.GetArray()) RemoveUnionVariants(v);
