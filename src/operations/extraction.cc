@@ -1,8 +1,10 @@
 // Configuration extraction: the store's user, current, desired and SmartNIC
 // configuration as host documents, and the exported host document.
+#include <algorithm>
 #include <exception>
 #include <set>
 #include <string>
+#include <tuple>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
@@ -56,6 +58,24 @@ ConfigMapList RowsOfKey(const ConfigMapList& contents, const SchemaObjectId& id)
   return rows;
 }
 
+std::tuple<const std::string&, const std::string&, const std::string&> KeyOf(const HoxConfigStore::ConfigMap& row) {
+  return {Column(row, "Component"), Column(row, "ConfigGroup"), Column(row, "Name")};
+}
+
+// Whether the contents hold an item of the key. The store returns rows
+// ordered by component, group and key, so a binary search finds it; a miss
+// is confirmed by a full scan, since a wrong "deleted" verdict would refuse
+// the whole extraction.
+bool HasItemOfKey(const ConfigMapList& contents, const SchemaObjectId& id) {
+  const std::tuple<const std::string&, const std::string&, const std::string&> wanted{id.component, id.group,
+                                                                                       id.key};
+  auto it = std::lower_bound(contents.begin(), contents.end(), wanted, [](const auto& row, const auto& key) {
+    return row && KeyOf(*row) < key;
+  });
+  if (it != contents.end() && *it && KeyOf(**it) == wanted) return true;
+  return std::any_of(contents.begin(), contents.end(), [&](const auto& row) { return row && KeyOf(*row) == wanted; });
+}
+
 // Reports, for every key whose default may be changed but not deleted,
 // whether the user configuration still equals the shipped default. The
 // extraction itself keeps every item either way, so that an exported
@@ -95,21 +115,9 @@ void ProcessMutableDefaultConfig(const ConfigMapList& contents,
 void ProcessMutableDefaultDeletes(Document& result, const ConfigMapList& contents,
                                   const std::shared_ptr<HoxSchemaStore::SchemaStore>& schemaStore) {
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "ProcessMutableDefaultDeletes");
-  std::set<SchemaObjectId> missing = schemaStore->GetMutableDefaultIds();
-  // Rows come grouped by key: look at each key once.
-  const HoxConfigStore::ConfigMap* previous = nullptr;
-  for (const auto& row : contents) {
-    if (missing.empty()) break;
-    if (!row) continue;
-    const std::string& component = Column(*row, "Component");
-    const std::string& group = Column(*row, "ConfigGroup");
-    const std::string& key = Column(*row, "Name");
-    if (previous != nullptr && Column(*previous, "Name") == key && Column(*previous, "ConfigGroup") == group &&
-        Column(*previous, "Component") == component) {
-      continue;
-    }
-    previous = row.get();
-    missing.erase(SchemaObjectId(component, group, key));
+  std::set<SchemaObjectId> missing;
+  for (const SchemaObjectId& id : schemaStore->GetMutableDefaultIds()) {
+    if (!HasItemOfKey(contents, id)) missing.insert(id);
   }
   if (!missing.empty()) {
     std::string joined;
