@@ -157,14 +157,6 @@ TEST_F(HostDocumentsTest, AutoConfigurationFillsMissingRequiredProperties) {
   EXPECT_EQ(Json(result["services"]["time"]["ntp"]), R"({"servers":[],"enabled":true})");
 }
 
-TEST_F(HostDocumentsTest, MaintenanceModeFollowsTheStore) {
-  EXPECT_FALSE(HoxConfigManager::IsMaintenanceModeEnabled());
-  HoxConfigStore::SetMaintenanceMode(true);
-  EXPECT_TRUE(HoxConfigManager::IsMaintenanceModeEnabled());
-  HoxConfigStore::SetMaintenanceMode(false);
-  EXPECT_FALSE(HoxConfigManager::IsMaintenanceModeEnabled());
-}
-
 TEST_F(HostDocumentsTest, MergedBootDocumentIsWrittenOnlyWhenEveryKeyHasASchema) {
   root_.WriteFile("/sys/class/dmi/id/product_uuid", "4C4C4544-0042-3510-8053-B4C04F4E3132\n");
   root_.WriteFile("/tmp/good.json", R"({"services":{"time":{"ntp":{"enabled":true}}}})");
