@@ -36,20 +36,6 @@ bool HasPatterns(const Value& node) {
   return false;
 }
 
-bool HasLongStrings(const Value& v) {
-  if (v.IsString()) return v.GetStringLength() > kMaxPatternSubject;
-  if (v.IsObject()) {
-    for (const auto& m : v.GetObject()) {
-      if (m.name.GetStringLength() > kMaxPatternSubject || HasLongStrings(m.value)) return true;
-    }
-  } else if (v.IsArray()) {
-    for (const auto& e : v.GetArray()) {
-      if (HasLongStrings(e)) return true;
-    }
-  }
-  return false;
-}
-
 // A long string found: where it is, and whether it is a member name.
 struct Subject {
   std::vector<std::string> tokens;  // path from the document root
@@ -224,7 +210,7 @@ void* RunWork(void* arg) {
 
 bool GuardPatternSubjects(const Value& schema, const Value& document, const std::string& path,
                           rapidjson::Document& guarded, std::vector<Finding>& out) {
-  if (!HasLongStrings(document) || !HasPatterns(schema)) return false;
+  if (!HasStringsLongerThan(document, kMaxPatternSubject) || !HasPatterns(schema)) return false;
   SubjectWalk walk(schema);
   std::vector<std::string> tokens;
   std::vector<Subject> subjects;
@@ -247,6 +233,20 @@ bool GuardPatternSubjects(const Value& schema, const Value& document, const std:
     Cut(guarded, s);
   }
   return true;
+}
+
+bool HasStringsLongerThan(const Value& v, std::size_t limit) {
+  if (v.IsString()) return v.GetStringLength() > limit;
+  if (v.IsObject()) {
+    for (const auto& m : v.GetObject()) {
+      if (m.name.GetStringLength() > limit || HasStringsLongerThan(m.value, limit)) return true;
+    }
+  } else if (v.IsArray()) {
+    for (const auto& e : v.GetArray()) {
+      if (HasStringsLongerThan(e, limit)) return true;
+    }
+  }
+  return false;
 }
 
 void RunOnLargeStack(const std::function<void()>& work) {

@@ -18,6 +18,8 @@
 namespace JsonValidator::detail {
 
 constexpr std::size_t kMaxPatternSubject = 4096;
+// Subjects up to this length are matched safely on any thread's stack.
+constexpr std::size_t kSmallSubject = 256;
 
 // When `document` holds strings (values or member names) longer than the
 // limit that a pattern of `schema` may be applied to, reports each one as a
@@ -26,6 +28,10 @@ constexpr std::size_t kMaxPatternSubject = 4096;
 // engine as it is.
 bool GuardPatternSubjects(const rapidjson::Value& schema, const rapidjson::Value& document, const std::string& path,
                           rapidjson::Document& guarded, std::vector<Finding>& out);
+
+// True when `document` holds a string value or member name longer than
+// `limit` bytes.
+bool HasStringsLongerThan(const rapidjson::Value& document, std::size_t limit);
 
 // Runs `work` on a thread with a large stack and waits for it; rethrows what
 // `work` throws.

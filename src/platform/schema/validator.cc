@@ -72,7 +72,7 @@ void RunEngine(const Value& schema, const Value& document, const std::string& pa
   const Value& subject = detail::GuardPatternSubjects(schema, document, path, guarded, out) ? guarded : document;
   valijson::ValidationResults results;
   try {
-    detail::RunOnLargeStack([&] {
+    const auto run = [&] {
       valijson::Schema compiled;
       valijson::SchemaParser parser(valijson::SchemaParser::kDraft4);
       valijson::adapters::RapidJsonAdapter schemaAdapter(schema);
@@ -80,7 +80,13 @@ void RunEngine(const Value& schema, const Value& document, const std::string& pa
       valijson::Validator validator;
       valijson::adapters::RapidJsonAdapter target(subject);
       validator.validate(compiled, target, &results);
-    });
+    };
+    // Short strings cannot exhaust any stack; spare the thread for them.
+    if (detail::HasStringsLongerThan(subject, detail::kSmallSubject)) {
+      detail::RunOnLargeStack(run);
+    } else {
+      run();
+    }
   } catch (const std::exception& e) {
     out.push_back(SchemaInvalid(path, e.what()));
     return;
