@@ -147,6 +147,21 @@ void CheckCompiles(const rapidjson::Value& schema) {
   }
 }
 
+// Trigger values are compared with a changed value by the property's single
+// "type"; each one must be of that type.
+void CheckTriggers(const rapidjson::Value& property, const rapidjson::Value& triggers, const std::string& where) {
+  auto type = property.FindMember("type");
+  if (type == property.MemberEnd() || !type->value.IsString()) {
+    Fail(where + ": a property with trigger values needs a single \"type\"");
+  }
+  const std::string kind = type->value.GetString();
+  for (const auto& v : triggers.GetArray()) {
+    const bool ok = (kind == "integer" && v.IsInt64()) || (kind == "number" && v.IsNumber()) ||
+                    (kind == "boolean" && v.IsBool()) || (kind == "string" && v.IsString());
+    if (!ok) Fail(where + ": trigger values must be of the property's type \"" + kind + "\"");
+  }
+}
+
 // Checks the impact and sensitivity annotations of the instance schema and
 // tells whether any property declares reboot / maintenance-mode triggers.
 void CheckAnnotations(const rapidjson::Value& instance, KeySchema::Definition& def) {
@@ -160,6 +175,7 @@ void CheckAnnotations(const rapidjson::Value& instance, KeySchema::Definition& d
       if (!v.IsObject() || set == v.MemberEnd() || !set->value.IsArray() || v.MemberCount() != 1) {
         Fail("\"" + std::string(keyword) + "\" at " + where + " must be {\"SET\": [trigger values]}");
       }
+      CheckTriggers(node, set->value, std::string(keyword) + " at " + where);
       (keyword == std::string("rebootRequired") ? def.rebootPropertyLevel : def.maintenanceModePropertyLevel) = true;
     }
     auto sensitive = node.FindMember("sensitive");
