@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <filesystem>
 #include <string>
 #include <thread>
 #include <vector>
@@ -145,8 +146,17 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
       {"bad/x/array", R"({"multiInstance": false, "schema": {"type": "array"}})", "\"type\": \"object\""},
       {"bad/x/mutable", "{\"multiInstance\": false, \"mutableDefault\": true, " + object + "}", "needs \"defaultUserConfig\""},
       {"bad/shallow", "{}", "not at <component>/<group>/<key>.json"},
+      {"bad/x/y", "", "not at <component>/<group>/<key>.json"},
   };
-  for (const Bad& b : bad) root.WriteFile(SchemaPath(b.key), b.content);
+  for (const Bad& b : bad) {
+    if (b.content.empty()) {
+      // A directory where a key file belongs, holding a link back up.
+      std::filesystem::create_directories(root.Path(std::string(kSchemaDir) + "/" + b.key));
+      std::filesystem::create_directory_symlink(root.Path(kSchemaDir), root.Path(std::string(kSchemaDir) + "/" + b.key + "/loop"));
+    } else {
+      root.WriteFile(SchemaPath(b.key), b.content);
+    }
+  }
   root.WriteFile(SchemaPath("good/x/fine"), "{\"multiInstance\": false, " + object + "}");
 
   auto store = SchemaStore::GetStore();
@@ -154,7 +164,7 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
   const auto errors = store->GetLoadErrors();
   EXPECT_EQ(errors.size(), std::size(bad));
   for (const Bad& b : bad) {
-    const std::string path = root.Path(SchemaPath(b.key));
+    const std::string path = root.Path(b.content.empty() ? std::string(kSchemaDir) + "/" + b.key : SchemaPath(b.key));
     auto it = std::find_if(errors.begin(), errors.end(), [&](const std::string& e) { return e.rfind(path + ": ", 0) == 0; });
     ASSERT_NE(it, errors.end()) << b.key;
     EXPECT_NE(it->find(b.reason), std::string::npos) << *it;

@@ -93,7 +93,14 @@ DirectorySchemaStore::DirectorySchemaStore(const std::string& directory) {
   fs::recursive_directory_iterator it(directory, fs::directory_options::follow_directory_symlink, ec), end;
   for (; !ec && it != end; it.increment(ec)) {
     std::error_code fileEc;
-    if (it->is_regular_file(fileEc) && it->path().extension() == ".json") files.push_back(it->path());
+    if (it->is_directory(fileEc) && it.depth() >= 2) {
+      // Keys are files of a group directory; nothing deeper is a schema
+      // (and symbolic-link loops end here).
+      it.disable_recursion_pending();
+      loadErrors_.push_back(it->path().string() + ": not at <component>/<group>/<key>.json");
+    } else if (it->is_regular_file(fileEc) && it->path().extension() == ".json") {
+      files.push_back(it->path());
+    }
   }
   if (ec) loadErrors_.push_back(directory + ": " + ec.message());
   std::sort(files.begin(), files.end());
