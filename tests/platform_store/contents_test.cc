@@ -1,7 +1,8 @@
 // Configuration contents, namespace objects and host state as readers and
 // writers of the store see them.
+#include <hoxcm/schema_store.h>
+
 #include "platform_store/store_fixture.h"
-#include "support/fake_schema.h"
 
 namespace hoxcm_test {
 namespace {
@@ -216,27 +217,6 @@ TEST_F(StoreTest, HostStateHasDefaultsAndKeepsWhatIsSet) {
   EXPECT_EQ(failures[1].key, "boot_options");
   ClearBootTimeRestoreFailures();
   EXPECT_TRUE(GetBootTimeRestoreFailures().empty());
-}
-
-TEST(StoreObjectTest, ObjectsOwnCopiesOfTheirData) {
-  rapidjson::Document drift = Json(R"({"INSTANCEID":"a","DRIFTOP":"SET"})");
-  DriftObject driftObject({"c", "g", "k", "a"}, "SET", drift);
-  drift.SetNull();
-  EXPECT_EQ(driftObject.Serialize(), R"({"INSTANCEID":"a","DRIFTOP":"SET"})");
-  EXPECT_EQ(driftObject.GetAction(), "SET");
-
-  auto schema = std::make_shared<FakeSchemaObject>();
-  schema->multiInstance = true;
-  schema->identity = "name";
-  rapidjson::Document value = Json(R"({"name":"vmk1","mtu":9000})");
-  auto object = CreateObject({"network", "interfaces", "vnic"}, value, schema, 7);
-  value.SetNull();
-  EXPECT_EQ(object->GetConfigStoreObjectId().instanceId, "vmk1");
-  EXPECT_EQ(object->GetConfigStoreObjectId().toString(), "comp network grp interfaces key vnic id vmk1");
-  EXPECT_EQ(object->Serialize(), R"({"name":"vmk1","mtu":9000})");
-  std::string version;
-  EXPECT_TRUE(object->GetValue("version", &version));
-  EXPECT_EQ(version, "7");
 }
 
 }  // namespace
