@@ -95,6 +95,30 @@ TEST_F(StoreTest, WriterKilledAtAnyMomentLeavesOneCompleteGeneration) {
   }
 }
 
+TEST_F(StoreTest, ProcessesCreatingTheStoreAtOnceAllSucceed) {
+  // Given a root without store, several processes open and write it at the
+  // same moment: one creates it, the others wait and use it.
+  std::vector<pid_t> children;
+  for (int i = 0; i < 4; ++i) {
+    const pid_t child = fork();
+    if (child == 0) {
+      try {
+        AddBootTimeRestoreFailure({"c", "g", std::to_string(i)});
+        _exit(0);
+      } catch (...) {
+        _exit(1);
+      }
+    }
+    children.push_back(child);
+  }
+  for (pid_t child : children) {
+    int status = 0;
+    waitpid(child, &status, 0);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+  }
+  EXPECT_EQ(GetBootTimeRestoreFailures().size(), 4u);
+}
+
 TEST_F(StoreTest, ReadersInThreadsAndAnotherProcessSeeCompleteSetsWhileAWriterReplacesThem) {
   ImportConfiguration(ConfigKind::User, Generation(0));
   // The reading process starts before any thread of this one.
