@@ -53,10 +53,16 @@ step "Export the host's configuration (sensitive values in clear: the file is pr
   export --output "$root/exported-host.json"
 ls -l "$root/exported-host.json"
 echo "--- exported document (first lines) ---"
-python3 -m json.tool "$root/exported-host.json" | head -n 40
-echo "... ($(wc -c <"$root/exported-host.json") bytes)"
+pretty=$(python3 -m json.tool "$root/exported-host.json")
+head -n 30 <<<"$pretty"
+echo "... ($(wc -l <<<"$pretty") lines; the reference host:)"
+grep -A 7 '"reference_host"' <<<"$pretty"
 
-step "The current configuration as the drift walk sees it (secrets masked)" show current --compact
+echo
+echo "== The current configuration as the drift walk sees it (secrets masked; the lines holding them:)"
+echo "\$ hoxcfg show current"
+"$hoxcfg" show current >"$root/current.json"
+grep -n '\*\*\*\*\*\*' <(python3 -m json.tool "$root/current.json")
 step "Maintenance mode" maintenance status
 
 echo
