@@ -19,8 +19,10 @@ const Value& TypeOf(const Value& schemaNode) {
 
 }  // namespace
 
+// Property drift is reported entry by entry, so no consolidated Set is asked
+// for: object-level Set comes only for a singleton the host lacks.
 CheckComplianceHandler::CheckComplianceHandler(ComplianceResult* result)
-    : DriftHandler(true, false, false), result_(result) {
+    : DriftHandler(false, true, false), result_(result) {
   RAPIDJSON_ASSERT(result != nullptr);
   result_->compliant = true;
   Document& doc = result_->document;

@@ -1,6 +1,9 @@
 #include "drift/drift_walk.h"
 
+#include <charconv>
 #include <cstdint>
+#include <functional>
+#include <optional>
 #include <string_view>
 #include <unordered_map>
 #include <vector>
@@ -16,9 +19,11 @@ namespace HoxConfigManager {
 namespace {
 
 using HoxConfigStore::ConfigStoreObjectId;
+using HoxConfigStore::detail::IsContainer;
 using HoxConfigStore::detail::IsGeneratedId;
 using HoxConfigStore::detail::MemberIndex;
 using HoxConfigStore::detail::NameOf;
+using HoxConfigStore::detail::SameScalar;
 using HoxSchemaStore::SchemaObject;
 using rapidjson::SizeType;
 
@@ -35,14 +40,27 @@ const Value& EmptyObject() {
   return empty;
 }
 
-std::string Join(const std::string& path, std::string_view name) {
-  std::string out;
-  out.reserve(path.size() + 1 + name.size());
-  out.append(path).push_back('/');
-  out.append(name);
-  return out;
-}
-std::string Join(const std::string& path, SizeType index) { return Join(path, std::to_string(index)); }
+// Appends "/segment" to the walk's path for the lifetime of the object.
+class PathSegment {
+ public:
+  PathSegment(std::string& path, std::string_view segment) : path_(path), size_(path.size()) {
+    path_.push_back('/');
+    path_.append(segment);
+  }
+  PathSegment(std::string& path, SizeType index) : path_(path), size_(path.size()) {
+    char digits[16];
+    auto end = std::to_chars(digits, digits + sizeof digits, index).ptr;
+    path_.push_back('/');
+    path_.append(digits, end);
+  }
+  ~PathSegment() { path_.resize(size_); }
+  PathSegment(const PathSegment&) = delete;
+  PathSegment& operator=(const PathSegment&) = delete;
+
+ private:
+  std::string& path_;
+  const std::string::size_type size_;
+};
 
 // Host positions grouped by a key, each group in ascending host order; the
 // first unmatched position of a key is found without scanning the others.
@@ -82,6 +100,61 @@ class PositionIndex {
   std::vector<SizeType> next_;
 };
 
+// Matches desired instances (or array elements), in desired order, to the
+// first unmatched host position that matches each, in host order. Documents
+// mostly list the same things in the same order, so the host position of the
+// same index is tried first, together with the few earlier positions left
+// unmatched ("holes"); the index by key is built only when that fails, and
+// used alone once there are many holes.
+template <typename Key, typename HostKey>
+class HostMatcher {
+ public:
+  HostMatcher(SizeType size, HostKey hostKey) : matched_(size, false), hostKey_(std::move(hostKey)) {}
+
+  // The host position matching desired position `i`, or kNone. `matches(j)`
+  // tells whether host position j matches; `desiredKey()` gives the key
+  // that matching host positions share.
+  template <typename Matches, typename DesiredKey>
+  SizeType Take(SizeType i, Matches&& matches, DesiredKey&& desiredKey) {
+    const SizeType size = static_cast<SizeType>(matched_.size());
+    SizeType found = kNone;
+    if (!indexOnly_) {
+      for (SizeType k : holes_) {
+        if (!matched_[k] && matches(k)) {
+          found = k;
+          break;
+        }
+      }
+      if (found == kNone && i < size && !matched_[i] && matches(i)) found = i;
+      if (found != kNone) matched_[found] = true;
+    }
+    if (found == kNone) found = Index().TakeFirst(desiredKey(), matched_, matches);
+    if (!indexOnly_ && i < size && !matched_[i]) {
+      holes_.push_back(i);
+      indexOnly_ = holes_.size() > kMaxHoles;
+    }
+    return found;
+  }
+  const std::vector<bool>& matched() const { return matched_; }
+
+ private:
+  static constexpr std::size_t kMaxHoles = 8;
+
+  PositionIndex<Key>& Index() {
+    if (!index_) {
+      index_.emplace(static_cast<SizeType>(matched_.size()));
+      for (SizeType j = 0; j < matched_.size(); ++j) index_->Insert(hostKey_(j), j);
+    }
+    return *index_;
+  }
+
+  std::vector<bool> matched_;
+  HostKey hostKey_;
+  std::vector<SizeType> holes_;
+  bool indexOnly_ = false;
+  std::optional<PositionIndex<Key>> index_;
+};
+
 class DriftWalk {
  public:
   DriftWalk(Allocator& allocator, DriftHandler& handler)
@@ -92,35 +165,42 @@ class DriftWalk {
         perProperty_(handler.IsPerProperty()) {}
 
   void CompareItem(const Value& desired, const Value& host, ConfigStoreObjectId& id,
-                   const std::shared_ptr<SchemaObject>& schema, const std::string& path) {
+                   const std::shared_ptr<SchemaObject>& schema, const std::string& itemPath) {
+    path_ = itemPath;
+    instanceId_ = &id.instanceId;
     if (schema->IsMultiInstance()) {
-      CompareInstances(desired, host, id, schema, path);
+      CompareInstances(desired, host, id, schema);
     } else {
-      CompareSingle(desired, host, id, schema, path);
+      CompareSingle(desired, host, id, schema);
     }
   }
 
  private:
-  Value NewRecord(const std::string& instanceId, ACTION action) {
+  Value NewRecord(ACTION action) {
     Value marker(rapidjson::kObjectType);
-    marker.AddMember("INSTANCEID", Value(instanceId, allocator_), allocator_);
+    marker.AddMember("INSTANCEID", Value(*instanceId_, allocator_), allocator_);
     marker.AddMember("DRIFTOP", rapidjson::StringRef(ActionName(action)), allocator_);
     Value record(rapidjson::kObjectType);
     record.AddMember("DRIFTOBJ", marker, allocator_);
     return record;
   }
 
-  void Report(const Value& desired, const Value& host, const Value& schemaNode, const std::string& path,
-              ACTION action, Value* record, std::string_view name, const std::string& instanceId) {
-    handler_.PropertyDrift(desired, host, schemaNode, path, action);
-    if (record != nullptr) {
-      record->AddMember(Value(name.data(), static_cast<SizeType>(name.size()), allocator_),
-                        NewRecord(instanceId, action), allocator_);
-    }
+  // Records a drifted member in a drift record, creating the record on the
+  // first difference (no record is built for what does not drift).
+  void Mark(Value* record, std::string_view name, Value marker) {
+    if (record == nullptr) return;
+    if (record->IsNull()) *record = NewRecord(SET);
+    record->AddMember(Value(name.data(), static_cast<SizeType>(name.size()), allocator_), marker, allocator_);
+  }
+
+  void Report(const Value& desired, const Value& host, const Value& schemaNode, ACTION action, Value* record,
+              std::string_view name) {
+    handler_.PropertyDrift(desired, host, schemaNode, path_, action);
+    if (record != nullptr) Mark(record, name, NewRecord(action));
   }
 
   void CompareSingle(const Value& desired, const Value& host, ConfigStoreObjectId& id,
-                     const std::shared_ptr<SchemaObject>& schema, const std::string& path) {
+                     const std::shared_ptr<SchemaObject>& schema) {
     const bool deletedDefault = host.IsString() && NameOf(host) == kDeletedDefault;
     RAPIDJSON_ASSERT(desired.IsNull() || desired.IsObject());
     RAPIDJSON_ASSERT(host.IsNull() || host.IsObject() || deletedDefault);
@@ -130,76 +210,76 @@ class DriftWalk {
     if (desiredAbsent && hostAbsent) return;
     if (!perProperty_) {
       if (desiredAbsent) {
-        handler_.Delete(host, id, schema, path);
+        handler_.Delete(host, id, schema, path_);
         return;
       }
       if (hostAbsent) {
-        const Value record = driftRecords_ ? NewRecord(id.instanceId, SET) : Value();
-        handler_.Set(desired, host, id, schema, path, record);
+        const Value record = driftRecords_ ? NewRecord(SET) : Value();
+        handler_.Set(desired, host, id, schema, path_, record);
         return;
       }
     }
     const Value& d = desiredAbsent ? EmptyObject() : desired;
     const Value& h = host.IsObject() ? host : EmptyObject();
-    Value record = driftRecords_ ? NewRecord(id.instanceId, SET) : Value();
-    if (CompareMembers(d, h, node, path, driftRecords_ ? &record : nullptr, id.instanceId) && consolidated_) {
-      handler_.Set(desired, host, id, schema, path, record);
+    Value record;
+    if (CompareMembers(d, h, node, driftRecords_ ? &record : nullptr) && consolidated_) {
+      handler_.Set(desired, host, id, schema, path_, record);
     }
   }
 
   // Reports the differing members of two objects: first those of `d` in its
   // order (additions and changes, nested objects depth first), then those
   // only `h` holds, in its order. True when anything differed.
-  bool CompareMembers(const Value& d, const Value& h, const Value& schema, const std::string& path,
-                      Value* record, const std::string& instanceId) {
+  bool CompareMembers(const Value& d, const Value& h, const Value& schema, Value* record) {
     MemberIndex hostIndex(h);
+    HoxConfigStore::detail::ValueComparer::Children children(cmp_, schema);
     bool differed = false;
     SizeType found = 0;
     for (auto it = d.MemberBegin(); it != d.MemberEnd(); ++it) {
       if (IsGeneratedId(it->name)) continue;
       const std::string_view name = NameOf(it->name);
       const Value& dv = it->value;
-      const Value& childSchema = cmp_.Child(schema, name, dv);
       const Value* hv = hostIndex.Find(name);
-      if (hv != nullptr) ++found;
+      if (hv != nullptr) {
+        ++found;
+        // The common case, an unchanged scalar, needs no schema.
+        if (!IsContainer(dv) && !IsContainer(*hv) && SameScalar(dv, *hv)) continue;
+      }
+      const Value& childSchema = children.Of(name, dv);
       const bool hostUnset = hv == nullptr || cmp_.IsUnset(*hv, childSchema);
       const bool desiredUnset = cmp_.IsUnset(dv, childSchema);
+      const PathSegment segment(path_, name);
       if (hostUnset || desiredUnset) {
         if (hostUnset && desiredUnset) continue;
-        Report(dv, hv != nullptr ? *hv : NullValue(), childSchema, Join(path, name), hostUnset ? ADD : DELETE,
-               record, name, instanceId);
+        Report(dv, hv != nullptr ? *hv : NullValue(), childSchema, hostUnset ? ADD : DELETE, record, name);
         differed = true;
       } else if (dv.IsObject() && hv->IsObject()) {
-        Value sub = record != nullptr ? NewRecord(instanceId, SET) : Value();
-        if (CompareMembers(dv, *hv, childSchema, Join(path, name), record != nullptr ? &sub : nullptr,
-                           instanceId)) {
+        Value sub;
+        if (CompareMembers(dv, *hv, childSchema, record != nullptr ? &sub : nullptr)) {
           differed = true;
-          if (record != nullptr) {
-            record->AddMember(Value(name.data(), static_cast<SizeType>(name.size()), allocator_), sub, allocator_);
-          }
+          if (record != nullptr) Mark(record, name, sub.IsNull() ? NewRecord(SET) : std::move(sub));
         }
       } else if (dv.IsArray() && hv->IsArray() && cmp_.HoldsObjects(childSchema, dv, *hv)) {
-        if (CompareObjectArrays(dv, *hv, childSchema, Join(path, name))) {
+        if (CompareObjectArrays(dv, *hv, childSchema)) {
           differed = true;
-          if (record != nullptr) {
-            record->AddMember(Value(name.data(), static_cast<SizeType>(name.size()), allocator_),
-                              NewRecord(instanceId, SET), allocator_);
-          }
+          Mark(record, name, NewRecord(SET));
         }
       } else if (!cmp_.Equal(dv, *hv, childSchema)) {
-        Report(dv, *hv, childSchema, Join(path, name), SET, record, name, instanceId);
+        Report(dv, *hv, childSchema, SET, record, name);
         differed = true;
       }
     }
     if (found == h.MemberCount()) return differed;
     MemberIndex desiredIndex(d);
+    HoxConfigStore::detail::ValueComparer::Children hostChildren(cmp_, schema);
     for (auto it = h.MemberBegin(); it != h.MemberEnd(); ++it) {
       if (IsGeneratedId(it->name)) continue;
       const std::string_view name = NameOf(it->name);
       if (desiredIndex.Find(name) != nullptr) continue;
-      const Value& childSchema = cmp_.Child(schema, name, it->value);
+      const Value& childSchema = hostChildren.Of(name, it->value);
       if (cmp_.IsUnset(it->value, childSchema)) continue;
-      Report(NullValue(), it->value, childSchema, Join(path, name), DELETE, record, name, instanceId);
+      const PathSegment segment(path_, name);
+      Report(NullValue(), it->value, childSchema, DELETE, record, name);
       differed = true;
     }
     return differed;
@@ -208,31 +288,32 @@ class DriftWalk {
   // Elements of arrays of objects are matched, not compared by position: an
   // unmatched desired element is an addition at its own index, an unmatched
   // host element a removal numbered after the desired elements.
-  bool CompareObjectArrays(const Value& d, const Value& h, const Value& schema, const std::string& path) {
-    std::vector<bool> matched(h.Size(), false);
-    PositionIndex<std::uint64_t> index(h.Size());
-    for (SizeType j = 0; j < h.Size(); ++j) index.Insert(cmp_.Hash(h[j], cmp_.Items(schema, h[j])), j);
+  bool CompareObjectArrays(const Value& d, const Value& h, const Value& schema) {
+    HostMatcher<std::uint64_t, std::function<std::uint64_t(SizeType)>> matcher(
+        h.Size(), [&](SizeType j) { return cmp_.Hash(h[j], cmp_.Items(schema, h[j])); });
     bool differed = false;
     for (SizeType i = 0; i < d.Size(); ++i) {
       const Value& items = cmp_.Items(schema, d[i]);
-      const SizeType j = index.TakeFirst(cmp_.Hash(d[i], items), matched,
-                                         [&](SizeType p) { return cmp_.Equal(d[i], h[p], items); });
+      const SizeType j = matcher.Take(
+          i, [&](SizeType p) { return cmp_.Equal(d[i], h[p], items); }, [&] { return cmp_.Hash(d[i], items); });
       if (j == kNone) {
-        handler_.PropertyDrift(d[i], NullValue(), items, Join(path, i), ADD);
+        const PathSegment segment(path_, i);
+        handler_.PropertyDrift(d[i], NullValue(), items, path_, ADD);
         differed = true;
       }
     }
     SizeType next = d.Size();
     for (SizeType j = 0; j < h.Size(); ++j) {
-      if (matched[j]) continue;
-      handler_.PropertyDrift(NullValue(), h[j], cmp_.Items(schema, h[j]), Join(path, next++), DELETE);
+      if (matcher.matched()[j]) continue;
+      const PathSegment segment(path_, next++);
+      handler_.PropertyDrift(NullValue(), h[j], cmp_.Items(schema, h[j]), path_, DELETE);
       differed = true;
     }
     return differed;
   }
 
   void CompareInstances(const Value& desiredIn, const Value& hostIn, ConfigStoreObjectId& id,
-                        const std::shared_ptr<SchemaObject>& schema, const std::string& path) {
+                        const std::shared_ptr<SchemaObject>& schema) {
     static const Value emptyArray(rapidjson::kArrayType);
     RAPIDJSON_ASSERT(desiredIn.IsNull() || desiredIn.IsArray());
     RAPIDJSON_ASSERT(hostIn.IsNull() || hostIn.IsArray());
@@ -240,47 +321,57 @@ class DriftWalk {
     const Value& h = hostIn.IsNull() ? emptyArray : hostIn;
     const std::string& identity = schema->GetIdentityMember();
     const bool generated = identity.empty() || identity == HoxConfigStore::detail::kGeneratedIdMember;
-    // Every instance is checked before anything is reported, so a malformed
-    // item reports nothing.
-    for (const Value* side : {&d, &h}) {
+    // Every instance is checked, and its identity found, before anything is
+    // reported, so a malformed item reports nothing.
+    std::vector<const Value*> desiredIds, hostIds;
+    if (!generated) {
+      desiredIds.reserve(d.Size());
+      hostIds.reserve(h.Size());
+    }
+    const Value identityName(rapidjson::StringRef(identity.data(), static_cast<SizeType>(identity.size())));
+    for (auto [side, ids] : {std::pair{&d, &desiredIds}, std::pair{&h, &hostIds}}) {
       for (const Value& instance : side->GetArray()) {
         RAPIDJSON_ASSERT(instance.IsObject());
-        if (!generated) {
-          auto member = instance.FindMember(identity);
-          RAPIDJSON_ASSERT(member != instance.MemberEnd() && member->value.IsString());
-        }
+        if (generated) continue;
+        auto member = instance.FindMember(identityName);
+        RAPIDJSON_ASSERT(member != instance.MemberEnd() && member->value.IsString());
+        ids->push_back(&member->value);
       }
     }
     const Value& node = schema->GetInstanceSchema();
-    std::vector<bool> matched(h.Size(), false);
+    std::vector<bool> matched;
     if (generated) {
-      PositionIndex<std::uint64_t> index(h.Size());
-      for (SizeType j = 0; j < h.Size(); ++j) index.Insert(cmp_.Hash(h[j], node), j);
+      HostMatcher<std::uint64_t, std::function<std::uint64_t(SizeType)>> matcher(
+          h.Size(), [&](SizeType j) { return cmp_.Hash(h[j], node); });
       for (SizeType i = 0; i < d.Size(); ++i) {
-        const SizeType j = index.TakeFirst(cmp_.Hash(d[i], node), matched,
-                                           [&](SizeType p) { return cmp_.Equal(d[i], h[p], node); });
+        const SizeType j = matcher.Take(
+            i, [&](SizeType p) { return cmp_.Equal(d[i], h[p], node); }, [&] { return cmp_.Hash(d[i], node); });
         if (j != kNone) continue;
         id.instanceId = GeneratedIdOf(d[i]);
-        handler_.Add(d[i], id, schema, Join(path, i));
+        const PathSegment segment(path_, i);
+        handler_.Add(d[i], id, schema, path_);
       }
+      matched = matcher.matched();
     } else {
-      PositionIndex<std::string_view> index(h.Size());
-      for (SizeType j = 0; j < h.Size(); ++j) index.Insert(NameOf(h[j][identity]), j);
+      HostMatcher<std::string_view, std::function<std::string_view(SizeType)>> matcher(
+          h.Size(), [&](SizeType j) { return NameOf(*hostIds[j]); });
       for (SizeType i = 0; i < d.Size(); ++i) {
-        const Value& name = d[i][identity];
+        const Value& name = *desiredIds[i];
+        const std::string_view key = NameOf(name);
+        const SizeType j = matcher.Take(
+            i, [&](SizeType p) { return NameOf(*hostIds[p]) == key; }, [&] { return key; });
         id.instanceId.assign(name.GetString(), name.GetStringLength());
-        const std::string instancePath = Join(path, i);
-        const SizeType j = index.TakeFirst(NameOf(name), matched, [](SizeType) { return true; });
+        const PathSegment segment(path_, i);
         if (j == kNone) {
-          handler_.Add(d[i], id, schema, instancePath);
+          handler_.Add(d[i], id, schema, path_);
           continue;
         }
-        Value record = driftRecords_ ? NewRecord(id.instanceId, SET) : Value();
-        if (CompareMembers(d[i], h[j], node, instancePath, driftRecords_ ? &record : nullptr, id.instanceId) &&
-            consolidated_) {
-          handler_.Set(d[i], h[j], id, schema, instancePath, record);
+        Value record;
+        if (CompareMembers(d[i], h[j], node, driftRecords_ ? &record : nullptr) && consolidated_) {
+          handler_.Set(d[i], h[j], id, schema, path_, record);
         }
       }
+      matched = matcher.matched();
     }
     SizeType next = d.Size();
     for (SizeType j = 0; j < h.Size(); ++j) {
@@ -288,10 +379,10 @@ class DriftWalk {
       if (generated) {
         id.instanceId = GeneratedIdOf(h[j]);
       } else {
-        const Value& name = h[j][identity];
-        id.instanceId.assign(name.GetString(), name.GetStringLength());
+        id.instanceId.assign(hostIds[j]->GetString(), hostIds[j]->GetStringLength());
       }
-      handler_.Delete(h[j], id, schema, Join(path, next++));
+      const PathSegment segment(path_, next++);
+      handler_.Delete(h[j], id, schema, path_);
     }
   }
 
@@ -309,6 +400,9 @@ class DriftWalk {
   const bool driftRecords_;
   const bool perProperty_;
   HoxConfigStore::detail::ValueComparer cmp_;
+  // The path of what is being compared, grown and shrunk as the walk descends.
+  std::string path_;
+  const std::string* instanceId_ = nullptr;
 };
 
 const Value* FindIn(const Value* object, const Value& name) {

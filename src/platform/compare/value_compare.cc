@@ -46,18 +46,6 @@ const FallbackSchemas& Fallbacks() {
   return schemas;
 }
 
-const Value* FindLinear(const Value& object, std::string_view name) {
-  for (auto it = object.MemberBegin(); it != object.MemberEnd(); ++it) {
-    if (NameOf(it->name) == name) return &it->value;
-  }
-  return nullptr;
-}
-
-bool SameScalar(const Value& a, const Value& b) {
-  if (a.IsNumber() && b.IsNumber()) return a == b;
-  return a.GetType() == b.GetType() && a == b;
-}
-
 std::uint64_t NumberHash(const Value& v) {
   double d = v.GetDouble();
   if (d == 0) d = 0;  // -0.0 and 0 are equal
@@ -73,13 +61,12 @@ std::uint64_t ScalarHash(const Value& v) {
   return Mix(static_cast<std::uint64_t>(v.GetType()) + 1);
 }
 
-const Value* DefaultOf(const Value& schema) {
-  if (!schema.IsObject()) return nullptr;
-  auto it = schema.FindMember("default");
-  return it == schema.MemberEnd() ? nullptr : &it->value;
-}
-
 }  // namespace
+
+bool SameScalar(const Value& a, const Value& b) {
+  if (a.IsNumber() && b.IsNumber()) return a == b;
+  return a.GetType() == b.GetType() && a == b;
+}
 
 MemberIndex::MemberIndex(const Value& object) : object_(object) {
   if (object.MemberCount() <= kWideObject) return;
@@ -88,10 +75,22 @@ MemberIndex::MemberIndex(const Value& object) : object_(object) {
   for (auto it = object.MemberBegin(); it != object.MemberEnd(); ++it, ++i) index_.emplace(NameOf(it->name), i);
 }
 
-const Value* MemberIndex::Find(std::string_view name) const {
-  if (index_.empty()) return FindLinear(object_, name);
-  auto it = index_.find(name);
-  return it == index_.end() ? nullptr : &(object_.MemberBegin() + it->second)->value;
+const Value* MemberIndex::Find(std::string_view name) {
+  if (!index_.empty()) {
+    auto it = index_.find(name);
+    return it == index_.end() ? nullptr : &(object_.MemberBegin() + it->second)->value;
+  }
+  const SizeType n = object_.MemberCount();
+  auto members = object_.MemberBegin();
+  for (SizeType k = 0; k < n; ++k) {
+    SizeType i = next_ + k;
+    if (i >= n) i -= n;
+    const auto& m = members[i];
+    if (NameOf(m.name) != name) continue;
+    next_ = i + 1;
+    return &m.value;
+  }
+  return nullptr;
 }
 
 const Value& SchemaForValue(const Value& value) {
@@ -123,23 +122,49 @@ std::string_view SchemaType(const Value& schema) {
   return {};
 }
 
-const MemberIndex& ValueComparer::SchemaIndex(const Value& properties) {
-  auto& slot = schemaIndexes_[&properties];
-  if (!slot) slot = std::make_unique<MemberIndex>(properties);
-  return *slot;
+ValueComparer::SchemaInfo& ValueComparer::Info(const Value& schema) {
+  if (&schema == lastSchema_) return *lastInfo_;
+  auto [it, fresh] = schemas_.try_emplace(&schema);
+  SchemaInfo& info = it->second;
+  lastSchema_ = &schema;
+  lastInfo_ = &info;
+  if (!fresh || !schema.IsObject()) return info;
+  auto props = schema.FindMember("properties");
+  if (props != schema.MemberEnd() && props->value.IsObject()) {
+    info.properties = &props->value;
+    if (props->value.MemberCount() > kWideObject) info.wide = std::make_unique<MemberIndex>(props->value);
+  }
+  auto extra = schema.FindMember("additionalProperties");
+  if (extra != schema.MemberEnd() && extra->value.IsObject()) info.additional = &extra->value;
+  auto def = schema.FindMember("default");
+  if (def != schema.MemberEnd()) info.defaultValue = &def->value;
+  return info;
 }
 
 const Value& ValueComparer::Child(const Value& schema, std::string_view name, const Value& value) {
-  if (schema.IsObject()) {
-    auto props = schema.FindMember("properties");
-    if (props != schema.MemberEnd() && props->value.IsObject()) {
-      const Value* child = props->value.MemberCount() > kWideObject ? SchemaIndex(props->value).Find(name)
-                                                                     : FindLinear(props->value, name);
-      if (child != nullptr && child->IsObject()) return *child;
-    }
-    auto extra = schema.FindMember("additionalProperties");
-    if (extra != schema.MemberEnd() && extra->value.IsObject()) return extra->value;
+  Children children(*this, schema);
+  return children.Of(name, value);
+}
+
+ValueComparer::Children::Children(ValueComparer& comparer, const Value& schema) {
+  SchemaInfo& info = comparer.Info(schema);
+  extra_ = info.additional;
+  if (info.wide) {
+    wide_ = info.wide.get();
+  } else if (info.properties != nullptr) {
+    narrow_.emplace(*info.properties);
   }
+}
+
+const Value& ValueComparer::Children::Of(std::string_view name, const Value& value) {
+  const Value* child = nullptr;
+  if (narrow_) {
+    child = narrow_->Find(name);
+  } else if (wide_ != nullptr) {
+    child = wide_->Find(name);
+  }
+  if (child != nullptr && child->IsObject()) return *child;
+  if (extra_ != nullptr) return *extra_;
   return SchemaForValue(value);
 }
 
@@ -167,59 +192,71 @@ bool ValueComparer::HoldsObjects(const Value& schema, const Value& a, const Valu
 bool ValueComparer::IsUnset(const Value& value, const Value& schema) {
   switch (value.GetType()) {
     case rapidjson::kNullType: return true;
+    case rapidjson::kObjectType: {
+      Children children(*this, schema);
+      for (auto it = value.MemberBegin(); it != value.MemberEnd(); ++it) {
+        if (IsGeneratedId(it->name)) continue;
+        if (!IsUnset(it->value, children.Of(NameOf(it->name), it->value))) return false;
+      }
+      return true;
+    }
+    case rapidjson::kArrayType: {
+      const Value* def = Info(schema).defaultValue;
+      if (def == nullptr || !def->IsArray() || def->Size() != value.Size()) return false;
+      return HoldsObjects(schema, value, *def) ? EqualObjectArrays(value, *def, schema)
+                                               : EqualPrimitiveArrays(value, *def);
+    }
     case rapidjson::kStringType:
       if (value.GetStringLength() == 0) return true;
-      break;
-    case rapidjson::kObjectType: {
-      bool allUnset = true;
-      for (auto it = value.MemberBegin(); it != value.MemberEnd() && allUnset; ++it) {
-        if (IsGeneratedId(it->name)) continue;
-        allUnset = IsUnset(it->value, Child(schema, NameOf(it->name), it->value));
-      }
-      if (allUnset) return true;
-      break;
+      [[fallthrough]];
+    default: {
+      const Value* def = Info(schema).defaultValue;
+      return def != nullptr && SameScalar(*def, value);
     }
-    default: break;
   }
-  const Value* def = DefaultOf(schema);
-  return def != nullptr && *def == value;
 }
 
 bool ValueComparer::Equal(const Value& d, const Value& h, const Value& schema) {
-  const bool dUnset = IsUnset(d, schema);
-  const bool hUnset = IsUnset(h, schema);
-  if (dUnset || hUnset) return dUnset && hUnset;
+  if (Same(d, h, schema)) return true;
+  // Values that differ as written are still equal when both are unset.
+  return IsUnset(d, schema) && IsUnset(h, schema);
+}
+
+bool ValueComparer::Same(const Value& d, const Value& h, const Value& schema) {
   if (d.IsObject() && h.IsObject()) return EqualObjects(d, h, schema);
   if (d.IsArray() && h.IsArray()) {
     if (d.Size() != h.Size()) return false;
     return HoldsObjects(schema, d, h) ? EqualObjectArrays(d, h, schema) : EqualPrimitiveArrays(d, h);
   }
-  return SameScalar(d, h);
+  return !IsContainer(d) && !IsContainer(h) && SameScalar(d, h);
 }
 
 bool ValueComparer::EqualObjects(const Value& d, const Value& h, const Value& schema) {
   MemberIndex hostIndex(h);
+  Children children(*this, schema);
   SizeType found = 0;
   for (auto it = d.MemberBegin(); it != d.MemberEnd(); ++it) {
     if (IsGeneratedId(it->name)) continue;
     const std::string_view name = NameOf(it->name);
-    const Value& childSchema = Child(schema, name, it->value);
     const Value* hv = hostIndex.Find(name);
-    if (hv == nullptr) {
-      if (!IsUnset(it->value, childSchema)) return false;
-      continue;
+    if (hv != nullptr) {
+      ++found;
+      // Equal scalars need no schema.
+      if (!IsContainer(it->value) && !IsContainer(*hv) && SameScalar(it->value, *hv)) continue;
+      if (!Equal(it->value, *hv, children.Of(name, it->value))) return false;
+    } else if (!IsUnset(it->value, children.Of(name, it->value))) {
+      return false;
     }
-    ++found;
-    if (!Equal(it->value, *hv, childSchema)) return false;
   }
   if (found == h.MemberCount()) return true;
   // Members only the host holds must be unset.
   MemberIndex desiredIndex(d);
+  Children hostChildren(*this, schema);
   for (auto it = h.MemberBegin(); it != h.MemberEnd(); ++it) {
     if (IsGeneratedId(it->name)) continue;
     const std::string_view name = NameOf(it->name);
     if (desiredIndex.Find(name) != nullptr) continue;
-    if (!IsUnset(it->value, Child(schema, name, it->value))) return false;
+    if (!IsUnset(it->value, hostChildren.Of(name, it->value))) return false;
   }
   return true;
 }
@@ -258,28 +295,32 @@ bool ValueComparer::EqualObjectArrays(const Value& d, const Value& h, const Valu
 }
 
 std::size_t ValueComparer::Hash(const Value& value, const Value& schema) {
-  if (IsUnset(value, schema)) return kUnsetHash;
   switch (value.GetType()) {
     case rapidjson::kObjectType: {
       // A sum, so that member order does not matter; unset members add
-      // nothing, as they do not count for equality.
+      // nothing, as they do not count for equality. An object whose members
+      // all are unset is unset itself.
       std::uint64_t sum = 0;
+      bool any = false;
+      Children children(*this, schema);
       for (auto it = value.MemberBegin(); it != value.MemberEnd(); ++it) {
         if (IsGeneratedId(it->name)) continue;
-        const std::uint64_t child = Hash(it->value, Child(schema, NameOf(it->name), it->value));
+        const std::uint64_t child = Hash(it->value, children.Of(NameOf(it->name), it->value));
         if (child == kUnsetHash) continue;
+        any = true;
         sum += Mix(StringHash(it->name) ^ Mix(child));
       }
-      return Mix(sum ^ 0x6f626a);
+      return any ? Mix(sum ^ 0x6f626a) : kUnsetHash;
     }
     case rapidjson::kArrayType: {
+      if (IsUnset(value, schema)) return kUnsetHash;
       std::uint64_t sum = 0;
       for (const Value& e : value.GetArray()) sum += Mix(Hash(e, Items(schema, e)));
       return Mix(sum + value.Size() * 0x9e3779b97f4a7c15ULL);
     }
-    case rapidjson::kNumberType: return NumberHash(value);
-    case rapidjson::kStringType: return Mix(StringHash(value));
-    default: return Mix(static_cast<std::uint64_t>(value.GetType()) + 1);
+    default:
+      if (IsUnset(value, schema)) return kUnsetHash;
+      return ScalarHash(value);
   }
 }
 

@@ -3,7 +3,8 @@
 //
 // Two values are equal when they agree after "unset" members are dropped: a
 // member is unset when it is absent, null, the empty string, an object whose
-// members are all unset, or equal to its schema "default". The store's
+// members are all unset, or a scalar or array equal to its schema "default"
+// (arrays compared as multisets). The store's
 // generated identity "cs_generated_id" is never compared. Arrays compare as
 // multisets: arrays of scalars by JSON type and value, arrays of objects
 // element by element under this equality. Hash() agrees with Equal(): equal
@@ -16,6 +17,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <string_view>
 #include <unordered_map>
 
@@ -33,14 +35,18 @@ inline std::string_view NameOf(const rapidjson::Value& name) {
 inline bool IsGeneratedId(const rapidjson::Value& name) { return NameOf(name) == kGeneratedIdMember; }
 
 // Name → member lookup of one object, indexed when the object is wide. With
-// duplicate names the first member wins, as with FindMember.
+// duplicate names (malformed input) any one of them may be found. Narrow objects
+// are searched from just after the previous hit, so that looking up the
+// members of an object that lists them in the same order costs one
+// comparison each.
 class MemberIndex {
  public:
   explicit MemberIndex(const rapidjson::Value& object);
-  const rapidjson::Value* Find(std::string_view name) const;
+  const rapidjson::Value* Find(std::string_view name);
 
  private:
   const rapidjson::Value& object_;
+  rapidjson::SizeType next_ = 0;
   std::unordered_map<std::string_view, rapidjson::SizeType> index_;
 };
 
@@ -65,18 +71,46 @@ class ValueComparer {
   // "additionalProperties"); SchemaForValue(value) when none describes it.
   const rapidjson::Value& Child(const rapidjson::Value& schema, std::string_view name,
                                 const rapidjson::Value& value);
+
+  // Child() for the members of one object, in turn.
+  class Children {
+   public:
+    Children(ValueComparer& comparer, const rapidjson::Value& schema);
+    const rapidjson::Value& Of(std::string_view name, const rapidjson::Value& value);
+
+   private:
+    const rapidjson::Value* extra_ = nullptr;
+    std::optional<MemberIndex> narrow_;
+    MemberIndex* wide_ = nullptr;
+  };
   // The element schema of an array schema; SchemaForValue(element) otherwise.
   const rapidjson::Value& Items(const rapidjson::Value& schema, const rapidjson::Value& element);
   // True when arrays under `schema` hold objects (by schema, else by content).
   bool HoldsObjects(const rapidjson::Value& schema, const rapidjson::Value& a, const rapidjson::Value& b);
 
  private:
+  bool Same(const rapidjson::Value& d, const rapidjson::Value& h, const rapidjson::Value& schema);
   bool EqualObjects(const rapidjson::Value& d, const rapidjson::Value& h, const rapidjson::Value& schema);
   bool EqualObjectArrays(const rapidjson::Value& d, const rapidjson::Value& h, const rapidjson::Value& schema);
-  const MemberIndex& SchemaIndex(const rapidjson::Value& properties);
+  // What the comparison reads of one schema node, looked up once.
+  struct SchemaInfo {
+    const rapidjson::Value* properties = nullptr;
+    const rapidjson::Value* additional = nullptr;
+    const rapidjson::Value* defaultValue = nullptr;
+    std::unique_ptr<MemberIndex> wide;  // of "properties", when wide
+  };
+  SchemaInfo& Info(const rapidjson::Value& schema);
 
-  std::unordered_map<const rapidjson::Value*, std::unique_ptr<MemberIndex>> schemaIndexes_;
+  std::unordered_map<const rapidjson::Value*, SchemaInfo> schemas_;
+  // Consecutive lookups mostly ask for the same node.
+  const rapidjson::Value* lastSchema_ = nullptr;
+  SchemaInfo* lastInfo_ = nullptr;
 };
+
+// Equality of two scalars: numbers by value, anything else by JSON type and
+// value.
+bool SameScalar(const rapidjson::Value& a, const rapidjson::Value& b);
+inline bool IsContainer(const rapidjson::Value& v) { return v.IsObject() || v.IsArray(); }
 
 // Order-insensitive equality of two arrays of scalars: each element of `b`
 // matches at most one element of `a`, by JSON type, then value.

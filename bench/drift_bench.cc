@@ -1,0 +1,179 @@
+// Timings of the drift walk against parsing, on one pair of generated
+// documents, and of one wide key in matching and shuffled order. Prints the
+// ratios that docs/performance.md records.
+//
+//   drift_bench [--scale=N] [benchmark flags]
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <map>
+#include <string>
+#include <vector>
+
+#include <benchmark/benchmark.h>
+
+#include <hoxcm/documents.h>
+#include <hoxcm/drift.h>
+
+#include "doc_generator.h"
+
+namespace {
+
+using HoxConfigManager::Document;
+
+struct Corpus {
+  std::string hostText, desiredText;
+  Document host, desired;
+};
+
+Corpus& Medium() {
+  static Corpus corpus;
+  return corpus;
+}
+
+std::string Serialize(const Document& doc) {
+  std::string out;
+  HoxConfigManager::SerializeValue(doc, out);
+  return out;
+}
+
+Document Copy(const Document& doc) {
+  Document out;
+  out.CopyFrom(doc, out.GetAllocator());
+  return out;
+}
+
+// Parsing both documents with RapidJSON: the yardstick of the walk.
+void BM_ParseBoth(benchmark::State& state) {
+  const Corpus& c = Medium();
+  for (auto _ : state) {
+    Document host, desired;
+    host.Parse(c.hostText.data(), c.hostText.size());
+    desired.Parse(c.desiredText.data(), c.desiredText.size());
+    benchmark::DoNotOptimize(host.IsObject() && desired.IsObject());
+  }
+  state.SetBytesProcessed(state.iterations() * (c.hostText.size() + c.desiredText.size()));
+}
+
+template <typename Handler>
+void RunWalk(benchmark::State& state, Document& desired, const Document& host) {
+  for (auto _ : state) {
+    state.PauseTiming();
+    Document current = Copy(host);
+    Document scratch;  // drift records of this run go here, not into `desired`
+    state.ResumeTiming();
+    if constexpr (std::is_same_v<Handler, HoxConfigManager::CheckComplianceHandler>) {
+      HoxConfigManager::ComplianceResult result;
+      Handler handler(&result);
+      HoxConfigManager::ComputeDrift(desired, scratch.GetAllocator(), handler, std::move(current));
+      benchmark::DoNotOptimize(result.compliant);
+    } else {
+      Handler handler;
+      HoxConfigManager::ComputeDrift(desired, scratch.GetAllocator(), handler, std::move(current));
+      benchmark::DoNotOptimize(handler.getTasks().size());
+    }
+  }
+}
+
+void BM_DriftApplyTasks(benchmark::State& state) {
+  RunWalk<HoxConfigManager::ApplyTaskGenerator>(state, Medium().desired, Medium().host);
+}
+void BM_DriftCompliance(benchmark::State& state) {
+  RunWalk<HoxConfigManager::CheckComplianceHandler>(state, Medium().desired, Medium().host);
+}
+
+// One key of state.range(0) instances; state.range(1) shuffles the host.
+void BM_WideKey(benchmark::State& state) {
+  Document host, desired;
+  hoxcm_bench::GenerateWideKey(42, static_cast<int>(state.range(0)), state.range(1) != 0, host, desired);
+  RunWalk<HoxConfigManager::CheckComplianceHandler>(state, desired, host);
+  state.SetItemsProcessed(state.iterations() * state.range(0));
+}
+
+BENCHMARK(BM_ParseBoth)->Unit(benchmark::kMillisecond)->MinTime(2.0);
+BENCHMARK(BM_DriftApplyTasks)->Unit(benchmark::kMillisecond)->MinTime(2.0);
+BENCHMARK(BM_DriftCompliance)->Unit(benchmark::kMillisecond)->MinTime(2.0);
+BENCHMARK(BM_WideKey)
+    ->ArgsProduct({{1000, 10000, 100000}, {0, 1}})
+    ->Unit(benchmark::kMillisecond)
+    ->MinTime(1.0);
+
+// Keeps the real time per iteration of every run, for the ratios.
+class CollectingReporter : public benchmark::ConsoleReporter {
+ public:
+  void ReportRuns(const std::vector<Run>& runs) override {
+    ConsoleReporter::ReportRuns(runs);
+    for (const Run& run : runs) {
+      if (run.run_type != Run::RT_Iteration) continue;
+      std::string name = run.benchmark_name();
+      name = name.substr(0, name.find("/min_time"));
+      times[name] = run.GetAdjustedRealTime();
+    }
+  }
+  std::map<std::string, double> times;
+};
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  int scale = 200;
+  std::vector<char*> args;
+  for (int i = 0; i < argc; ++i) {
+    if (std::string(argv[i]).rfind("--scale=", 0) == 0) {
+      scale = std::atoi(argv[i] + 8);
+    } else {
+      args.push_back(argv[i]);
+    }
+  }
+  int count = static_cast<int>(args.size());
+  benchmark::Initialize(&count, args.data());
+
+  // A private root holding the replicated schemas.
+  std::string root = (std::filesystem::temp_directory_path() / "hoxcm-bench-XXXXXX").string();
+  if (::mkdtemp(root.data()) == nullptr) return 2;
+  ::setenv("HOX_ROOT", root.c_str(), 1);
+  ::setenv("HOX_LOG_LEVEL", "-1", 1);
+  hoxcm_bench::InstallReplicatedSchemas(scale);
+  hoxcm_bench::GeneratorOptions options;
+  options.replicas = scale;
+  options.instances = 100;
+  Corpus& c = Medium();
+  hoxcm_bench::GeneratePair(options, c.host, c.desired);
+  c.hostText = Serialize(c.host);
+  c.desiredText = Serialize(c.desired);
+  std::printf("documents: host %.1f MB, desired %.1f MB, %d replicas of the sample keys\n", c.hostText.size() / 1e6,
+              c.desiredText.size() / 1e6, scale);
+  {
+    // Load the schema store before anything is timed.
+    HoxConfigManager::ComplianceResult warm;
+    HoxConfigManager::CheckComplianceHandler handler(&warm);
+    HoxConfigManager::ComputeDrift(c.desired, c.desired.GetAllocator(), handler, Copy(c.host));
+    std::printf("report: %u adds, %u deletes, %u sets\n", warm.document["ADDS"].Size(),
+                warm.document["DELETES"].Size(), warm.document["SETS"].Size());
+  }
+
+  CollectingReporter reporter;
+  benchmark::RunSpecifiedBenchmarks(&reporter);
+  benchmark::Shutdown();
+  std::filesystem::remove_all(root);
+
+  auto& t = reporter.times;
+  if (t.count("BM_ParseBoth")) {
+    const double parse = t["BM_ParseBoth"];
+    if (t.count("BM_DriftApplyTasks")) std::printf("ratio apply-task walk / parse both: %.2f\n", t["BM_DriftApplyTasks"] / parse);
+    if (t.count("BM_DriftCompliance")) std::printf("ratio compliance walk / parse both: %.2f\n", t["BM_DriftCompliance"] / parse);
+  }
+  double lo = 0, hi = 0;
+  for (int n : {1000, 10000, 100000}) {
+    const std::string ordered = "BM_WideKey/" + std::to_string(n) + "/0";
+    const std::string shuffled = "BM_WideKey/" + std::to_string(n) + "/1";
+    if (!t.count(ordered) || !t.count(shuffled)) continue;
+    const double perInstance = t[shuffled] / n;
+    lo = lo == 0 ? perInstance : std::min(lo, perInstance);
+    hi = std::max(hi, perInstance);
+    std::printf("wide key %6d: %.3f us/instance shuffled, shuffled / ordered %.2f\n", n, perInstance * 1e3,
+                t[shuffled] / t[ordered]);
+  }
+  if (lo > 0) std::printf("wide key: per-instance time spread (max / min) %.2f\n", hi / lo);
+  return 0;
+}
