@@ -2,6 +2,7 @@
 // in which order, under which paths and identities.
 #include <fstream>
 #include <iterator>
+#include <random>
 #include <string>
 #include <vector>
 
@@ -194,6 +195,73 @@ TEST_F(DriftWalkTest, ItemsOnlyOnTheHostComeAfterTheForwardPassInHostOrder) {
                           "Set /system/kernel/boot_options {\"iommu\":true} null",
                           "Delete /quorlet/system/quorlet_daemon {\"enabled\":true}",
                           "Delete /storage/iscsi/targets/0 [i] {\"iqn\":\"i\"}"}));
+}
+
+// The reference rule: each desired instance takes the first unmatched host
+// instance that matches it, in host order; leftovers are deleted in host
+// order, numbered after the desired instances.
+Calls Reference(const std::vector<std::string>& desired, const std::vector<std::string>& host, bool named) {
+  const std::string p = named ? "/storage/nfs/mounts" : "/network/routes/static";
+  std::vector<bool> matched(host.size(), false);
+  Calls calls;
+  for (size_t i = 0; i < desired.size(); ++i) {
+    size_t j = 0;
+    while (j < host.size() && (matched[j] || host[j] != desired[i])) ++j;
+    if (j < host.size()) {
+      matched[j] = true;
+      if (named) {
+        calls.push_back("Property SET " + p + "/" + std::to_string(i) + "/server \"d" + std::to_string(i) + "\" \"h" +
+                        std::to_string(j) + "\"");
+      }
+      continue;
+    }
+    calls.push_back("Add " + p + "/" + std::to_string(i) + " [" + (named ? desired[i] : "d" + std::to_string(i)) + "]");
+  }
+  size_t next = desired.size();
+  for (size_t j = 0; j < host.size(); ++j) {
+    if (matched[j]) continue;
+    calls.push_back("Delete " + p + "/" + std::to_string(next++) + " [" + (named ? host[j] : "h" + std::to_string(j)) +
+                    "]");
+  }
+  return calls;
+}
+
+TEST_F(DriftWalkTest, MatchingFollowsTheFirstUnmatchedHostInstanceRule) {
+  // Given random instance lists with many duplicates, in runs long and short
+  // (so that both the positional and the indexed matching are used), the
+  // walk should pair instances exactly as the reference rule does.
+  std::mt19937 rng(5);
+  for (int round = 0; round < 60; ++round) {
+    const bool named = round % 2 == 0;
+    const size_t hostSize = rng() % (round < 30 ? 12 : 80), desiredSize = rng() % (round < 30 ? 12 : 80);
+    const unsigned alphabet = 1 + rng() % 6;
+    std::vector<std::string> host, desired;
+    for (size_t j = 0; j < hostSize; ++j) host.push_back("n" + std::to_string(rng() % alphabet));
+    // Mostly the host's order, with some changes, as real documents are.
+    for (size_t i = 0; i < desiredSize; ++i) {
+      desired.push_back(i < hostSize && rng() % 4 != 0 ? host[i] : "n" + std::to_string(rng() % alphabet));
+    }
+    std::string d = named ? R"({"storage":{"nfs":{"mounts":[)" : R"({"network":{"routes":{"static":[)";
+    std::string h = d;
+    for (size_t i = 0; i < desired.size(); ++i) {
+      d += (i ? "," : "") + (named ? R"({"name":")" + desired[i] + R"(","server":"d)" + std::to_string(i) + "\"}"
+                                   : R"({"destination":")" + desired[i] + R"(","cs_generated_id":"d)" +
+                                         std::to_string(i) + "\"}");
+    }
+    for (size_t j = 0; j < host.size(); ++j) {
+      h += (j ? "," : "") + (named ? R"({"name":")" + host[j] + R"(","server":"h)" + std::to_string(j) + "\"}"
+                                   : R"({"destination":")" + host[j] + R"(","cs_generated_id":"h)" +
+                                         std::to_string(j) + "\"}");
+    }
+    d += "]}}}";
+    h += "]}}}";
+    Calls calls = Walk(d, h, hoxcm_test::RecordingHandler(false, false, false));
+    // Values are not part of the rule: keep path and identity.
+    for (std::string& call : calls) {
+      if (call.rfind("Property", 0) != 0) call = call.substr(0, call.find(']') + 1);
+    }
+    EXPECT_EQ(calls, Reference(desired, host, named)) << "round " << round;
+  }
 }
 
 }  // namespace
