@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <atomic>
+#include <cstdio>
 #include <chrono>
 #include <thread>
 
@@ -105,7 +106,8 @@ TEST_F(StoreTest, ProcessesCreatingTheStoreAtOnceAllSucceed) {
       try {
         AddBootTimeRestoreFailure({"c", "g", std::to_string(i)});
         _exit(0);
-      } catch (...) {
+      } catch (const std::exception& e) {
+        std::fprintf(stderr, "child %d: %s\n", i, e.what());
         _exit(1);
       }
     }

@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <cstring>
 
+#include <chrono>
 #include <filesystem>
 #include <map>
 #include <system_error>
@@ -90,6 +91,28 @@ void MakePrivate(const std::string& path) {
   }
 }
 
+// Switches the store to write-ahead logging and returns the journal mode in
+// effect. The switch needs an exclusive lock, and SQLite answers "busy"
+// without calling the busy handler while another process holds a lock, so
+// the switch is retried here for as long as any statement would wait.
+std::string SetWalMode(sqlite3* db) {
+  const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(kBusyTimeoutMs);
+  for (;;) {
+    std::string mode;
+    const int rc = sqlite3_exec(
+        db, "PRAGMA journal_mode = WAL",
+        [](void* out, int columns, char** values, char**) {
+          if (columns > 0 && values[0] != nullptr) *static_cast<std::string*>(out) = values[0];
+          return 0;
+        },
+        &mode, nullptr);
+    if (rc == SQLITE_OK) return mode;
+    if ((rc & 0xff) != SQLITE_BUSY && (rc & 0xff) != SQLITE_LOCKED) ThrowSqliteError(db, rc, "set journal mode");
+    if (std::chrono::steady_clock::now() >= deadline) ThrowSqliteError(db, rc, "set journal mode");
+    std::this_thread::sleep_for(std::chrono::milliseconds(5));
+  }
+}
+
 }  // namespace
 
 void ThrowSqliteError(sqlite3* db, int rc, std::string_view what, int code) {
@@ -133,7 +156,11 @@ bool Statement::Step() {
   const int rc = sqlite3_step(stmt_.get());
   if (rc == SQLITE_ROW) return true;
   if (rc == SQLITE_DONE) return false;
-  ThrowSqliteError(db_, rc, "statement");
+  // The text names the statement (values are bound, never part of it).
+  std::string what = "statement \"";
+  what += sqlite3_sql(stmt_.get());
+  what += "\"";
+  ThrowSqliteError(db_, rc, what);
 }
 
 void Statement::Run() {
@@ -238,11 +265,8 @@ void Database::CheckAndMigrate(bool created) {
 
   // WAL: readers in other processes keep their snapshot while a writer
   // replaces a set, and a killed writer leaves only an uncommitted tail.
-  {
-    Statement wal(db, "PRAGMA journal_mode = WAL");
-    if (!wal.Step() || wal.TextView(0) != "wal") {
-      CSLogger::Log(CSLogger::kWarning, "ConfigStore %s: write-ahead logging unavailable", path_.c_str());
-    }
+  if (SetWalMode(db) != "wal") {
+    CSLogger::Log(CSLogger::kWarning, "ConfigStore %s: write-ahead logging unavailable", path_.c_str());
   }
   Exec("PRAGMA synchronous = FULL", "configure");
   if (version == kSchemaVersion) return;
