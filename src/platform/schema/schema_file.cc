@@ -10,6 +10,7 @@
 #include <hoxcm/json.h>
 
 #include "foundation/json_parse.h"
+#include "platform/schema/ref_check.h"
 #include "platform/schema/valijson.h"
 
 namespace HoxSchemaStore::detail {
@@ -135,6 +136,7 @@ void CheckCompiles(const rapidjson::Value& schema) {
     }
   };
   ForEachSubschema(schema, "#", false, visit);
+  if (std::string loop = JsonValidator::detail::FindReferenceLoop(schema); !loop.empty()) Fail(loop);
   try {
     valijson::Schema compiled;
     valijson::SchemaParser parser(valijson::SchemaParser::kDraft4);

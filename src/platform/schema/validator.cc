@@ -8,6 +8,7 @@
 #include <hoxcm/schema_store.h>
 
 #include "platform/schema/pattern_guard.h"
+#include "platform/schema/ref_check.h"
 #include "platform/schema/validator_errors.h"
 #include "platform/schema/valijson.h"
 
@@ -70,6 +71,10 @@ std::string ContextToPath(const std::string& base, const std::vector<std::string
 void RunEngine(const Value& schema, const Value& document, const std::string& path, std::vector<Finding>& out) {
   rapidjson::Document guarded;
   const Value& subject = detail::GuardPatternSubjects(schema, document, path, guarded, out) ? guarded : document;
+  if (std::string loop = detail::FindReferenceLoop(schema); !loop.empty()) {
+    out.push_back(SchemaInvalid(path, loop));
+    return;
+  }
   valijson::ValidationResults results;
   try {
     const auto run = [&] {
