@@ -46,34 +46,30 @@ std::shared_ptr<HoxConfigStore::DBStore> DatabaseOrThrow() {
   return db;
 }
 
-// The user configuration rows of one key.
-ConfigMapList RowsOfKey(const ConfigMapList& contents, const SchemaObjectId& id) {
-  ConfigMapList rows;
-  for (const auto& row : contents) {
-    if (row && Column(*row, "Component") == id.component && Column(*row, "ConfigGroup") == id.group &&
-        Column(*row, "Name") == id.key) {
-      rows.push_back(row);
-    }
-  }
-  return rows;
-}
+using KeyColumns = std::tuple<const std::string&, const std::string&, const std::string&>;
 
-std::tuple<const std::string&, const std::string&, const std::string&> KeyOf(const HoxConfigStore::ConfigMap& row) {
+KeyColumns KeyOf(const HoxConfigStore::ConfigMap& row) {
   return {Column(row, "Component"), Column(row, "ConfigGroup"), Column(row, "Name")};
 }
 
-// Whether the contents hold an item of the key. The store returns rows
-// ordered by component, group and key, so a binary search finds it; a miss
-// is confirmed by a full scan, since a wrong "deleted" verdict would refuse
-// the whole extraction.
-bool HasItemOfKey(const ConfigMapList& contents, const SchemaObjectId& id) {
-  const std::tuple<const std::string&, const std::string&, const std::string&> wanted{id.component, id.group,
-                                                                                       id.key};
-  auto it = std::lower_bound(contents.begin(), contents.end(), wanted, [](const auto& row, const auto& key) {
-    return row && KeyOf(*row) < key;
-  });
-  if (it != contents.end() && *it && KeyOf(**it) == wanted) return true;
-  return std::any_of(contents.begin(), contents.end(), [&](const auto& row) { return row && KeyOf(*row) == wanted; });
+// The rows of one key. The store returns rows ordered by component, group
+// and key, so a binary search finds them; when it finds none, a full scan
+// confirms, since a wrong "no rows" verdict would refuse a whole extraction.
+ConfigMapList RowsOfKey(const ConfigMapList& contents, const SchemaObjectId& id) {
+  const KeyColumns wanted{id.component, id.group, id.key};
+  auto before = [](const auto& row, const KeyColumns& key) { return row && KeyOf(*row) < key; };
+  auto after = [](const KeyColumns& key, const auto& row) { return !row || key < KeyOf(*row); };
+  auto first = std::lower_bound(contents.begin(), contents.end(), wanted, before);
+  auto last = std::upper_bound(first, contents.end(), wanted, after);
+  ConfigMapList rows;
+  for (auto it = first; it != last; ++it) {
+    if (*it && KeyOf(**it) == wanted) rows.push_back(*it);
+  }
+  if (!rows.empty()) return rows;
+  for (const auto& row : contents) {
+    if (row && KeyOf(*row) == wanted) rows.push_back(row);
+  }
+  return rows;
 }
 
 // Reports, for every key whose default may be changed but not deleted,
@@ -117,7 +113,7 @@ void ProcessMutableDefaultDeletes(Document& result, const ConfigMapList& content
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "ProcessMutableDefaultDeletes");
   std::set<SchemaObjectId> missing;
   for (const SchemaObjectId& id : schemaStore->GetMutableDefaultIds()) {
-    if (!HasItemOfKey(contents, id)) missing.insert(id);
+    if (RowsOfKey(contents, id).empty()) missing.insert(id);
   }
   if (!missing.empty()) {
     std::string joined;

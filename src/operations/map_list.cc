@@ -217,6 +217,11 @@ void ProcessConfigMapList(Document& result, const HoxConfigStore::ConfigMapList&
     RAPIDJSON_ASSERT(value.IsObject());
 
     const SchemaObject& schema = schemas.Find(component, group, key);
+    // An instance row of a singleton key, or an instance without identifier,
+    // would give the key the wrong shape in the document.
+    if (schema.IsMultiInstance() == identifier.empty()) {
+      ThrowException<ConfigManagerException>(InvalidKeyValue, "/" + component + "/" + group + "/" + key);
+    }
     if (columns.autoConf != nullptr) {
       ProcessAutoConfig(value, schema.GetInstanceSchema(), *columns.autoConf, allocator);
     }

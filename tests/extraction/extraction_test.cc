@@ -170,6 +170,7 @@ struct BadRow {
   const char* name;
   std::string component, group, key, value;
   int code;
+  std::string identifier = {};
 };
 
 const std::vector<BadRow>& BadRows() {
@@ -179,6 +180,8 @@ const std::vector<BadRow>& BadRows() {
       {"value that is not an object", "services", "syslog", "config", R"(["x"])", 2000},
       {"value with invalid UTF-8", "services", "syslog", "config", "{\"remoteHost\": \"\xff\"}", 2080},
       {"key without schema", "services", "syslog", "retired_key", R"({"a": 1})", 2021},
+      {"instance of a singleton key", "services", "syslog", "config", R"({"port": 1})", 2084, "second"},
+      {"instance without identifier", "storage", "nfs", "mounts", R"({"name": "x"})", 2084},
   };
   return kRows;
 }
@@ -191,7 +194,7 @@ TEST_F(ExtractionTest, BadUserRowsFailWithTheirCodeAndLeaveTheStoreUntouched) {
       {"export", [] { HoxConfigManager::ExportDocument(); }},
   };
   for (const BadRow& bad : BadRows()) {
-    InsertRawRow(0, bad.component, bad.group, bad.key, "", bad.value);
+    InsertRawRow(0, bad.component, bad.group, bad.key, bad.identifier, bad.value);
     const std::vector<std::string> before = DumpRows();
     for (const auto& [name, extract] : extractions) {
       try {
@@ -208,7 +211,7 @@ TEST_F(ExtractionTest, BadUserRowsFailWithTheirCodeAndLeaveTheStoreUntouched) {
 
 TEST_F(ExtractionTest, BadDesiredAndSmartnicRowsFailWithTheirCode) {
   for (const BadRow& bad : BadRows()) {
-    InsertRawRow(2, bad.component, bad.group, bad.key, "", bad.value);
+    InsertRawRow(2, bad.component, bad.group, bad.key, bad.identifier, bad.value);
     try {
       HoxConfigManager::ExtractDesiredConfiguration();
       ADD_FAILURE() << bad.name << " succeeded";
@@ -219,8 +222,8 @@ TEST_F(ExtractionTest, BadDesiredAndSmartnicRowsFailWithTheirCode) {
   }
   // SmartNIC items are not checked against schemas; the other faults count.
   for (const BadRow& bad : BadRows()) {
-    if (bad.code == 2021) continue;
-    InsertRawRow(3, bad.component, bad.group, bad.key, "", bad.value);
+    if (bad.code == 2021 || bad.code == 2084) continue;
+    InsertRawRow(3, bad.component, bad.group, bad.key, bad.identifier, bad.value);
     try {
       HoxConfigManager::ExtractSmartnicConfiguration();
       ADD_FAILURE() << bad.name << " succeeded";

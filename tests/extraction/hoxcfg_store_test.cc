@@ -107,6 +107,15 @@ TEST_F(HoxcfgStoreTest, ErrorsPrintTheCodeAndNothingOnStdout) {
   }
 }
 
+TEST_F(HoxcfgStoreTest, ReadingCommandsNeedAnInitialisedRoot) {
+  for (const char* command : {"export", "show", "maintenance status"}) {
+    const Outcome failed = Run(command);
+    EXPECT_EQ(failed.exitCode, 2) << command;
+    EXPECT_EQ(failed.err.rfind("hoxcfg: error 2001: ", 0), 0u) << command << ": " << failed.err;
+  }
+  EXPECT_FALSE(HoxConfigManager::fileExists(root_.Path("/var/lib/tarvik/configstore/configstore.db")));
+}
+
 TEST_F(HoxcfgStoreTest, InitRefusesTheRealRootWithoutForce) {
   const Outcome refused = Run("init --root /");
   EXPECT_EQ(refused.exitCode, 2);

@@ -22,6 +22,16 @@ namespace {
 // that drowns the answer. The tool is quiet unless HOX_LOG_LEVEL asks for more.
 void QuietLibraryLog() { ::setenv("HOX_LOG_LEVEL", "-1", 0); }
 
+// Reading commands must not create a store as a side effect: a mistyped
+// root is an error, not a new empty host.
+void RequireHostRoot() {
+  const std::string store = HoxPlatform::HostPath("/var/lib/tarvik/configstore/configstore.db");
+  if (!HoxConfigManager::fileExists(store)) {
+    throw CommandError{HoxConfigManager::ConfigStoreConnectFailed,
+                       "Failed to connect to ConfigStore: no store at " + store + " (run hoxcfg init)"};
+  }
+}
+
 // Replaces every sensitive value of the items of `doc` (a host document,
 // possibly under "profile") by the mask of the store, so that what is shown
 // on a terminal never carries a secret.
@@ -77,6 +87,7 @@ void RegisterExport(CLI::App& app, GlobalOptions& options) {
   cmd->callback([&options, output] {
     Run(options, [&] {
       QuietLibraryLog();
+      RequireHostRoot();
       const rapidjson::Document doc = HoxConfigManager::ExportDocument();
       // The export carries secrets in clear (it must be applicable to another
       // host), so a file is readable by its owner only.
@@ -95,6 +106,7 @@ void RegisterShow(CLI::App& app, GlobalOptions& options) {
   cmd->callback([&options, which] {
     Run(options, [&] {
       QuietLibraryLog();
+      RequireHostRoot();
       rapidjson::Document doc;
       if (*which == "current") {
         doc = HoxConfigManager::ExtractCurrentConfiguration();
@@ -119,6 +131,7 @@ void RegisterMaintenance(CLI::App& app, GlobalOptions& options) {
     cmd->add_subcommand(name, help)->fallthrough()->callback([&options, action] {
       Run(options, [&] {
         QuietLibraryLog();
+        RequireHostRoot();
         if (action >= 0) HoxConfigStore::SetMaintenanceMode(action == 1);
         const bool enabled = HoxConfigManager::IsMaintenanceModeEnabled();
         std::cout << (enabled ? "maintenance mode: entered\n" : "maintenance mode: not entered\n") << std::flush;
