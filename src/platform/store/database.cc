@@ -231,6 +231,16 @@ std::shared_ptr<Database> Database::Open(const std::string& path, bool create) {
   return db;
 }
 
+void Database::RefuseUnreadable(const ConfigStoreException& e) {
+  const int rc = sqlite3_errcode(handle_.get());
+  // Only a damaged or foreign file is "not readable"; a lock held past the
+  // busy timeout or an I/O error is reported as what it is.
+  if (rc == SQLITE_NOTADB || rc == SQLITE_CORRUPT) {
+    Refuse(path_, std::string("not a readable configuration store (") + e.what() + ")");
+  }
+  Refuse(path_, e.what());
+}
+
 void Database::CheckAndMigrate(bool created) {
   sqlite3* db = handle_.get();
   // Everything is read before anything is written: a foreign, corrupt or
@@ -244,7 +254,7 @@ void Database::CheckAndMigrate(bool created) {
     tables = count.Int(0);
     versionTables = count.Int(1);
   } catch (const ConfigStoreException& e) {
-    Refuse(path_, std::string("not a readable configuration store (") + e.what() + ")");
+    RefuseUnreadable(e);
   }
   int64_t version = 0;
   if (versionTables == 0 && tables > 0) Refuse(path_, "not a configuration store");
@@ -255,7 +265,7 @@ void Database::CheckAndMigrate(bool created) {
       version = read.Int(0);
     } catch (const ConfigStoreException& e) {
       if (e.GetErrorCode() == kConnectFailed) throw;
-      Refuse(path_, std::string("not a readable configuration store (") + e.what() + ")");
+      RefuseUnreadable(e);
     }
   }
   if (version > kSchemaVersion) {

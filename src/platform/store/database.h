@@ -132,6 +132,7 @@ class Database final : public DBStore {
 
   Database(std::string path, SqliteHandle handle);
   void CheckAndMigrate(bool created);
+  [[noreturn]] void RefuseUnreadable(const ConfigStoreException& e);
 
   const std::string path_;
   SqliteHandle handle_;
