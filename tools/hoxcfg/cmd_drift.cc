@@ -19,9 +19,13 @@ namespace {
 // more on a terminal. HOX_LOG_LEVEL still asks for more.
 void QuietLibraryLog() { ::setenv("HOX_LOG_LEVEL", "-1", 0); }
 
+// The document as it applies to this host: host-specific sections (as an
+// export writes them) are reduced to this host's.
 rapidjson::Document LoadDocument(const std::string& path) {
+  rapidjson::Document file;
+  HoxConfigManager::CreateDocumentFromFile(path.c_str(), file);
   rapidjson::Document doc;
-  HoxConfigManager::CreateDocumentFromFile(path.c_str(), doc);
+  HoxConfigManager::CreateMergedDocument(file, doc);
   return doc;
 }
 
