@@ -1,4 +1,6 @@
 // Store object values, namespace stores and transactions.
+#include <unistd.h>
+
 #include <random>
 
 #include <hoxcm/config_store.h>
@@ -34,13 +36,16 @@ std::shared_ptr<DBStore> GetDBStore(int storeType, bool create) {
 }
 
 std::string GenerateInstanceId() {
-  // One generator per thread: random_device is slow and not meant to be
-  // shared, the engine is seeded from it once.
-  thread_local std::mt19937_64 engine([] {
+  // One generator per thread, seeded from the system's random device; a
+  // forked child seeds its own, so that it never repeats its parent's ids.
+  thread_local std::mt19937_64 engine;
+  thread_local pid_t seededBy = 0;
+  if (seededBy != ::getpid()) {
     std::random_device device;
     std::seed_seq seed{device(), device(), device(), device(), device(), device(), device(), device()};
-    return std::mt19937_64(seed);
-  }());
+    engine.seed(seed);
+    seededBy = ::getpid();
+  }
   uint8_t bytes[16];
   for (int i = 0; i < 16; i += 8) {
     const uint64_t r = engine();
