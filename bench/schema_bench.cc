@@ -23,8 +23,8 @@ const std::string kSchemas = std::string(HOXCM_SOURCE_DIR) + "/data/sample-host/
 
 Document SampleConfiguration() {
   Document doc;
-  HoxConfigManager::CreateDocumentFromFile((std::string(HOXCM_SOURCE_DIR) + "/data/sample-host/user-config.json").c_str(),
-                                           doc);
+  HoxConfigManager::CreateDocumentFromFile(
+      (std::string(HOXCM_SOURCE_DIR) + "/data/sample-host/user-config.json").c_str(), doc);
   return doc;
 }
 

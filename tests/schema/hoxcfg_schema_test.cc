@@ -24,8 +24,7 @@ class HoxcfgSchemaTest : public ::testing::Test {
     const std::string command = hoxcm_test::BuildPath("tools/hoxcfg") + " --compact " + args + " >" +
                                 root_.Path("/tmp/stdout") + " 2>" + root_.Path("/tmp/stderr");
     const int status = std::system(command.c_str());
-    return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, root_.ReadFile("/tmp/stdout"),
-            root_.ReadFile("/tmp/stderr")};
+    return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, root_.ReadFile("/tmp/stdout"), root_.ReadFile("/tmp/stderr")};
   }
 
   hoxcm_test::TempRoot root_;
@@ -51,7 +50,9 @@ TEST_F(HoxcfgSchemaTest, SchemaCheckExitsByOutcome) {
   const Case cases[] = {
       {s + " " + root_.Path("/good.json"), 0, "[]\n", ""},
       {s + " " + root_.Path("/bad.json"), 1,
-       R"([{"field":"/name","errId":9,"errArgs":["name"],"error":"Missing required property 'name'."}])" "\n", ""},
+       R"([{"field":"/name","errId":9,"errArgs":["name"],"error":"Missing required property 'name'."}])"
+       "\n",
+       ""},
       {s + " " + root_.Path("/broken.json"), 2, "", "hoxcfg: error 2080: "},
       {root_.Path("/unusable.json") + " " + root_.Path("/good.json"), 2, "", "hoxcfg: error 31: "},
       {s + " " + root_.Path("/missing.json"), 2, "", "hoxcfg: error 2080: "},

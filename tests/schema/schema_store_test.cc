@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <functional>
 #include <string>
 #include <thread>
 #include <vector>
@@ -119,7 +120,8 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
   // named in the load errors and every good key should still be served.
   hoxcm_test::TempRoot root;
   root.InstallSampleSchemas();
-  const std::string object = R"("schema": {"type": "object", "properties": {"a": {"type": "string"}}, "required": ["a"]})";
+  const std::string object =
+      R"("schema": {"type": "object", "properties": {"a": {"type": "string"}}, "required": ["a"]})";
   struct Bad {
     const char* key;
     std::string content;
@@ -144,7 +146,8 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
        "invalid regular expression"},
       {"bad/x/engine", R"({"multiInstance": false, "schema": {"type": "object", "minLength": "x"}})", "not usable"},
       {"bad/x/array", R"({"multiInstance": false, "schema": {"type": "array"}})", "\"type\": \"object\""},
-      {"bad/x/mutable", "{\"multiInstance\": false, \"mutableDefault\": true, " + object + "}", "needs \"defaultUserConfig\""},
+      {"bad/x/mutable", "{\"multiInstance\": false, \"mutableDefault\": true, " + object + "}",
+       "needs \"defaultUserConfig\""},
       {"bad/shallow", "{}", "not at <component>/<group>/<key>.json"},
       {"bad/x/y", "", "not at <component>/<group>/<key>.json"},
   };
@@ -152,7 +155,8 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
     if (b.content.empty()) {
       // A directory where a key file belongs, holding a link back up.
       std::filesystem::create_directories(root.Path(std::string(kSchemaDir) + "/" + b.key));
-      std::filesystem::create_directory_symlink(root.Path(kSchemaDir), root.Path(std::string(kSchemaDir) + "/" + b.key + "/loop"));
+      std::filesystem::create_directory_symlink(root.Path(kSchemaDir),
+                                                root.Path(std::string(kSchemaDir) + "/" + b.key + "/loop"));
     } else {
       root.WriteFile(SchemaPath(b.key), b.content);
     }
@@ -165,7 +169,8 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
   EXPECT_EQ(errors.size(), std::size(bad));
   for (const Bad& b : bad) {
     const std::string path = root.Path(b.content.empty() ? std::string(kSchemaDir) + "/" + b.key : SchemaPath(b.key));
-    auto it = std::find_if(errors.begin(), errors.end(), [&](const std::string& e) { return e.rfind(path + ": ", 0) == 0; });
+    auto it =
+        std::find_if(errors.begin(), errors.end(), [&](const std::string& e) { return e.rfind(path + ": ", 0) == 0; });
     ASSERT_NE(it, errors.end()) << b.key;
     EXPECT_NE(it->find(b.reason), std::string::npos) << *it;
   }
@@ -231,4 +236,32 @@ TEST(SchemaStoreTest, HostDocumentSchemaCoversKeysOrNamesTheUnknownOnes) {
   EXPECT_STREQ(errors[0]["field"].GetString(), "/network/dns/resolver");
   EXPECT_EQ(errors[0]["errId"].GetInt(), 30);
   EXPECT_STREQ(errors[1]["errArgs"][0].GetString(), "storage:fc:ports");
+}
+
+TEST(SchemaStoreTest, HostDocumentSchemaRefusesWhatItCannotDescribe) {
+  auto codeOf = [](const std::function<void()>& f) {
+    try {
+      f();
+    } catch (const HoxConfigStore::ConfigStoreException& e) {
+      return e.GetErrorCode();
+    }
+    return 0;
+  };
+  hoxcm_test::TempRoot root;
+  HoxConfigManager::Document out;
+  // No schema directory: the store cannot be reached.
+  EXPECT_EQ(codeOf([&] {
+              HoxConfigManager::GenerateHostDocumentSchema(HoxConfigManager::Document(rapidjson::kObjectType), out);
+            }),
+            2180);
+  EXPECT_EQ(codeOf([&] {
+              HoxSchemaStore::GenerateSchemaDocument(HoxConfigManager::Document(rapidjson::kObjectType), nullptr, out);
+            }),
+            2180);
+  root.InstallSampleSchemas();
+  for (const char* text : {R"([])", R"({"network": 1})", R"({"network": {"dns": []}})", R"({"profile": "x"})"}) {
+    HoxConfigManager::Document doc;
+    HoxConfigManager::ParseDocument(text, doc);
+    EXPECT_EQ(codeOf([&] { HoxConfigManager::GenerateHostDocumentSchema(doc, out); }), 2000) << text;
+  }
 }

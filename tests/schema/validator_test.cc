@@ -90,14 +90,19 @@ TEST(ValidatorTest, ReportsEachFaultAtItsFieldWithItsKind) {
       {kUnionSchema, R"({"remoteHost": "h"})", {{"/protocol", 32}}},
       {kUnionSchema, R"({"remoteHost": "h", "protocol": "smtp"})", {{"/protocol", 32}}},
       {kUnionSchema, R"({"remoteHost": "h", "protocol": "tls"})", {{"/caFile", 9}}},
-      {R"({"type": "array", "items": )" + std::string(kUnionSchema) + "}", R"([{"protocol": "udp"}, {"protocol": 1}])",
+      {R"({"type": "array", "items": )" + std::string(kUnionSchema) + "}",
+       R"([{"protocol": "udp"}, {"protocol": 1}])",
        {{"/1/protocol", 2}, {"/1/protocol", 32}}},
       {R"({"type": "object", "minLength": "x"})", "{}", {{"", 31}}},
       {R"({"type": "string", "pattern": "(["})", R"("x")", {{"", 31}}},
       {R"({"$ref": "#"})", "{}", {{"", 31}}},
       {R"({"definitions": {"a": {"$ref": "#/definitions/b"}, "b": {"$ref": "#/definitions/a"}},
-           "properties": {"x": {"$ref": "#/definitions/a"}}})", "{}", {{"", 31}}},
-      {R"({"type": "object", "properties": {"child": {"$ref": "#"}}})", R"({"child": {"child": 1}})", {{"/child/child", 2}}},
+           "properties": {"x": {"$ref": "#/definitions/a"}}})",
+       "{}",
+       {{"", 31}}},
+      {R"({"type": "object", "properties": {"child": {"$ref": "#"}}})",
+       R"({"child": {"child": 1}})",
+       {{"/child/child", 2}}},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.schema + " / " + c.doc);

@@ -57,8 +57,8 @@ void RegisterSchemaCheck(CLI::App& app, GlobalOptions& options) {
 }
 
 void RegisterSchemas(CLI::App& app, GlobalOptions& options) {
-  auto* cmd = app.add_subcommand("schemas", "List the installed key schemas and the files that failed to load")
-                  ->fallthrough();
+  auto* cmd =
+      app.add_subcommand("schemas", "List the installed key schemas and the files that failed to load")->fallthrough();
   cmd->callback([&options] {
     Run(options, [&] {
       auto store = HoxSchemaStore::SchemaStore::GetStore();

@@ -79,7 +79,7 @@ bool GenerateHostDocumentSchema(const Value& document, Document& out) {
       RAPIDJSON_ASSERT(group.value.IsObject());
       for (const auto& key : group.value.GetObject()) {
         const HoxSchemaStore::SchemaObjectId id(component.name.GetString(), group.name.GetString(),
-                                               key.name.GetString());
+                                                key.name.GetString());
         if (store->Find(id.component, id.group, id.key)) continue;
         CSLogger::Log(CSLogger::kError, "Schema not found for %s", id.toString().c_str());
         const std::string field = "/" + id.component + "/" + id.group + "/" + id.key;

@@ -94,7 +94,8 @@ class SubjectWalk {
       if (hasPatterned) {
         for (const auto& p : patterned->value.GetObject()) ok = ok && Walk(m.value, &p.value, tokens);
       }
-      if (!named && extra != node.MemberEnd() && extra->value.IsObject()) ok = ok && Walk(m.value, &extra->value, tokens);
+      if (!named && extra != node.MemberEnd() && extra->value.IsObject())
+        ok = ok && Walk(m.value, &extra->value, tokens);
       tokens.pop_back();
     }
     if (deps != node.MemberEnd() && deps->value.IsObject()) {

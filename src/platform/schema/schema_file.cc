@@ -215,17 +215,26 @@ void CheckIdentity(rapidjson::Value& instance, const std::string& identity, rapi
   }
   auto member = props->value.FindMember(identity.c_str());
   auto required = instance.FindMember("required");
-  if (member == props->value.MemberEnd() || !member->value.IsObject() ||
-      !member->value.HasMember("type") || member->value["type"] != "string" ||
-      required == instance.MemberEnd() || !ListsString(required->value, identity)) {
+  if (member == props->value.MemberEnd() || !member->value.IsObject() || !member->value.HasMember("type") ||
+      member->value["type"] != "string" || required == instance.MemberEnd() ||
+      !ListsString(required->value, identity)) {
     Fail("identity member \"" + identity + "\" must be a required property of type \"string\"");
   }
 }
 
 KeySchema::Definition ReadDefinition(const rapidjson::Value& root, const SchemaObjectId& id, const std::string& path) {
-  static const std::set<std::string> kMembers = {
-      "formatVersion", "description", "multiInstance", "identity", "defaultUserConfig", "mutableDefault",
-      "hostSpecific", "solutionUsers", "solutionInstanceIds", "rebootRequired", "maintenanceModeRequired", "schema"};
+  static const std::set<std::string> kMembers = {"formatVersion",
+                                                 "description",
+                                                 "multiInstance",
+                                                 "identity",
+                                                 "defaultUserConfig",
+                                                 "mutableDefault",
+                                                 "hostSpecific",
+                                                 "solutionUsers",
+                                                 "solutionInstanceIds",
+                                                 "rebootRequired",
+                                                 "maintenanceModeRequired",
+                                                 "schema"};
   if (!root.IsObject()) Fail("the file is not a JSON object");
   for (const auto& m : root.GetObject()) {
     if (!kMembers.count(m.name.GetString())) Fail("unknown member \"" + std::string(m.name.GetString()) + "\"");

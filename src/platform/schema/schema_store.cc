@@ -26,7 +26,8 @@ bool SchemaObjectId::operator<(const SchemaObjectId& other) const {
 std::size_t SchemaObjectIdHash::operator()(const SchemaObjectId& id) const {
   std::hash<std::string> h;
   std::size_t seed = h(id.component);
-  for (const std::string* part : {&id.group, &id.key}) seed ^= h(*part) + 0x9e3779b97f4a7c15ULL + (seed << 6) + (seed >> 2);
+  for (const std::string* part : {&id.group, &id.key})
+    seed ^= h(*part) + 0x9e3779b97f4a7c15ULL + (seed << 6) + (seed >> 2);
   return seed;
 }
 
@@ -146,7 +147,7 @@ std::string DirectorySchemaStore::GetSchemaInfo(const std::string& component, co
   auto schema = FindKey(id);
   if (!schema) {
     HoxConfigManager::ThrowException<HoxConfigManager::SchemaNotFound>(HoxConfigManager::SchemaObjectNotFound,
-                                                                        id.toString());
+                                                                       id.toString());
   }
   const auto& def = schema->definition();
   rapidjson::StringBuffer buffer;
@@ -185,8 +186,8 @@ std::shared_ptr<SchemaStore> SchemaStore::GetStore() { return detail::GetRootEnt
 
 std::shared_ptr<SchemaCache> SchemaStore::GetCache() { return detail::GetRootEntry().cache; }
 
-std::shared_ptr<SchemaObject> GetSchema(const std::string& component, const std::string& group,
-                                        const std::string& key, const std::shared_ptr<SchemaStore>& store) {
+std::shared_ptr<SchemaObject> GetSchema(const std::string& component, const std::string& group, const std::string& key,
+                                        const std::shared_ptr<SchemaStore>& store) {
   return store ? store->Find(component, group, key) : nullptr;
 }
 
