@@ -3,6 +3,8 @@
 #include <regex>
 #include <set>
 
+#include <hoxcm/schema_store.h>
+
 #include "platform_store/store_fixture.h"
 
 namespace hoxcm_test {
@@ -79,6 +81,20 @@ TEST(ConfigStoreDocumentTest, SplitDocumentMovesHostSpecificKeysAndIsUndoneByDoc
   ConfigStoreDocument::NormalizeValue(merged, merged.GetAllocator());
   ConfigStoreDocument::NormalizeValue(expected, expected.GetAllocator());
   EXPECT_EQ(Compact(merged), Compact(expected));
+}
+
+TEST_F(StoreTest, SplitDocumentFollowsTheHostSpecificKeysOfTheInstalledSchemas) {
+  rapidjson::Document profile;
+  HoxConfigManager::CreateDocumentFromFile(SourcePath("data/sample-host/user-config.json").c_str(), profile);
+  rapidjson::Document schemaDocument;
+  HoxSchemaStore::GenerateSchemaDocument(profile, HoxSchemaStore::SchemaStore::GetCache(), schemaDocument);
+  rapidjson::Document split;
+  ConfigStoreDocument::SplitDocument(profile, schemaDocument, "4c4c4544-0042-3510-8053-b4c04f4e3132", split);
+  const rapidjson::Value& mine = split["hostSpecific"]["4c4c4544-0042-3510-8053-b4c04f4e3132"];
+  EXPECT_TRUE(mine["network"]["interfaces"].HasMember("vnic"));
+  EXPECT_TRUE(mine["system"]["identity"].HasMember("hostname"));
+  EXPECT_FALSE(split["profile"]["network"].HasMember("interfaces"));
+  EXPECT_TRUE(split["profile"]["network"].HasMember("dns"));
 }
 
 TEST(ConfigStoreDocumentTest, AddObjectPlacesSingletonsAndAppendsInstancesUnderTheProfile) {
