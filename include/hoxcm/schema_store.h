@@ -129,7 +129,7 @@ HOXCM_API void GenerateSchemaDocument(const rapidjson::Value& value, const std::
 
 namespace JsonValidator {
 
-// Error kinds reported by the validator; docs/platform.md lists them with
+// Error kinds reported by the validator; docs/validator.md lists them with
 // their message identifiers.
 enum VALIDATION_ERR_CODES : int {
   VALIDATION_OK = 0,
