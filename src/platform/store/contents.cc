@@ -2,6 +2,7 @@
 // configuration, read as row maps and written from host documents or from
 // the changes of a plugin run.
 #include <set>
+#include <tuple>
 
 #include <hoxcm/config_store.h>
 #include <hoxcm/documents.h>
@@ -157,13 +158,19 @@ ConfigMapList ReadRows(Statement& select) {
   ConfigMapList rows;
   while (select.Step()) {
     auto row = std::make_shared<ConfigMap>();
-    // Inserted in key order at the end: each insertion is constant time.
-    if (!select.IsNull(5)) row->emplace_hint(row->end(), "AutoConfValue", select.Text(5));
-    row->emplace_hint(row->end(), "Component", select.Text(0));
-    row->emplace_hint(row->end(), "ConfigGroup", select.Text(1));
-    row->emplace_hint(row->end(), "Identifier", select.Text(3));
-    row->emplace_hint(row->end(), "Name", select.Text(2));
-    row->emplace_hint(row->end(), "Value", select.Text(4));
+    // Inserted in key order at the end, each value built in its node: one
+    // allocation per member, constant-time insertion.
+    const auto add = [&](const char* name, int column) {
+      const std::string_view text = select.TextView(column);
+      row->emplace_hint(row->end(), std::piecewise_construct, std::forward_as_tuple(name),
+                        std::forward_as_tuple(text.data() != nullptr ? text.data() : "", text.size()));
+    };
+    if (!select.IsNull(5)) add("AutoConfValue", 5);
+    add("Component", 0);
+    add("ConfigGroup", 1);
+    add("Identifier", 3);
+    add("Name", 2);
+    add("Value", 4);
     rows.push_back(std::move(row));
   }
   return rows;
