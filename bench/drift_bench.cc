@@ -75,6 +75,15 @@ void RunWalk(benchmark::State& state, Document& desired, const Document& host) {
   }
 }
 
+// The walk alone: a handler that asks for consolidated Sets and does nothing.
+class NullHandler final : public HoxConfigManager::DriftHandler {
+ public:
+  NullHandler() : DriftHandler(true, false, false) {}
+  std::vector<int> getTasks() const { return {}; }
+};
+
+void BM_DriftBareWalk(benchmark::State& state) { RunWalk<NullHandler>(state, Medium().desired, Medium().host); }
+
 void BM_DriftApplyTasks(benchmark::State& state) {
   RunWalk<HoxConfigManager::ApplyTaskGenerator>(state, Medium().desired, Medium().host);
 }
@@ -91,6 +100,7 @@ void BM_WideKey(benchmark::State& state) {
 }
 
 BENCHMARK(BM_ParseBoth)->Unit(benchmark::kMillisecond)->MinTime(2.0);
+BENCHMARK(BM_DriftBareWalk)->Unit(benchmark::kMillisecond)->MinTime(2.0);
 BENCHMARK(BM_DriftApplyTasks)->Unit(benchmark::kMillisecond)->MinTime(2.0);
 BENCHMARK(BM_DriftCompliance)->Unit(benchmark::kMillisecond)->MinTime(2.0);
 BENCHMARK(BM_WideKey)
@@ -160,6 +170,7 @@ int main(int argc, char** argv) {
   auto& t = reporter.times;
   if (t.count("BM_ParseBoth")) {
     const double parse = t["BM_ParseBoth"];
+    if (t.count("BM_DriftBareWalk")) std::printf("ratio bare walk / parse both: %.2f\n", t["BM_DriftBareWalk"] / parse);
     if (t.count("BM_DriftApplyTasks")) std::printf("ratio apply-task walk / parse both: %.2f\n", t["BM_DriftApplyTasks"] / parse);
     if (t.count("BM_DriftCompliance")) std::printf("ratio compliance walk / parse both: %.2f\n", t["BM_DriftCompliance"] / parse);
   }

@@ -447,6 +447,9 @@ void computeComponents(const Value& source, const Value& other, Allocator& alloc
       const Value* otherGroup = groups.Find(g->name);
       const OtherLevel keys(otherGroup);
       for (auto k = g->value.MemberBegin(); k != g->value.MemberEnd(); ++k) {
+        const Value* otherItem = keys.Find(k->name);
+        // The forward pass has compared this item, and found its schema.
+        if (reverse && otherItem != nullptr) continue;
         ConfigStoreObjectId id(std::string(NameOf(c->name)), std::string(NameOf(g->name)),
                                std::string(NameOf(k->name)));
         std::string path;
@@ -458,10 +461,9 @@ void computeComponents(const Value& source, const Value& other, Allocator& alloc
                         id.key.c_str());
           ThrowException<SchemaNotFound>(SchemaObjectNotFound, path);
         }
-        const Value* otherItem = keys.Find(k->name);
         if (!reverse) {
           walk.CompareItem(k->value, otherItem != nullptr ? *otherItem : NullValue(), id, schema, path);
-        } else if (otherItem == nullptr) {
+        } else {
           // The host holds an item the desired document lacks: it drifts only
           // when it differs from the key's default user configuration.
           Document defaults;

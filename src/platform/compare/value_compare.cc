@@ -123,11 +123,12 @@ std::string_view SchemaType(const Value& schema) {
 }
 
 ValueComparer::SchemaInfo& ValueComparer::Info(const Value& schema) {
-  if (&schema == lastSchema_) return *lastInfo_;
+  const std::size_t slot = (reinterpret_cast<std::uintptr_t>(&schema) >> 4) % kRecent;
+  if (recentSchema_[slot] == &schema) return *recentInfo_[slot];
   auto [it, fresh] = schemas_.try_emplace(&schema);
   SchemaInfo& info = it->second;
-  lastSchema_ = &schema;
-  lastInfo_ = &info;
+  recentSchema_[slot] = &schema;
+  recentInfo_[slot] = &info;
   if (!fresh || !schema.IsObject()) return info;
   auto props = schema.FindMember("properties");
   if (props != schema.MemberEnd() && props->value.IsObject()) {

@@ -102,9 +102,11 @@ class ValueComparer {
   SchemaInfo& Info(const rapidjson::Value& schema);
 
   std::unordered_map<const rapidjson::Value*, SchemaInfo> schemas_;
-  // Consecutive lookups mostly ask for the same node.
-  const rapidjson::Value* lastSchema_ = nullptr;
-  SchemaInfo* lastInfo_ = nullptr;
+  // A direct-mapped cache in front of the map: the nodes of the key being
+  // compared are asked for again and again.
+  static constexpr std::size_t kRecent = 256;
+  const rapidjson::Value* recentSchema_[kRecent] = {};
+  SchemaInfo* recentInfo_[kRecent] = {};
 };
 
 // Equality of two scalars: numbers by value, anything else by JSON type and
