@@ -153,7 +153,6 @@ void ProcessAutoConfig(Value& value, const Value& schema, const std::string& aut
         ConfigStoreDocument::PatchRequiredProperty(value, field, autoConf, allocator);
         break;
       case JsonValidator::VALIDATION_ERR_UNION_TAG:
-        CSLogger::Log(CSLogger::kInfo, "patching validation error: '%s' %s", field.c_str(), text);
         ConfigStoreDocument::PatchUnionTagProperty(value, field, autoConf, allocator);
         break;
       default:

@@ -125,22 +125,28 @@ TEST_F(HostDocumentsTest, MapListSkipsSolutionInstancesAndEmptyValues) {
 
 TEST_F(HostDocumentsTest, AutoConfigurationFillsMissingRequiredProperties) {
   auto ntp = Schema("services", "time", "ntp");
+  auto syslog = Schema("services", "syslog", "config");
   struct Case {
     const char* what;
+    std::shared_ptr<HoxSchemaStore::SchemaObject> schema;
     const char* value;
     const char* autoConf;
     const char* expected;
   };
   const std::vector<Case> cases = {
-      {"required property patched", R"({"servers":["a"]})", R"({"enabled":true})",
+      {"required property patched", ntp, R"({"servers":["a"]})", R"({"enabled":true})",
        R"({"servers":["a"],"enabled":true})"},
-      {"nothing to patch", R"({"enabled":false})", R"({"enabled":true})", R"({"enabled":false})"},
-      {"no auto configuration", R"({"servers":[]})", "", R"({"servers":[]})"},
+      {"nothing to patch", ntp, R"({"enabled":false})", R"({"enabled":true})", R"({"enabled":false})"},
+      {"no auto configuration", ntp, R"({"servers":[]})", "", R"({"servers":[]})"},
+      {"missing union tag patched", syslog, R"({"remoteHost":"x"})", R"({"protocol":"tcp"})",
+       R"({"remoteHost":"x","protocol":"tcp"})"},
+      {"finding without auto configuration value", syslog, R"({"port":1})", R"({"protocol":"tcp"})",
+       R"({"port":1,"protocol":"tcp"})"},
   };
   for (const Case& c : cases) {
     Document value;
     HoxConfigManager::ParseDocument(c.value, value);
-    HoxConfigManager::ProcessAutoConfig(value, ntp->GetInstanceSchema(), c.autoConf, value.GetAllocator());
+    HoxConfigManager::ProcessAutoConfig(value, c.schema->GetInstanceSchema(), c.autoConf, value.GetAllocator());
     EXPECT_EQ(Json(value), c.expected) << c.what;
   }
   Document value;
