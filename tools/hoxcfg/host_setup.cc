@@ -140,8 +140,12 @@ ProductFiles LocateProductFiles() {
     files.pyRunner = sourceDir + "/runners/py_plugin_runner";
     files.pluginLibDir = buildDir + "/sample-plugins";
   } else {
-    files.dataDir = HOXCM_INSTALLED_DATA_DIR;
-    const std::string libexec = HOXCM_INSTALLED_LIBEXEC_DIR;
+    // An installation may have been moved (cmake --install --prefix): look
+    // beside the program first, then where it was configured to go.
+    const fs::path prefix = fs::path(exe).parent_path().parent_path();
+    const bool relocated = !ec && IsDir((prefix / "share/hoxcm").string());
+    files.dataDir = relocated ? (prefix / "share/hoxcm").string() : HOXCM_INSTALLED_DATA_DIR;
+    const std::string libexec = relocated ? (prefix / "libexec/hoxcm").string() : HOXCM_INSTALLED_LIBEXEC_DIR;
     files.cppRunner = libexec + "/cpp_plugin_runner";
     files.pyRunner = libexec + "/py_plugin_runner";
   }
@@ -149,6 +153,10 @@ ProductFiles LocateProductFiles() {
 }
 
 std::vector<std::string> InitHostRoot(const ProductFiles& files, bool sample) {
+  const std::string sampleDir = files.dataDir + "/sample-host";
+  if (sample && !IsDir(sampleDir)) {
+    throw CommandError{kExitError, "the sample host is not shipped (looked in " + sampleDir + ")"};
+  }
   std::vector<std::string> report;
   report.push_back("host root " + HoxPlatform::HostRoot() + " (product files from " +
                    (files.fromBuildTree ? "the build tree" : "the installation") + ")");
@@ -179,8 +187,6 @@ std::vector<std::string> InitHostRoot(const ProductFiles& files, bool sample) {
   report.push_back("configuration store " + db->GetPath());
 
   if (sample) {
-    const std::string sampleDir = files.dataDir + "/sample-host";
-    if (!IsDir(sampleDir)) throw CommandError{kExitError, "the sample host is not shipped (looked in " + sampleDir + ")"};
     for (std::string& line : InstallSampleHost(sampleDir)) report.push_back(std::move(line));
   }
   return report;
