@@ -12,6 +12,7 @@
 #include <hoxcm/host.h>
 #include <hoxcm/operations.h>
 
+#include "drift/host_matcher.h"
 #include "platform/compare/value_compare.h"
 
 namespace HoxConfigManager {
@@ -29,7 +30,8 @@ using rapidjson::SizeType;
 
 // A singleton whose configuration was deleted holds this marker on the host.
 constexpr std::string_view kDeletedDefault = "DELETE_DEFAULT";
-constexpr SizeType kNone = static_cast<SizeType>(-1);
+using detail::HostMatcher;
+using detail::kNone;
 
 const Value& NullValue() {
   static const Value null;
@@ -60,99 +62,6 @@ class PathSegment {
  private:
   std::string& path_;
   const std::string::size_type size_;
-};
-
-// Host positions grouped by a key, each group in ascending host order; the
-// first unmatched position of a key is found without scanning the others.
-template <typename Key>
-class PositionIndex {
- public:
-  explicit PositionIndex(SizeType size) : next_(size, kNone) { heads_.reserve(size); }
-  void Insert(const Key& key, SizeType position) {
-    auto [it, fresh] = heads_.try_emplace(key, Chain{position, position});
-    if (!fresh) {
-      next_[it->second.tail] = position;
-      it->second.tail = position;
-    }
-  }
-  // Calls `accept(position)` on the unmatched positions of `key` in host
-  // order until it returns true; that position is then matched.
-  template <typename Accept>
-  SizeType TakeFirst(const Key& key, std::vector<bool>& matched, Accept&& accept) {
-    auto it = heads_.find(key);
-    if (it == heads_.end()) return kNone;
-    SizeType& head = it->second.head;
-    while (head != kNone && matched[head]) head = next_[head];  // skip what is taken
-    for (SizeType p = head; p != kNone; p = next_[p]) {
-      if (!matched[p] && accept(p)) {
-        matched[p] = true;
-        return p;
-      }
-    }
-    return kNone;
-  }
-
- private:
-  struct Chain {
-    SizeType head, tail;
-  };
-  std::unordered_map<Key, Chain> heads_;
-  std::vector<SizeType> next_;
-};
-
-// Matches desired instances (or array elements), in desired order, to the
-// first unmatched host position that matches each, in host order. Documents
-// mostly list the same things in the same order, so the host position of the
-// same index is tried first, together with the few earlier positions left
-// unmatched ("holes"); the index by key is built only when that fails, and
-// used alone once there are many holes.
-template <typename Key, typename HostKey>
-class HostMatcher {
- public:
-  HostMatcher(SizeType size, HostKey hostKey) : matched_(size, false), hostKey_(std::move(hostKey)) {}
-
-  // The host position matching desired position `i`, or kNone. `matches(j)`
-  // tells whether host position j matches; `desiredKey()` gives the key
-  // that matching host positions share.
-  template <typename Matches, typename DesiredKey>
-  SizeType Take(SizeType i, Matches&& matches, DesiredKey&& desiredKey) {
-    const SizeType size = static_cast<SizeType>(matched_.size());
-    SizeType found = kNone;
-    if (!indexOnly_) {
-      for (SizeType k : holes_) {
-        if (!matched_[k] && matches(k)) {
-          found = k;
-          break;
-        }
-      }
-      if (found == kNone && i < size && !matched_[i] && matches(i)) found = i;
-      if (found != kNone) matched_[found] = true;
-    }
-    if (found == kNone) found = Index().TakeFirst(desiredKey(), matched_, matches);
-    if (!indexOnly_ && i < size && !matched_[i]) {
-      holes_.push_back(i);
-      indexOnly_ = holes_.size() > kMaxHoles;
-    }
-    return found;
-  }
-  const std::vector<bool>& matched() const { return matched_; }
-
- private:
-  static constexpr std::size_t kMaxHoles = 8;
-
-  PositionIndex<Key>& Index() {
-    if (!index_) {
-      index_.emplace(static_cast<SizeType>(matched_.size()));
-      for (SizeType j = 0; j < matched_.size(); ++j) index_->Insert(hostKey_(j), j);
-    }
-    return *index_;
-  }
-
-  std::vector<bool> matched_;
-  HostKey hostKey_;
-  std::vector<SizeType> holes_;
-  bool indexOnly_ = false;
-  std::optional<PositionIndex<Key>> index_;
 };
 
 class DriftWalk {
