@@ -61,7 +61,9 @@ class SchemaLookup {
       schema_ = store_->Find(component, group, key);
       // A stored item without a schema cannot be cleaned, identified or
       // validated: refuse the extraction rather than guess.
-      if (!schema_) ThrowException<SchemaNotFound>(SchemaObjectNotFound, SchemaObjectId(component, group, key).toString());
+      if (!schema_) {
+        ThrowException<SchemaNotFound>(SchemaObjectNotFound, SchemaObjectId(component, group, key).toString());
+      }
       component_ = component;
       group_ = group;
       key_ = key;
@@ -240,8 +242,10 @@ void ProcessConfigMapList(Document& result, const HoxConfigStore::ConfigMapList&
       ConfigStoreDocument::CleanupObject(value, schema.GetInstanceSchema(), cleanup, allocator);
     }
     if (value.ObjectEmpty()) {
-      if (logItems) CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was filtered out.", component.c_str(),
-                    group.c_str(), key.c_str(), identifier.c_str());
+      if (logItems) {
+        CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was filtered out.", component.c_str(),
+                      group.c_str(), key.c_str(), identifier.c_str());
+      }
       continue;
     }
     ConfigStoreDocument::AddObject(result, component, group, key, identifier, value, allocator);

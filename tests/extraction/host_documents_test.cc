@@ -157,9 +157,9 @@ TEST_F(HostDocumentsTest, AutoConfigurationFillsMissingRequiredProperties) {
   // Through the map list: the stored row lacks "enabled".
   Document result;
   result.SetObject();
-  HoxConfigManager::ProcessConfigMapList(result,
-                                         {Row("services", "time", "ntp", "", R"({"servers":[]})", R"({"enabled":true})")},
-                                         HoxSchemaStore::SchemaStore::GetStore(), HoxConfigManager::DOCUMENT_CURRENT);
+  const ConfigMapList rows = {Row("services", "time", "ntp", "", R"({"servers":[]})", R"({"enabled":true})")};
+  HoxConfigManager::ProcessConfigMapList(result, rows, HoxSchemaStore::SchemaStore::GetStore(),
+                                         HoxConfigManager::DOCUMENT_CURRENT);
   EXPECT_EQ(Json(result["services"]["time"]["ntp"]), R"({"servers":[],"enabled":true})");
 }
 
