@@ -65,6 +65,23 @@ echo "\$ hoxcfg show current"
 grep -n '\*\*\*\*\*\*' <(python3 -m json.tool "$root/current.json")
 step "Maintenance mode" maintenance status
 
+step "Is the host compliant with its own export? (exit 0: compliant)" compliance "$root/exported-host.json"
+
+# A desired document that differs: other DNS servers, one more NFS mount.
+python3 - "$root/exported-host.json" "$root/desired.json" <<'PY'
+import json, sys
+doc = json.load(open(sys.argv[1]))
+profile = doc["profile"]
+profile["network"]["dns"]["config"]["servers"] = ["10.20.0.53"]
+profile["storage"]["nfs"]["mounts"].append(
+    {"name": "backups", "server": "nas02.lab.example.com", "export": "/export/backups", "readOnly": False})
+json.dump(doc, open(sys.argv[2], "w"), indent=2)
+PY
+rc=0
+step "The same question for a desired document with other DNS servers and one more mount (exit 1)" \
+  compliance "$root/desired.json" || rc=$?
+echo "(exit code $rc)"
+
 echo
-echo "The furthest-along real operation is the export; later steps of the workflow"
-echo "(compliance, apply) will be added here as they land."
+echo "The furthest-along real operation is the compliance check; applying a desired"
+echo "document will be added here when it lands."
