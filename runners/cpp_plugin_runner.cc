@@ -113,7 +113,7 @@ int RunRequest(const std::string& root) {
   std::unique_ptr<char, void (*)(char*)> result(raw, table->free_result);
 
   const std::string resultPath = HoxConfigManager::PluginResultPath();
-  HoxPlatform::WriteFilePrivately(resultPath, result.get());
+  HoxPlatform::WriteFilePrivately(resultPath, result.get(), /*durable=*/false);
   CheckResult(operation, resultPath);
 
   if (operation == "APPLY" && HoxConfigManager::ErrorInfo::Load(resultPath).id.empty()) {

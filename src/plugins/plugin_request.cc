@@ -129,7 +129,9 @@ void PluginRequest::Dump(const std::string& path, const std::string& taskId, con
   Allocator& a = document_.GetAllocator();
   PopulateTaskId(taskId, a);
   PopulateClusterContext(clusterContext, a);
-  HoxPlatform::WriteFilePrivately(path, JsonToString(document_));
+  // The request lives for one run: after a crash the run is gone too, so
+  // it needs atomic replacement but no flush to disk.
+  HoxPlatform::WriteFilePrivately(path, JsonToString(document_), /*durable=*/false);
 }
 
 void PluginRequest::Load(const std::string& path) {

@@ -127,7 +127,7 @@ HostRunLock::~HostRunLock() {
   ::close(fd_);
 }
 
-void WriteFilePrivately(const std::string& path, const std::string& content) {
+void WriteFilePrivately(const std::string& path, const std::string& content, bool durable) {
   const std::filesystem::path target(path);
   std::error_code ec;
   std::filesystem::create_directories(target.parent_path(), ec);
@@ -151,7 +151,7 @@ void WriteFilePrivately(const std::string& path, const std::string& content) {
     data += n;
     left -= static_cast<std::size_t>(n);
   }
-  if (::fsync(fd.get()) != 0) fail(errno, "cannot flush");
+  if (durable && ::fsync(fd.get()) != 0) fail(errno, "cannot flush");
   if (fd.Close() != 0) fail(errno, "cannot close");
   if (::rename(temp.c_str(), path.c_str()) != 0) fail(errno, "cannot rename");
 }

@@ -49,10 +49,13 @@ class HostRunLock {
 
 // Replaces `path` by `content` so that a reader sees either the old or the
 // whole new file, and nobody but the owner can read it: the text goes to a
-// mode-0600 temporary file in the same directory, is flushed to disk and
-// renamed over `path`. Creates missing parent directories. Throws
-// std::system_error on failure (the temporary file is removed).
-void WriteFilePrivately(const std::string& path, const std::string& content);
+// mode-0600 temporary file in the same directory and is renamed over
+// `path`. With `durable` the file is flushed to disk before the rename, so
+// that it also survives a crash; files that only live for one plugin run
+// do without (a flush costs milliseconds, the rename alone already keeps
+// readers from seeing half a file). Creates missing parent directories.
+// Throws std::system_error on failure (the temporary file is removed).
+void WriteFilePrivately(const std::string& path, const std::string& content, bool durable = true);
 
 // The whole content of a file; throws std::runtime_error naming the path
 // when it cannot be read.
