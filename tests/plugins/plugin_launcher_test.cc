@@ -125,6 +125,9 @@ TEST_F(PluginRunTest, RunnerFailuresBecomeUnexpectedErrors) {
     EXPECT_EQ(error.args, std::vector<std::string>{"t"}) << c.body;
     EXPECT_NE(error.message.find(c.message), std::string::npos) << c.body << ": " << error.message;
   }
+  std::filesystem::remove(root.Path("/usr/lib/tarvik/configmanager/bin/py_plugin_runner"));
+  EXPECT_EQ(Apply().message, "Failed to fork plugin runner. No such file or directory");
+
   // Impact and validation results are checked just as strictly.
   Runner(R"(echo '{}' > "$out")");
   EXPECT_EQ(plugin_->Impact(inputs_, "", PluginMonitor::Dummy()).error.id,
