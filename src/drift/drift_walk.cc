@@ -203,8 +203,8 @@ class DriftWalk {
     bool differed = false;
     for (SizeType i = 0; i < d.Size(); ++i) {
       const Value& items = cmp_.Items(schema, d[i]);
-      const SizeType j = matcher.Take(
-          i, [&](SizeType p) { return cmp_.Equal(d[i], h[p], items); }, [&] { return cmp_.Hash(d[i], items); });
+      const SizeType j = matcher.Take([&](SizeType p) { return cmp_.Equal(d[i], h[p], items); },
+                                      [&] { return cmp_.Hash(d[i], items); });
       if (j == kNone) {
         const PathSegment segment(path_, i);
         handler_.PropertyDrift(d[i], NullValue(), items, path_, ADD);
@@ -253,8 +253,8 @@ class DriftWalk {
       HostMatcher<std::uint64_t, std::function<std::uint64_t(SizeType)>> matcher(
           h.Size(), [&](SizeType j) { return cmp_.Hash(h[j], node); });
       for (SizeType i = 0; i < d.Size(); ++i) {
-        const SizeType j = matcher.Take(
-            i, [&](SizeType p) { return cmp_.Equal(d[i], h[p], node); }, [&] { return cmp_.Hash(d[i], node); });
+        const SizeType j = matcher.Take([&](SizeType p) { return cmp_.Equal(d[i], h[p], node); },
+                                        [&] { return cmp_.Hash(d[i], node); });
         if (j != kNone) continue;
         id.instanceId = GeneratedIdOf(d[i]);
         const PathSegment segment(path_, i);
@@ -267,8 +267,8 @@ class DriftWalk {
       for (SizeType i = 0; i < d.Size(); ++i) {
         const Value& name = *desiredIds[i];
         const std::string_view key = NameOf(name);
-        const SizeType j = matcher.Take(
-            i, [&](SizeType p) { return NameOf(*hostIds[p]) == key; }, [&] { return key; });
+        const SizeType j =
+            matcher.Take([&](SizeType p) { return NameOf(*hostIds[p]) == key; }, [&] { return key; });
         id.instanceId.assign(name.GetString(), name.GetStringLength());
         const PathSegment segment(path_, i);
         if (j == kNone) {

@@ -85,35 +85,37 @@ class PositionIndex {
 
 // Matches desired instances (or array elements), in desired order, to the
 // first unmatched host position that matches each, in host order. Documents
-// mostly list the same things in the same order, so the host position of the
-// same index is tried first, together with the few earlier positions left
-// unmatched ("holes"); the index by key is built only when that fails, and
-// used alone once there are many holes.
+// mostly list the same things in the same order, so the host position after
+// the previous match (the cursor) is tried first, together with the few
+// positions before it left unmatched ("holes"); the index by key is built
+// only when that fails, and used alone once there are many holes.
 template <typename Key, typename HostKey>
 class HostMatcher {
  public:
   HostMatcher(SizeType size, HostKey hostKey) : matched_(size, false), hostKey_(std::move(hostKey)) {}
 
-  // The host position matching desired position `i`, or kNone. `matches(j)`
-  // tells whether host position j matches; `desiredKey()` gives the key
-  // that matching host positions share.
+  // The host position matching the next desired entry, or kNone.
+  // `matches(j)` tells whether host position j matches it; `desiredKey()`
+  // gives the key that matching host positions share.
   template <typename Matches, typename DesiredKey>
-  SizeType Take(SizeType i, Matches&& matches, DesiredKey&& desiredKey) {
-    const SizeType size = static_cast<SizeType>(matched_.size());
-    SizeType found = kNone;
-    if (!indexOnly_) {
-      for (SizeType k : holes_) {
-        if (!matched_[k] && matches(k)) {
-          found = k;
-          break;
-        }
-      }
-      if (found == kNone && i < size && !matched_[i] && matches(i)) found = i;
-      if (found != kNone) matched_[found] = true;
+  SizeType Take(Matches&& matches, DesiredKey&& desiredKey) {
+    if (indexOnly_) return Index().TakeFirst(desiredKey(), matched_, matches);
+    // Every unmatched position before the cursor is a hole, in ascending
+    // order, so holes then cursor then the index visit host order.
+    for (SizeType k : holes_) {
+      if (!matched_[k] && matches(k)) return matched_[k] = true, k;
     }
-    if (found == kNone) found = Index().TakeFirst(desiredKey(), matched_, matches);
-    if (!indexOnly_ && i < size && !matched_[i]) {
-      holes_.push_back(i);
+    const SizeType size = static_cast<SizeType>(matched_.size());
+    if (cursor_ < size && !matched_[cursor_] && matches(cursor_)) {
+      matched_[cursor_] = true;
+      return cursor_++;
+    }
+    const SizeType found = Index().TakeFirst(desiredKey(), matched_, matches);
+    if (found != kNone && found >= cursor_) {
+      for (SizeType k = cursor_; k < found; ++k) {
+        if (!matched_[k]) holes_.push_back(k);
+      }
+      cursor_ = found + 1;
       indexOnly_ = holes_.size() > kMaxHoles;
     }
     return found;
@@ -134,6 +136,7 @@ class HostMatcher {
   std::vector<bool> matched_;
   HostKey hostKey_;
   std::vector<SizeType> holes_;
+  SizeType cursor_ = 0;
   bool indexOnly_ = false;
   std::optional<PositionIndex<Key>> index_;
 };

@@ -122,18 +122,20 @@ std::string_view SchemaType(const Value& schema) {
   return {};
 }
 
-ValueComparer::SchemaInfo& ValueComparer::Info(const Value& schema) {
-  const std::size_t slot = (reinterpret_cast<std::uintptr_t>(&schema) >> 4) % kRecent;
-  if (recentSchema_[slot] == &schema) return *recentInfo_[slot];
-  auto [it, fresh] = schemas_.try_emplace(&schema);
-  SchemaInfo& info = it->second;
-  recentSchema_[slot] = &schema;
-  recentInfo_[slot] = &info;
-  if (!fresh || !schema.IsObject()) return info;
+const ValueComparer::SchemaInfo& ValueComparer::Info(const Value& schema) {
+  SchemaInfo& info = info_[(reinterpret_cast<std::uintptr_t>(&schema) >> 4) % kInfoSlots];
+  if (info.schema == &schema) return info;
+  info = SchemaInfo{};
+  info.schema = &schema;
+  if (!schema.IsObject()) return info;
   auto props = schema.FindMember("properties");
   if (props != schema.MemberEnd() && props->value.IsObject()) {
     info.properties = &props->value;
-    if (props->value.MemberCount() > kWideObject) info.wide = std::make_unique<MemberIndex>(props->value);
+    if (props->value.MemberCount() > kWideObject) {
+      auto& index = wideIndexes_[&props->value];
+      if (!index) index = std::make_unique<MemberIndex>(props->value);
+      info.wide = index.get();
+    }
   }
   auto extra = schema.FindMember("additionalProperties");
   if (extra != schema.MemberEnd() && extra->value.IsObject()) info.additional = &extra->value;
@@ -148,10 +150,10 @@ const Value& ValueComparer::Child(const Value& schema, std::string_view name, co
 }
 
 ValueComparer::Children::Children(ValueComparer& comparer, const Value& schema) {
-  SchemaInfo& info = comparer.Info(schema);
+  const SchemaInfo& info = comparer.Info(schema);
   extra_ = info.additional;
-  if (info.wide) {
-    wide_ = info.wide.get();
+  if (info.wide != nullptr) {
+    wide_ = info.wide;
   } else if (info.properties != nullptr) {
     narrow_.emplace(*info.properties);
   }

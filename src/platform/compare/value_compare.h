@@ -92,21 +92,23 @@ class ValueComparer {
   bool Same(const rapidjson::Value& d, const rapidjson::Value& h, const rapidjson::Value& schema);
   bool EqualObjects(const rapidjson::Value& d, const rapidjson::Value& h, const rapidjson::Value& schema);
   bool EqualObjectArrays(const rapidjson::Value& d, const rapidjson::Value& h, const rapidjson::Value& schema);
-  // What the comparison reads of one schema node, looked up once.
+  // What the comparison reads of one schema node.
   struct SchemaInfo {
+    const rapidjson::Value* schema = nullptr;
     const rapidjson::Value* properties = nullptr;
     const rapidjson::Value* additional = nullptr;
     const rapidjson::Value* defaultValue = nullptr;
-    std::unique_ptr<MemberIndex> wide;  // of "properties", when wide
+    MemberIndex* wide = nullptr;  // of "properties", when wide
   };
-  SchemaInfo& Info(const rapidjson::Value& schema);
+  // Valid until the next call.
+  const SchemaInfo& Info(const rapidjson::Value& schema);
 
-  std::unordered_map<const rapidjson::Value*, SchemaInfo> schemas_;
-  // A direct-mapped cache in front of the map: the nodes of the key being
-  // compared are asked for again and again.
-  static constexpr std::size_t kRecent = 256;
-  const rapidjson::Value* recentSchema_[kRecent] = {};
-  SchemaInfo* recentInfo_[kRecent] = {};
+  // A direct-mapped cache: the nodes of the key being compared are asked for
+  // again and again, and a miss costs only three member lookups.
+  static constexpr std::size_t kInfoSlots = 256;
+  SchemaInfo info_[kInfoSlots];
+  // Name indexes of wide "properties", kept for the comparer's lifetime.
+  std::unordered_map<const rapidjson::Value*, std::unique_ptr<MemberIndex>> wideIndexes_;
 };
 
 // Equality of two scalars: numbers by value, anything else by JSON type and
