@@ -216,7 +216,7 @@ class RatioReporter final : public benchmark::ConsoleReporter {
  public:
   void ReportRuns(const std::vector<Run>& runs) override {
     for (const Run& run : runs) {
-      if (run.run_type == Run::RT_Iteration || run.aggregate_name == "mean") {
+      if (run.run_type == Run::RT_Iteration || run.aggregate_name == "median") {
         times_[run.run_name.function_name] = run.GetAdjustedCPUTime();
       }
     }
