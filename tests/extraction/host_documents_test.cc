@@ -185,3 +185,25 @@ TEST_F(HostDocumentsTest, MergedBootDocumentIsWrittenOnlyWhenEveryKeyHasASchema)
 
 }  // namespace
 }  // namespace hoxcm_test
+
+namespace hoxcm_test {
+namespace {
+
+TEST(StoreValueParsingTest, NonAsciiTextIsStillValidatedAtEveryOffset) {
+  // Store values are mostly ASCII and skip the per-character check; a single
+  // byte of invalid UTF-8 anywhere (inside a machine word or in the tail)
+  // must still be refused, and valid multi-byte text must still parse.
+  const std::string prefix = R"({"s":")";
+  for (std::size_t padding = 0; padding < 17; ++padding) {
+    const std::string ascii(padding, 'a');
+    Document doc;
+    EXPECT_THROW(HoxConfigManager::ParseDocument(prefix + ascii + "\xff\"}", doc),
+                 HoxConfigManager::InvalidArgumentException)
+        << padding;
+    ASSERT_NO_THROW(HoxConfigManager::ParseDocument(prefix + ascii + "Z\xc3\xbcrich\"}", doc)) << padding;
+    EXPECT_EQ(std::string(doc["s"].GetString()), ascii + "Z\xc3\xbcrich");
+  }
+}
+
+}  // namespace
+}  // namespace hoxcm_test
