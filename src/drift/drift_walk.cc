@@ -145,10 +145,13 @@ class DriftWalk {
     bool differed = false;
     SizeType found = 0;
     for (auto it = d.MemberBegin(); it != d.MemberEnd(); ++it) {
-      if (IsGeneratedId(it->name)) continue;
       const std::string_view name = NameOf(it->name);
       const Value& dv = it->value;
       const Value* hv = hostIndex.Find(name);
+      if (IsGeneratedId(it->name)) {
+        found += hv != nullptr;
+        continue;
+      }
       if (hv != nullptr) {
         ++found;
         // The common case, an unchanged scalar, needs no schema.

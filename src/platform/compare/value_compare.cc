@@ -63,11 +63,6 @@ std::uint64_t ScalarHash(const Value& v) {
 
 }  // namespace
 
-bool SameScalar(const Value& a, const Value& b) {
-  if (a.IsNumber() && b.IsNumber()) return a == b;
-  return a.GetType() == b.GetType() && a == b;
-}
-
 MemberIndex::MemberIndex(const Value& object) : object_(object) {
   if (object.MemberCount() <= kWideObject) return;
   index_.reserve(object.MemberCount());
@@ -86,7 +81,7 @@ const Value* MemberIndex::Find(std::string_view name) {
     SizeType i = next_ + k;
     if (i >= n) i -= n;
     const auto& m = members[i];
-    if (NameOf(m.name) != name) continue;
+    if (!SameBytes(NameOf(m.name), name)) continue;
     next_ = i + 1;
     return &m.value;
   }
@@ -239,9 +234,14 @@ bool ValueComparer::EqualObjects(const Value& d, const Value& h, const Value& sc
   Children children(*this, schema);
   SizeType found = 0;
   for (auto it = d.MemberBegin(); it != d.MemberEnd(); ++it) {
-    if (IsGeneratedId(it->name)) continue;
     const std::string_view name = NameOf(it->name);
     const Value* hv = hostIndex.Find(name);
+    // Counted even when not compared, so that equal members on both sides
+    // spare the search for members only the host holds.
+    if (IsGeneratedId(it->name)) {
+      found += hv != nullptr;
+      continue;
+    }
     if (hv != nullptr) {
       ++found;
       // Equal scalars need no schema.

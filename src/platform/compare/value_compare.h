@@ -16,6 +16,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <memory>
 #include <optional>
 #include <string_view>
@@ -31,6 +32,17 @@ constexpr rapidjson::SizeType kWideObject = 16;
 
 inline std::string_view NameOf(const rapidjson::Value& name) {
   return std::string_view(name.GetString(), name.GetStringLength());
+}
+// Byte equality of two short strings (member names, most values) without a
+// library call for the common lengths.
+inline bool SameBytes(std::string_view a, std::string_view b) {
+  const std::size_t n = a.size();
+  if (n != b.size()) return false;
+  if (n > 24) return std::memcmp(a.data(), b.data(), n) == 0;
+  for (std::size_t i = 0; i < n; ++i) {
+    if (a[i] != b[i]) return false;
+  }
+  return true;
 }
 inline bool IsGeneratedId(const rapidjson::Value& name) { return NameOf(name) == kGeneratedIdMember; }
 
@@ -113,7 +125,14 @@ class ValueComparer {
 
 // Equality of two scalars: numbers by value, anything else by JSON type and
 // value.
-bool SameScalar(const rapidjson::Value& a, const rapidjson::Value& b);
+inline bool SameScalar(const rapidjson::Value& a, const rapidjson::Value& b) {
+  if (a.IsString()) return b.IsString() && SameBytes(NameOf(a), NameOf(b));
+  if (a.IsNumber() && b.IsNumber()) {
+    if (a.IsInt() && b.IsInt()) return a.GetInt() == b.GetInt();
+    return a == b;
+  }
+  return a.GetType() == b.GetType() && a == b;
+}
 inline bool IsContainer(const rapidjson::Value& v) { return v.IsObject() || v.IsArray(); }
 
 // Order-insensitive equality of two arrays of scalars: each element of `b`
