@@ -123,7 +123,8 @@ void PluginLauncher::ForkPlugin(std::shared_ptr<PluginMonitor> monitor) {
   std::mutex mutex;
   std::condition_variable reaped;
   bool done = false;  // guarded by mutex
-  std::thread watcher([&mutex, &reaped, &done, pid, monitor] {
+  // Watches the abort flag until the runner has ended.
+  auto watch = [&mutex, &reaped, &done, pid, monitor] {
     CSLogger::Log(CSLogger::kInfo, "Starting plugin monitor thread");
     bool aborted = false;
     std::unique_lock<std::mutex> lock(mutex);
@@ -139,24 +140,38 @@ void PluginLauncher::ForkPlugin(std::shared_ptr<PluginMonitor> monitor) {
     lock.unlock();
     if (aborted) {
       CSLogger::Log(CSLogger::kInfo, "Terminating plugin process: %d", static_cast<int>(pid));
-      // The pid cannot be reused before the launching thread reaps it, so
-      // the signal reaches our runner or nothing.
+      // The launching thread reaps the runner only after this thread has
+      // ended, so the pid still names our runner (or its zombie).
       if (const int error = HoxPlatform::SendSignal(pid, SIGTERM)) {
         CSLogger::Log(CSLogger::kError, "Unable to terminate plugin process: %d -- %s", static_cast<int>(pid),
                       HoxPlatform::ErrorText(error).c_str());
       }
     }
     CSLogger::Log(CSLogger::kInfo, "Stopping plugin monitor thread");
-  });
+  };
+  std::thread watcher;
+  try {
+    watcher = std::thread(watch);
+  } catch (...) {
+    // Without a watcher the runner cannot be aborted; it is still reaped
+    // before the failure is reported, so no child is left behind.
+    int ignored = 0;
+    HoxPlatform::WaitForExit(pid, &ignored);
+    throw;
+  }
 
-  int status = 0;
-  const int waitError = HoxPlatform::WaitForExit(pid, &status);
+  // The runner is reaped only after the watcher has stopped: until then its
+  // pid stays taken, so a late SIGTERM cannot reach another process.
+  int waitError = HoxPlatform::WaitUntilEnded(pid);
   {
     std::lock_guard<std::mutex> lock(mutex);
     done = true;
   }
   reaped.notify_all();
   watcher.join();
+  int status = 0;
+  const int reapError = HoxPlatform::WaitForExit(pid, &status);
+  if (waitError == 0) waitError = reapError;
 
   if (waitError != 0) {
     Fail("waitpid failed on pid=%d, error=%s", static_cast<int>(pid), HoxPlatform::ErrorText(waitError).c_str());

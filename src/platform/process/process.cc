@@ -92,6 +92,14 @@ pid_t SpawnClean(const std::string& program, const std::vector<std::string>& arg
   return pid;
 }
 
+int WaitUntilEnded(pid_t pid) {
+  for (;;) {
+    siginfo_t info;
+    if (::waitid(P_PID, static_cast<id_t>(pid), &info, WEXITED | WNOWAIT) == 0) return 0;
+    if (errno != EINTR) return errno;
+  }
+}
+
 int WaitForExit(pid_t pid, int* status) {
   for (;;) {
     if (::waitpid(pid, status, 0) >= 0) return 0;

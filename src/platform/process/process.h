@@ -21,6 +21,11 @@ namespace HoxPlatform {
 // `error` to the errno value.
 pid_t SpawnClean(const std::string& program, const std::vector<std::string>& argv, int* error);
 
+// Waits until the child has ended without reaping it, so that its pid
+// cannot be reused while another thread may still signal it. Retried while
+// a signal interrupts it. Returns 0, or the errno value of the failure.
+int WaitUntilEnded(pid_t pid);
+
 // waitpid(pid, status, 0), retried while a signal interrupts it. Returns 0,
 // or the errno value of the failure.
 int WaitForExit(pid_t pid, int* status);
