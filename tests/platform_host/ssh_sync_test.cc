@@ -44,6 +44,26 @@ TEST(SshParseTest, AuthorizedKeysLinesGiveTypeKeyAndCommentAndMalformedLinesAreS
   EXPECT_EQ(skipped, (std::vector<int>{6, 7, 8}));
 }
 
+TEST(SshParseTest, TextInAnotherEncodingNeverReachesTheStoreAsItIs) {
+  // Given a Latin-1 comment, a key type with a stray byte and a truncated
+  // sequence, the comment keeps its readable part and the bad type is skipped.
+  std::vector<int> skipped;
+  const auto keys = ParseAuthorizedKeys(
+      "ssh-ed25519 AAAA Jos\xe9@host\n"
+      "ssh-rsa\xff AAAB x\n"
+      "ssh-rsa AAAC caf\xc3\xa9 \xc3\n",
+      skipped);
+  ASSERT_EQ(keys.size(), 2u);
+  EXPECT_EQ(keys[0].comment, "Jos\xef\xbf\xbd@host");
+  EXPECT_EQ(keys[1].comment, "caf\xc3\xa9 \xef\xbf\xbd");
+  EXPECT_EQ(skipped, (std::vector<int>{2}));
+  // An option value in another encoding is skipped, not guessed at.
+  skipped.clear();
+  const auto options = ParseSshOptions("Banner /etc/issue\xe9\nPort 22\n", false, skipped);
+  EXPECT_EQ(options, (std::vector<std::pair<std::string, std::string>>{{"Port", "22"}}));
+  EXPECT_EQ(skipped, (std::vector<int>{1}));
+}
+
 TEST(SshParseTest, OptionsApplyingToEveryHostAreReadFirstValueWinning) {
   const std::string server =
       "Port 22\n"
@@ -122,6 +142,11 @@ TEST(SshSyncTest, FilesReplaceTheirObjectsAndMissingFilesLeaveTheStoreAlone) {
             R"([{"type":"ssh-ed25519","key":"AAAAnew","comment":"new@host"},)"
             R"({"type":"ssh-ed25519","key":"AAAAC3NzaC1lZDI1NTE5AAAAIGJhY2t1cHNlcnZpY2VrZXlmb3J0aGVob3N0MDI=",)"
             R"("comment":"backup@vault"}])");
+  // A comment in another encoding does not fail the synchronisation.
+  root.WriteFile("/root/.ssh/authorized_keys", "ssh-ed25519 AAAAnew Jos\xe9@host\n");
+  keys.UpgradeConfigToConfigStore();
+  EXPECT_EQ(Current("authorized_keys"),
+            "[{\"type\":\"ssh-ed25519\",\"key\":\"AAAAnew\",\"comment\":\"Jos\xef\xbf\xbd@host\"}]");
   root.WriteFile("/root/.ssh/authorized_keys", "# no keys any more\n");
   keys.UpgradeConfigToConfigStore();
   EXPECT_EQ(Current("authorized_keys"), "null");

@@ -40,12 +40,14 @@ struct AuthorizedKey {
 };
 // The keys of an authorized_keys file in file order; lines that hold no key
 // are reported by number in `skipped` (comments and blank lines are not).
+// Bytes of a comment that are not UTF-8 become U+FFFD.
 std::vector<AuthorizedKey> ParseAuthorizedKeys(std::string_view text, std::vector<int>& skipped);
 
 // The options of an ssh_config (`client`) or sshd_config file: keyword to
 // value, the first value of a keyword winning. Only options that apply to
 // every host / connection are read: those before the first "Match" block
-// and, for the client, those of "Host *" blocks.
+// and, for the client, those of "Host *" blocks. A line whose value is not
+// UTF-8 is skipped.
 std::vector<std::pair<std::string, std::string>> ParseSshOptions(std::string_view text, bool client,
                                                                   std::vector<int>& skipped);
 

@@ -27,10 +27,54 @@ std::string_view TrimView(std::string_view s) {
 }
 
 bool IsKeyType(std::string_view token) {
+  for (char c : token) {
+    if (!std::isalnum(static_cast<unsigned char>(c)) && c != '-' && c != '@' && c != '.') return false;
+  }
   for (std::string_view prefix : {"ssh-", "ecdsa-sha2-", "sk-ssh-", "sk-ecdsa-sha2-"}) {
     if (token.size() > prefix.size() && token.substr(0, prefix.size()) == prefix) return true;
   }
   return false;
+}
+
+struct DiscardStream {
+  using Ch = char;
+  void Put(char) {}
+};
+
+// Length of the well-formed UTF-8 sequence at the start of `text` (not
+// empty); 0 when its first bytes are not one.
+std::size_t Utf8SequenceLength(std::string_view text) {
+  DiscardStream out;
+  rapidjson::MemoryStream in(text.data(), text.size());
+  return rapidjson::UTF8<>::Validate(in, out) ? in.Tell() : 0;
+}
+
+bool IsUtf8(std::string_view text) {
+  while (!text.empty()) {
+    const std::size_t n = Utf8SequenceLength(text);
+    if (n == 0) return false;
+    text.remove_prefix(n);
+  }
+  return true;
+}
+
+// Free text of a file written in another encoding (a Latin-1 key comment)
+// cannot go into the store as it is: each byte that does not belong to a
+// well-formed UTF-8 sequence becomes U+FFFD.
+std::string ToUtf8(std::string_view text) {
+  std::string out;
+  out.reserve(text.size());
+  while (!text.empty()) {
+    const std::size_t n = Utf8SequenceLength(text);
+    if (n == 0) {
+      out += "\xEF\xBF\xBD";
+      text.remove_prefix(1);
+    } else {
+      out.append(text.substr(0, n));
+      text.remove_prefix(n);
+    }
+  }
+  return out;
 }
 
 bool IsBase64(std::string_view token) {
@@ -113,7 +157,7 @@ std::vector<AuthorizedKey> ParseAuthorizedKeys(std::string_view text, std::vecto
       skipped.push_back(number);
       return;
     }
-    keys.push_back({std::string(type), std::string(key), std::string(TrimView(rest))});
+    keys.push_back({std::string(type), std::string(key), ToUtf8(TrimView(rest))});
   });
   return keys;
 }
@@ -130,7 +174,8 @@ std::vector<std::pair<std::string, std::string>> ParseSshOptions(std::string_vie
     const std::string_view keyword = line.substr(0, end);
     std::string_view value = TrimView(line.substr(end));
     if (!value.empty() && value.front() == '=') value = TrimView(value.substr(1));
-    if (!IsKeyword(keyword) || value.empty()) {
+    // A value in another encoding is not guessed at: the line is skipped.
+    if (!IsKeyword(keyword) || value.empty() || !IsUtf8(value)) {
       skipped.push_back(number);
       return;
     }
