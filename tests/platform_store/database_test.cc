@@ -5,6 +5,7 @@
 
 #include <chrono>
 #include <filesystem>
+#include <limits>
 #include <thread>
 
 #include "platform_store/store_fixture.h"
@@ -179,6 +180,26 @@ TEST_F(StoreTest, FailedWritersLeaveTheStoreAsItWas) {
   EXPECT_THROW(ImportConfiguration(ConfigKind::User, Json(R"({"system":{"identity":{"hostname":[]}}})")),
                ConfigStoreException);
   EXPECT_EQ(Rows(ConfigKind::User), before);
+
+  // Values built in code that no JSON text can hold (a string that is not
+  // UTF-8, a NaN) are refused instead of stored where they would break
+  // every later reader.
+  for (const bool nan : {false, true}) {
+    rapidjson::Document doc = Json(R"({"system":{"identity":{"hostname":{"hostname":"x"}}}})");
+    rapidjson::Value& host = doc["system"]["identity"]["hostname"]["hostname"];
+    if (nan) {
+      host.SetDouble(std::numeric_limits<double>::quiet_NaN());
+    } else {
+      host.SetString("caf\xe9", doc.GetAllocator());
+    }
+    EXPECT_THROW(ImportConfiguration(ConfigKind::User, doc), ConfigStoreException);
+    EXPECT_THROW(SetDesiredUserConfig(doc), ConfigStoreException);
+    EXPECT_THROW(ProcessDesiredObject(doc.GetAllocator(), GetDBStore(), "system", "identity", "hostname", nullptr,
+                                      doc["system"]["identity"]["hostname"]),
+                 ConfigStoreException);
+  }
+  EXPECT_EQ(Rows(ConfigKind::User), before);
+  EXPECT_TRUE(Rows(ConfigKind::Desired).empty());
 
   // SQLite itself fails in the middle of a batch (a trigger stands in for a
   // full disk): the statements already run are undone.

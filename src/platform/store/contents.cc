@@ -69,10 +69,16 @@ std::string IdentifyInstance(rapidjson::Value& instance, rapidjson::MemoryPoolAl
   return std::string(it->value.GetString(), it->value.GetStringLength());
 }
 
+// The stored text of a value. A value built in code may hold what no JSON
+// text can (a string that is not UTF-8, a NaN); stored, it would make every
+// later reader of its rows fail, so it is refused before the write.
 std::string Serialize(const rapidjson::Value& value) {
-  std::string text;
-  ConfigStoreDocument::SerializeValue(value, text);
-  return text;
+  rapidjson::StringBuffer buffer;
+  rapidjson::Writer<rapidjson::StringBuffer, rapidjson::UTF8<>, rapidjson::UTF8<>, rapidjson::CrtAllocator,
+                    rapidjson::kWriteValidateEncodingFlag>
+      writer(buffer);
+  if (!value.Accept(writer)) throw ConfigStoreException(2000, "Invalid JSON");
+  return std::string(buffer.GetString(), buffer.GetSize());
 }
 
 // One row per singleton and per instance of a host document ("profile"
