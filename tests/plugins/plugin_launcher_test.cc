@@ -196,8 +196,8 @@ TEST_F(PluginRunTest, TheRunnerGetsOnlyStandardDescriptorsAndNoEnvironment) {
   ::close(leaked);
   // The shell may keep its script open on a descriptor of its own; none
   // of ours may appear.
-  std::string fds = root.ReadFile("/fds");
-  EXPECT_EQ(fds.find(std::to_string(leaked) + "\n"), std::string::npos) << fds;
+  const std::string fds = "\n" + root.ReadFile("/fds");
+  EXPECT_EQ(fds.find("\n" + std::to_string(leaked) + "\n"), std::string::npos) << fds;
   EXPECT_EQ(root.ReadFile("/env").find("HOX_ROOT"), std::string::npos);
 }
 
