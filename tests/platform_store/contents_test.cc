@@ -217,6 +217,12 @@ TEST_F(StoreTest, HostStateHasDefaultsAndKeepsWhatIsSet) {
   EXPECT_EQ(failures[1].key, "boot_options");
   ClearBootTimeRestoreFailures();
   EXPECT_TRUE(GetBootTimeRestoreFailures().empty());
+
+  // A damaged boot mode row is an error, never some mode by accident.
+  for (const char* damaged : {"7", "4x", "", "normal"}) {
+    RawSql(StorePath(), std::string("UPDATE host_state SET value = '") + damaged + "' WHERE name = 'bootMode'");
+    EXPECT_THROW(GetBootMode(), ConfigStoreException) << damaged;
+  }
 }
 
 }  // namespace

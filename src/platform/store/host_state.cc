@@ -1,7 +1,5 @@
 // Host state kept in the store: boot mode, the boot-apply record, boot-time
 // restore failures and maintenance mode.
-#include <cstdlib>
-
 #include <hoxcm/config_store.h>
 
 #include "platform/store/database.h"
@@ -41,7 +39,13 @@ void WriteState(const char* name, const std::string& value) {
 
 BOOTMODE GetBootMode() {
   const std::string text = ReadState(kBootMode, "0");
-  return static_cast<BOOTMODE>(std::strtol(text.c_str(), nullptr, 10));
+  // A damaged row must not become a mode nobody handles (or "normal" by
+  // accident, which would allow host changes during a staged boot).
+  for (BOOTMODE mode : {BOOTMODE_NORMAL, BOOTMODE_BOOTSTRAP, BOOTMODE_DESIRED_STAGED}) {
+    if (text == std::to_string(static_cast<int>(mode))) return mode;
+  }
+  const std::string error = "ConfigStore error: the stored boot mode \"" + text + "\" is not a boot mode";
+  throw ConfigStoreException(2000, error.c_str());
 }
 
 void SetBootMode(BOOTMODE mode) { WriteState(kBootMode, std::to_string(static_cast<int>(mode))); }
