@@ -16,3 +16,9 @@ target_link_libraries(hoxcm_conformance_plugin PRIVATE hoxcm)
 if(TARGET cpp_plugin_runner AND TARGET hoxcm_sample_network)
   add_dependencies(plugins_test cpp_plugin_runner hoxcm_sample_network hoxcm_conformance_plugin)
 endif()
+
+# Runs the built hoxcfg as a process.
+hoxcm_add_test(hoxcfg_plugins_test plugins/hoxcfg_plugins_test.cc)
+if(TARGET hoxcfg)
+  add_dependencies(hoxcfg_plugins_test hoxcfg cpp_plugin_runner hoxcm_sample_network)
+endif()
