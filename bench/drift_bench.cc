@@ -114,13 +114,16 @@ class CollectingReporter : public benchmark::ConsoleReporter {
   void ReportRuns(const std::vector<Run>& runs) override {
     ConsoleReporter::ReportRuns(runs);
     for (const Run& run : runs) {
-      if (run.run_type != Run::RT_Iteration) continue;
+      // Single runs, or the median of repetitions.
+      if (run.run_type == Run::RT_Aggregate ? run.aggregate_name != "median" : run.repetitions > 1) continue;
       std::string name = run.benchmark_name();
       name = name.substr(0, name.find("/min_time"));
       times[name] = run.GetAdjustedRealTime();
+      cpu[name] = run.GetAdjustedCPUTime();
     }
   }
   std::map<std::string, double> times;
+  std::map<std::string, double> cpu;
 };
 
 }  // namespace
@@ -167,24 +170,27 @@ int main(int argc, char** argv) {
   benchmark::Shutdown();
   std::filesystem::remove_all(root);
 
-  auto& t = reporter.times;
-  if (t.count("BM_ParseBoth")) {
-    const double parse = t["BM_ParseBoth"];
-    if (t.count("BM_DriftBareWalk")) std::printf("ratio bare walk / parse both: %.2f\n", t["BM_DriftBareWalk"] / parse);
-    if (t.count("BM_DriftApplyTasks")) std::printf("ratio apply-task walk / parse both: %.2f\n", t["BM_DriftApplyTasks"] / parse);
-    if (t.count("BM_DriftCompliance")) std::printf("ratio compliance walk / parse both: %.2f\n", t["BM_DriftCompliance"] / parse);
+  // Ratios of wall times, then of CPU times (steadier on a shared machine).
+  for (auto* t : {&reporter.times, &reporter.cpu}) {
+    const char* kind = t == &reporter.times ? "wall" : "cpu";
+    if (t->count("BM_ParseBoth")) {
+      const double parse = t->at("BM_ParseBoth");
+      for (const char* name : {"BM_DriftBareWalk", "BM_DriftApplyTasks", "BM_DriftCompliance"}) {
+        if (t->count(name)) std::printf("%s ratio %s / BM_ParseBoth: %.2f\n", kind, name, t->at(name) / parse);
+      }
+    }
+    double lo = 0, hi = 0;
+    for (int n : {1000, 10000, 100000}) {
+      const std::string ordered = "BM_WideKey/" + std::to_string(n) + "/0";
+      const std::string shuffled = "BM_WideKey/" + std::to_string(n) + "/1";
+      if (!t->count(ordered) || !t->count(shuffled)) continue;
+      const double perInstance = t->at(shuffled) / n;
+      lo = lo == 0 ? perInstance : std::min(lo, perInstance);
+      hi = std::max(hi, perInstance);
+      std::printf("%s wide key %6d: %.3f us/instance shuffled, shuffled / ordered %.2f\n", kind, n,
+                  perInstance * 1e3, t->at(shuffled) / t->at(ordered));
+    }
+    if (lo > 0) std::printf("%s wide key: per-instance time spread (max / min) %.2f\n", kind, hi / lo);
   }
-  double lo = 0, hi = 0;
-  for (int n : {1000, 10000, 100000}) {
-    const std::string ordered = "BM_WideKey/" + std::to_string(n) + "/0";
-    const std::string shuffled = "BM_WideKey/" + std::to_string(n) + "/1";
-    if (!t.count(ordered) || !t.count(shuffled)) continue;
-    const double perInstance = t[shuffled] / n;
-    lo = lo == 0 ? perInstance : std::min(lo, perInstance);
-    hi = std::max(hi, perInstance);
-    std::printf("wide key %6d: %.3f us/instance shuffled, shuffled / ordered %.2f\n", n, perInstance * 1e3,
-                t[shuffled] / t[ordered]);
-  }
-  if (lo > 0) std::printf("wide key: per-instance time spread (max / min) %.2f\n", hi / lo);
   return 0;
 }

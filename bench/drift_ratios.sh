@@ -9,5 +9,6 @@ scale=${1:-200}
 cmake -S "$here" -B "$build" -DCMAKE_BUILD_TYPE=Release -DHOXCM_BUILD_TESTS=OFF -DHOXCM_BUILD_TOOLS=OFF \
   -DHOXCM_BUILD_SAMPLES=OFF -DHOXCM_BUILD_BENCHMARKS=ON >/dev/null
 cmake --build "$build" -j2 --target drift_bench drift_memory >/dev/null
-"$build/bench/drift_bench" --scale="$scale" --benchmark_filter="${BENCH_FILTER:-.}"
+"$build/bench/drift_bench" --scale="$scale" --benchmark_filter="${BENCH_FILTER:-.}" \
+  --benchmark_repetitions=3 --benchmark_report_aggregates_only=true
 "$build/bench/drift_memory" "$scale"

@@ -5,7 +5,6 @@
 #include <functional>
 #include <optional>
 #include <string_view>
-#include <unordered_map>
 #include <vector>
 
 #include <hoxcm/documents.h>
@@ -19,6 +18,8 @@ namespace HoxConfigManager {
 
 namespace {
 
+using detail::HostMatcher;
+using detail::kNone;
 using HoxConfigStore::ConfigStoreObjectId;
 using HoxConfigStore::detail::IsContainer;
 using HoxConfigStore::detail::IsGeneratedId;
@@ -30,8 +31,6 @@ using rapidjson::SizeType;
 
 // A singleton whose configuration was deleted holds this marker on the host.
 constexpr std::string_view kDeletedDefault = "DELETE_DEFAULT";
-using detail::HostMatcher;
-using detail::kNone;
 
 const Value& NullValue() {
   static const Value null;
