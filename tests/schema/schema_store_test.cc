@@ -148,6 +148,7 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
       {"bad/x/array", R"({"multiInstance": false, "schema": {"type": "array"}})", "\"type\": \"object\""},
       {"bad/x/mutable", "{\"multiInstance\": false, \"mutableDefault\": true, " + object + "}",
        "needs \"defaultUserConfig\""},
+      {"bad/x/huge", "{\"multiInstance\": false, " + object + std::string(4 << 20, ' ') + "}", "larger than 4 MiB"},
       {"bad/shallow", "{}", "not at <component>/<group>/<key>.json"},
       {"bad/x/y", "", "not at <component>/<group>/<key>.json"},
   };

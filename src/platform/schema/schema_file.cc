@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <fstream>
 #include <initializer_list>
-#include <iterator>
 #include <regex>
 #include <set>
 
@@ -26,21 +25,27 @@ struct SchemaFileError {
 
 [[noreturn]] void Fail(std::string reason) { throw SchemaFileError{std::move(reason)}; }
 
+// An oversized file (a log dropped into the tree by mistake) is refused
+// by its size, without being loaded.
 bool ReadFile(const std::string& path, std::string& content, std::string& error) {
-  std::ifstream in(path, std::ios::binary);
+  std::ifstream in(path, std::ios::binary | std::ios::ate);
   if (!in) {
     error = "cannot be opened";
     return false;
   }
-  content.assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-  if (in.bad()) {
-    error = "cannot be read";
-    return false;
-  }
-  if (content.size() > kMaxSchemaFileSize) {
+  const std::streamoff size = in.tellg();
+  if (size > static_cast<std::streamoff>(kMaxSchemaFileSize)) {
     error = "is larger than 4 MiB";
     return false;
   }
+  content.resize(size > 0 ? static_cast<std::size_t>(size) : 0);
+  in.seekg(0);
+  in.read(content.data(), static_cast<std::streamsize>(content.size()));
+  if (in.bad() || size < 0) {
+    error = "cannot be read";
+    return false;
+  }
+  content.resize(static_cast<std::size_t>(in.gcount()));
   return true;
 }
 
