@@ -127,7 +127,9 @@ bool Plugin::HasApplySupport() const {
 
 bool Plugin::HasApplyBootSupport() const {
   if (version == 0 || version == 1) return BoolMember(manifest, "boot");
-  if (version == 2 || version == 3) return BoolMember(Member(manifest, "apply"), "boot");
+  // A plugin that does not apply does not apply at boot either; without
+  // this, one validation-only plugin would fail every boot-time registry.
+  if (version == 2 || version == 3) return HasApplySupport() && BoolMember(Member(manifest, "apply"), "boot");
   return false;
 }
 

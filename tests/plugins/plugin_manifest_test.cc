@@ -130,6 +130,7 @@ TEST_F(PluginManifestTest, CapabilitiesPerVersion) {
                 .c_str());
   EXPECT_FALSE(v2.HasApplySupport());
   EXPECT_FALSE(v2.CheckType(APPLY));
+  EXPECT_FALSE(v2.CheckType(APPLY_BOOT));
   EXPECT_TRUE(v2.CheckType(IMPACT));
   EXPECT_TRUE(v2.CheckType(VALIDATE));
   ASSERT_EQ(v2.GetReferences().size(), 1u);
