@@ -130,7 +130,12 @@ void PluginLauncher::ForkPlugin(std::shared_ptr<PluginMonitor> monitor) {
     std::unique_lock<std::mutex> lock(mutex);
     while (!done) {
       lock.unlock();
-      aborted = monitor->IsAborted();
+      // An exception must not leave this thread: it would end the process.
+      try {
+        aborted = monitor->IsAborted();
+      } catch (const std::exception& e) {
+        CSLogger::Log(CSLogger::kError, "Plugin monitor failed: %s", e.what());
+      }
       lock.lock();
       if (aborted) break;
       // Woken at once when the runner is reaped; otherwise the abort flag
