@@ -93,6 +93,11 @@ TEST(ValidatorTest, ReportsEachFaultAtItsFieldWithItsKind) {
       {R"({"type": "array", "items": )" + std::string(kUnionSchema) + "}",
        R"([{"protocol": "udp"}, {"protocol": 1}])",
        {{"/1/protocol", 2}, {"/1/protocol", 32}}},
+      // A union reached through a reference is still checked by its tag.
+      {R"({"definitions": {"syslog": )" + std::string(kUnionSchema) +
+           R"(}, "type": "array", "items": {"$ref": "#/definitions/syslog"}})",
+       R"([{"protocol": "udp"}, {"protocol": "tls"}])",
+       {{"/1/caFile", 9}}},
       {R"({"type": "object", "minLength": "x"})", "{}", {{"", 31}}},
       {R"({"type": "string", "pattern": "(["})", R"("x")", {{"", 31}}},
       {R"({"$ref": "#"})", "{}", {{"", 31}}},

@@ -7,6 +7,8 @@
 
 #include <hoxcm/schema_store.h>
 
+#include "platform/schema/ref_check.h"
+
 namespace JsonValidator::detail {
 namespace {
 
@@ -19,7 +21,6 @@ constexpr std::size_t kEngineStack = 64u << 20;
 // The guard walk follows every variant of every schema; past this many steps
 // it stops reasoning and treats every long string as a pattern subject.
 constexpr int kWalkBudget = 100000;
-constexpr int kMaxRefHops = 32;
 
 bool HasPatterns(const Value& node) {
   if (node.IsObject()) {
@@ -49,7 +50,7 @@ class SubjectWalk {
   // False when the budget ran out.
   bool Walk(const Value& doc, const Value* node, std::vector<std::string>& tokens) {
     if (--budget_ < 0) return false;
-    node = Resolve(node);
+    node = ResolveLocalReference(root_, node);
     if (node == nullptr || !node->IsObject()) return true;
     auto pattern = node->FindMember("pattern");
     if (pattern != node->MemberEnd() && doc.IsString() && doc.GetStringLength() > kMaxPatternSubject) {
@@ -125,17 +126,6 @@ class SubjectWalk {
       tokens.pop_back();
     }
     return ok;
-  }
-
-  const Value* Resolve(const Value* node) const {
-    for (int hop = 0; node != nullptr && node->IsObject() && hop < kMaxRefHops; ++hop) {
-      auto ref = node->FindMember("$ref");
-      if (ref == node->MemberEnd()) return node;
-      if (!ref->value.IsString() || ref->value.GetString()[0] != '#') return nullptr;
-      rapidjson::Pointer pointer(ref->value.GetString(), ref->value.GetStringLength());
-      node = pointer.IsValid() ? pointer.Get(root_) : nullptr;
-    }
-    return node;
   }
 
   void Record(const std::vector<std::string>& tokens, bool memberName) {

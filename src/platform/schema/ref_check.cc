@@ -50,4 +50,16 @@ std::string Scan(const Value& root, const Value& node) {
 
 std::string FindReferenceLoop(const Value& schema) { return Scan(schema, schema); }
 
+const Value* ResolveLocalReference(const Value& root, const Value* node) {
+  constexpr int kMaxRefHops = 32;
+  for (int hop = 0; node != nullptr && node->IsObject() && hop < kMaxRefHops; ++hop) {
+    auto ref = node->FindMember("$ref");
+    if (ref == node->MemberEnd()) return node;
+    if (!ref->value.IsString() || ref->value.GetString()[0] != '#') return nullptr;
+    rapidjson::Pointer pointer(ref->value.GetString(), ref->value.GetStringLength());
+    node = pointer.IsValid() ? pointer.Get(root) : nullptr;
+  }
+  return node;
+}
+
 }  // namespace JsonValidator::detail

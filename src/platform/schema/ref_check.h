@@ -14,4 +14,10 @@ namespace JsonValidator::detail {
 // where it started; otherwise the reason, naming the reference.
 std::string FindReferenceLoop(const rapidjson::Value& schema);
 
+// The schema that `node` stands for once its local references into `root`
+// are followed; null for a reference that is not local or leads nowhere. A
+// chain is followed for at most 32 references (loops are refused earlier by
+// FindReferenceLoop).
+const rapidjson::Value* ResolveLocalReference(const rapidjson::Value& root, const rapidjson::Value* node);
+
 }  // namespace JsonValidator::detail

@@ -20,8 +20,6 @@ using rapidjson::Value;
 
 // Unions nest inside union variants; a schema that nests deeper is refused.
 constexpr int kMaxUnionDepth = 32;
-// $ref chains longer than this are taken as a loop.
-constexpr int kMaxRefHops = 32;
 
 bool ContainsUnionTag(const Value& node) {
   if (node.IsObject()) {
@@ -115,7 +113,7 @@ class UnionWalk {
   UnionWalk(const Value& root, int depth, std::vector<Finding>& out) : root_(root), depth_(depth), out_(out) {}
 
   void Walk(const Value& doc, const Value* node, const std::string& path) {
-    node = Resolve(node);
+    node = detail::ResolveLocalReference(root_, node);
     if (node == nullptr || !node->IsObject()) return;
     auto tag = node->FindMember("unionTag");
     if (tag != node->MemberEnd() && tag->value.IsString() && doc.IsObject()) CheckUnion(doc, *node, tag->value, path);
@@ -151,17 +149,6 @@ class UnionWalk {
   }
 
  private:
-  const Value* Resolve(const Value* node) const {
-    for (int hop = 0; node != nullptr && node->IsObject() && hop < kMaxRefHops; ++hop) {
-      auto ref = node->FindMember("$ref");
-      if (ref == node->MemberEnd()) return node;
-      if (!ref->value.IsString() || ref->value.GetString()[0] != '#') return nullptr;
-      rapidjson::Pointer pointer(ref->value.GetString(), ref->value.GetStringLength());
-      node = pointer.IsValid() ? pointer.Get(root_) : nullptr;
-    }
-    return node;
-  }
-
   void CheckUnion(const Value& doc, const Value& node, const Value& tagName, const std::string& path) {
     const std::string tag = tagName.GetString();
     auto variants = node.FindMember("oneOf");
