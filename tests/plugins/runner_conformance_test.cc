@@ -109,6 +109,24 @@ TEST_P(RunnerConformanceTest, ImpactAndValidationResults) {
   EXPECT_EQ(validation.errors[0].errors.at(0), ErrorInfo("conformance.bad", {"x"}, "bad"));
 }
 
+TEST_P(RunnerConformanceTest, RefusesSharedObjectsOfAnotherInterface) {
+  if (GetParam() != "c++") GTEST_SKIP() << "shared objects only";
+  const struct {
+    const char* library;
+    const char* status;
+  } cases[] = {
+      {"libwrongabi.so", "status=Protocol error"},
+      {"libnodescribe.so", "status=Function not implemented"},
+  };
+  for (const auto& c : cases) {
+    std::filesystem::copy_file(BuildPath(std::string("tests/plugins/") + c.library), moduleFile_,
+                               std::filesystem::copy_options::overwrite_existing);
+    const ErrorInfo error = Apply(Dns("{}"));
+    EXPECT_EQ(error.id, "com.tarvik.hox.settings.apply.plugin.unexpected.error") << c.library;
+    EXPECT_NE(error.message.find(c.status), std::string::npos) << error.message;
+  }
+}
+
 INSTANTIATE_TEST_SUITE_P(BothRunners, RunnerConformanceTest, ::testing::Values("c++", "python"),
                          [](const auto& info) { return info.param == "c++" ? "Cpp" : "Python"; });
 
