@@ -142,6 +142,18 @@ void SyncSingleton(const char* key, const std::vector<std::pair<std::string, std
   HoxConfigStore::ApplyUserConfigChanges({{"SET", {kComponent, kGroup, key}, text}});
 }
 
+// An ssh_config or sshd_config file read into its singleton object; a
+// missing file leaves the object alone.
+void SyncOptionsFile(const char* hostPath, bool client, const char* key) {
+  const std::string path = HoxPlatform::HostPath(hostPath);
+  std::string text;
+  if (!ReadHostFile(path, text)) return;
+  std::vector<int> skipped;
+  const auto options = ParseSshOptions(text, client, skipped);
+  LogSkipped(path, skipped);
+  SyncSingleton(key, options);
+}
+
 }  // namespace
 
 std::vector<AuthorizedKey> ParseAuthorizedKeys(std::string_view text, std::vector<int>& skipped) {
@@ -248,24 +260,8 @@ void SshAuthKeysConfig::UpgradeConfigToConfigStore() {
   HoxConfigStore::ApplyUserConfigChanges(changes);
 }
 
-void SshClientConfig::UpgradeConfigToConfigStore() {
-  const std::string path = HoxPlatform::HostPath(kClientConfigPath);
-  std::string text;
-  if (!ReadHostFile(path, text)) return;
-  std::vector<int> skipped;
-  const auto options = ParseSshOptions(text, true, skipped);
-  LogSkipped(path, skipped);
-  SyncSingleton("client", options);
-}
+void SshClientConfig::UpgradeConfigToConfigStore() { SyncOptionsFile(kClientConfigPath, true, "client"); }
 
-void SshServerConfig::UpgradeConfigToConfigStore() {
-  const std::string path = HoxPlatform::HostPath(kServerConfigPath);
-  std::string text;
-  if (!ReadHostFile(path, text)) return;
-  std::vector<int> skipped;
-  const auto options = ParseSshOptions(text, false, skipped);
-  LogSkipped(path, skipped);
-  SyncSingleton("server", options);
-}
+void SshServerConfig::UpgradeConfigToConfigStore() { SyncOptionsFile(kServerConfigPath, false, "server"); }
 
 }  // namespace QmkCtl::System

@@ -180,6 +180,14 @@ rapidjson::Pointer FieldPointer(const std::string& field) {
   return rapidjson::Pointer(field.empty() || field.front() == '/' ? field : "/" + field);
 }
 
+// The auto-configuration value of `field`; null (logged) when there is none.
+const Value* AutoConfSource(const rapidjson::Pointer& pointer, const std::string& field, const Value& autoConf) {
+  if (!pointer.IsValid()) return nullptr;
+  const Value* source = pointer.Get(autoConf);
+  if (source == nullptr) CSLogger::Log(CSLogger::kDetail, "No auto configuration value for '%s'", field.c_str());
+  return source;
+}
+
 }  // namespace
 
 std::string ConfigStoreDocument::NormalizeHostId(const std::string& hostId) {
@@ -327,12 +335,8 @@ void ConfigStoreDocument::PatchRequiredProperty(rapidjson::Value& value, const s
                                                 const rapidjson::Value& autoConf,
                                                 rapidjson::MemoryPoolAllocator<>& allocator) {
   const rapidjson::Pointer pointer = FieldPointer(field);
-  if (!pointer.IsValid()) return;
-  const Value* source = pointer.Get(autoConf);
-  if (source == nullptr) {
-    CSLogger::Log(CSLogger::kDetail, "No auto configuration value for '%s'", field.c_str());
-    return;
-  }
+  const Value* source = AutoConfSource(pointer, field, autoConf);
+  if (source == nullptr) return;
   Value* existing = pointer.Get(value);
   if (existing == nullptr) {
     pointer.Set(value, Value(*source, allocator), allocator);
@@ -351,12 +355,8 @@ void ConfigStoreDocument::PatchUnionTagProperty(rapidjson::Value& value, const s
                                                 const rapidjson::Value& autoConf,
                                                 rapidjson::MemoryPoolAllocator<>& allocator) {
   const rapidjson::Pointer pointer = FieldPointer(field);
-  if (!pointer.IsValid()) return;
-  const Value* source = pointer.Get(autoConf);
-  if (source == nullptr) {
-    CSLogger::Log(CSLogger::kDetail, "No auto configuration value for '%s'", field.c_str());
-    return;
-  }
+  const Value* source = AutoConfSource(pointer, field, autoConf);
+  if (source == nullptr) return;
   // The tag is missing or names no variant: the auto-configured tag wins.
   pointer.Set(value, Value(*source, allocator), allocator);
 }
