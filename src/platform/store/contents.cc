@@ -123,37 +123,34 @@ std::vector<ItemRow> RowsFromDocument(const rapidjson::Value& document) {
   return rows;
 }
 
-void ReplaceContents(ConfigKind kind, const std::vector<ItemRow>& rows) {
-  auto db = detail::CurrentDatabase(true);
-  db->Write("replace configuration", [&](Database& conn) {
-    conn.Prepare("DELETE FROM config_item WHERE kind = ?").Bind(1, static_cast<int64_t>(kind)).Run();
-    auto insert = conn.Prepare(
-        "INSERT INTO config_item (kind, component, config_group, name, identifier, value) "
-        "VALUES (?, ?, ?, ?, ?, ?)");
-    for (const ItemRow& row : rows) {
-      insert.Bind(1, static_cast<int64_t>(kind))
-          .Bind(2, row.component)
-          .Bind(3, row.group)
-          .Bind(4, row.key)
-          .Bind(5, row.identifier)
-          .Bind(6, row.value)
-          .Run();
-    }
-  });
-}
+constexpr const char* kInsertRow =
+    "INSERT INTO config_item (kind, component, config_group, name, identifier, value) VALUES (?, ?, ?, ?, ?, ?)";
 
-void UpsertItem(Database& conn, ConfigKind kind, const ItemRow& row) {
-  conn.Prepare(
-          "INSERT INTO config_item (kind, component, config_group, name, identifier, value) "
-          "VALUES (?, ?, ?, ?, ?, ?) ON CONFLICT (kind, component, config_group, name, identifier) "
-          "DO UPDATE SET value = excluded.value")
-      .Bind(1, static_cast<int64_t>(kind))
+// Binds and runs `insert`, a statement that starts with kInsertRow.
+void InsertRow(Statement& insert, ConfigKind kind, const ItemRow& row) {
+  insert.Bind(1, static_cast<int64_t>(kind))
       .Bind(2, row.component)
       .Bind(3, row.group)
       .Bind(4, row.key)
       .Bind(5, row.identifier)
       .Bind(6, row.value)
       .Run();
+}
+
+void ReplaceContents(ConfigKind kind, const std::vector<ItemRow>& rows) {
+  auto db = detail::CurrentDatabase(true);
+  db->Write("replace configuration", [&](Database& conn) {
+    conn.Prepare("DELETE FROM config_item WHERE kind = ?").Bind(1, static_cast<int64_t>(kind)).Run();
+    auto insert = conn.Prepare(kInsertRow);
+    for (const ItemRow& row : rows) InsertRow(insert, kind, row);
+  });
+}
+
+void UpsertItem(Database& conn, ConfigKind kind, const ItemRow& row) {
+  auto upsert = conn.Prepare(std::string(kInsertRow) +
+                             " ON CONFLICT (kind, component, config_group, name, identifier) "
+                             "DO UPDATE SET value = excluded.value");
+  InsertRow(upsert, kind, row);
 }
 
 constexpr const char* kSelectRows =
