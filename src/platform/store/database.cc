@@ -260,9 +260,7 @@ void Database::CheckAndMigrate(bool created) {
   if (versionTables == 0 && tables > 0) Refuse(path_, "not a configuration store");
   if (versionTables == 1) {
     try {
-      Statement read(db, "SELECT version FROM schema_version");
-      if (!read.Step()) Refuse(path_, "the store has no layout version");
-      version = read.Int(0);
+      version = ReadLayoutVersion();
     } catch (const ConfigStoreException& e) {
       if (e.GetErrorCode() == kConnectFailed) throw;
       RefuseUnreadable(e);
@@ -288,10 +286,7 @@ void Database::CheckAndMigrate(bool created) {
     int64_t current = 0;
     Statement again(db, "SELECT count(*) FROM sqlite_master WHERE type = 'table' AND name = 'schema_version'");
     again.Step();
-    if (again.Int(0) == 1) {
-      Statement read(db, "SELECT version FROM schema_version");
-      if (read.Step()) current = read.Int(0);
-    }
+    if (again.Int(0) == 1) current = ReadLayoutVersion();
     for (int64_t v = current; v < kSchemaVersion; ++v) {
       Exec(kMigrations[v], "migrate");
       Statement set(db, "UPDATE schema_version SET version = ?");
@@ -305,6 +300,18 @@ void Database::CheckAndMigrate(bool created) {
   if (created || version < kSchemaVersion) {
     CSLogger::Log(CSLogger::kDetail, "ConfigStore %s at layout version %d", path_.c_str(), kSchemaVersion);
   }
+}
+
+int64_t Database::ReadLayoutVersion() {
+  Statement read(handle_.get(), "SELECT version, typeof(version) = 'integer' FROM schema_version");
+  if (!read.Step()) Refuse(path_, "the store has no layout version");
+  // A damaged row must never pick a step of the migration.
+  if (read.Int(1) == 0 || read.Int(0) < 0) {
+    Refuse(path_, "layout version \"" + read.Text(0) + "\" is not valid");
+  }
+  const int64_t version = read.Int(0);
+  if (read.Step()) Refuse(path_, "the store has more than one layout version");
+  return version;
 }
 
 void Database::Exec(std::string_view sql, std::string_view what) {

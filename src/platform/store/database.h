@@ -132,6 +132,8 @@ class Database final : public DBStore {
 
   Database(std::string path, SqliteHandle handle);
   void CheckAndMigrate(bool created);
+  // The version row of the layout; refuses the store when it is damaged.
+  int64_t ReadLayoutVersion();
   [[noreturn]] void RefuseUnreadable(const ConfigStoreException& e);
 
   const std::string path_;
