@@ -78,6 +78,7 @@ TEST_F(StoreTest, CorruptForeignOrNewerStoresAreRefusedAndLeftUntouched) {
       {"newer layout", "", "UPDATE schema_version SET version = 2", "newer"},
       // Damaged version rows: never taken as a step of the migration.
       {"negative layout", "", "UPDATE schema_version SET version = -3", "layout version \"-3\" is not valid"},
+      {"zero layout", "", "UPDATE schema_version SET version = 0", "layout version \"0\" is not valid"},
       {"text layout", "", "UPDATE schema_version SET version = 'one'", "layout version \"one\" is not valid"},
       {"two layout rows", "", "INSERT INTO schema_version VALUES (1)", "more than one layout version"},
   };

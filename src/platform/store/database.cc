@@ -305,8 +305,9 @@ void Database::CheckAndMigrate(bool created) {
 int64_t Database::ReadLayoutVersion() {
   Statement read(handle_.get(), "SELECT version, typeof(version) = 'integer' FROM schema_version");
   if (!read.Step()) Refuse(path_, "the store has no layout version");
-  // A damaged row must never pick a step of the migration.
-  if (read.Int(1) == 0 || read.Int(0) < 0) {
+  // A damaged row must never pick a step of the migration. Version 0 is
+  // never stored: the first migration creates the table and leaves it at 1.
+  if (read.Int(1) == 0 || read.Int(0) < 1) {
     Refuse(path_, "layout version \"" + read.Text(0) + "\" is not valid");
   }
   const int64_t version = read.Int(0);
