@@ -117,6 +117,11 @@ TEST(SshSyncTest, FilesReplaceTheirObjectsAndMissingFilesLeaveTheStoreAlone) {
   EXPECT_THROW(server.UpgradeConfigToConfigStore(), HostCtl::Lib::HostCtlException);
   EXPECT_EQ(Current("server"), R"({"options":{"Port":"2200"}})");
   std::filesystem::remove_all(root.Path("/etc/ssh"));
+  // So does a file too large to be a configuration file.
+  root.WriteFile("/etc/ssh/sshd_config", std::string((16 << 20) + 1, '#'));
+  EXPECT_THROW(server.UpgradeConfigToConfigStore(), HostCtl::Lib::HostCtlException);
+  EXPECT_EQ(Current("server"), R"({"options":{"Port":"2200"}})");
+  std::filesystem::remove_all(root.Path("/etc/ssh"));
 
   root.CopyTree("data/sample-host/etc/ssh", "/etc/ssh");
   root.CopyTree("data/sample-host/root/.ssh", "/root/.ssh");

@@ -26,6 +26,9 @@ constexpr const char* kProductUuidPath = "/sys/class/dmi/id/product_uuid";
 constexpr const char* kMachineIdPath = "/etc/machine-id";
 constexpr const char* kVendorPath = "/sys/class/dmi/id/sys_vendor";
 constexpr const char* kProductPath = "/sys/class/dmi/id/product_name";
+// No host file read here is legitimately larger; a bigger one is refused
+// rather than loaded whole.
+constexpr std::size_t kMaxHostFileSize = 16u << 20;
 
 // Closes its descriptor when it goes out of scope.
 class FileDescriptor {
@@ -155,6 +158,10 @@ bool ReadHostFile(const std::string& path, std::string& out) {
     if (n < 0) fail(errno);
     if (n == 0) break;
     text.append(buffer, static_cast<std::size_t>(n));
+    // Sizes come from reading: files under /sys report a size they do not have.
+    if (text.size() > kMaxHostFileSize) {
+      throw HostCtl::Lib::HostCtlException("cannot read " + path + ": larger than 16 MiB");
+    }
   }
   out = std::move(text);
   return true;

@@ -30,7 +30,8 @@ HostFacts ParseHostFacts(const std::string& text, std::vector<std::string>& prob
 HostFacts CurrentHostFacts();
 
 // Reads a whole file. Returns false when it does not exist; throws
-// HostCtl::Lib::HostCtlException when it exists but cannot be read.
+// HostCtl::Lib::HostCtlException when it exists but cannot be read or is
+// larger than 16 MiB.
 bool ReadHostFile(const std::string& path, std::string& out);
 
 struct AuthorizedKey {
