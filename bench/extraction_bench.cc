@@ -40,7 +40,7 @@ Value MakeInstance(const std::string& key, int n, HoxConfigManager::Allocator& a
   Value v(rapidjson::kObjectType);
   auto str = [&a](const std::string& s) { return Value(s, a); };
   if (key == "vnic") {
-    std::snprintf(name, sizeof name, "vmk%d", n);
+    std::snprintf(name, sizeof name, "vnic%d", n);
     v.AddMember("name", str(name), a).AddMember("portgroup", str("Portgroup " + std::to_string(n % 40)), a);
     v.AddMember("mtu", n % 2 ? 9000 : 1500, a);
     Value ip(rapidjson::kObjectType);

@@ -42,8 +42,8 @@ class DriftWalkTest : public ::testing::Test {
 };
 
 const char* kVnics = R"({"network":{"interfaces":{"vnic":[
-  {"name":"vmk0","portgroup":"Management","mtu":1500,"ipv4":{"address":"10.0.0.5","netmask":"255.255.255.0"}},
-  {"name":"vmk1","portgroup":"Storage","mtu":9000}]}}})";
+  {"name":"vnic0","portgroup":"Management","mtu":1500,"ipv4":{"address":"10.0.0.5","netmask":"255.255.255.0"}},
+  {"name":"vnic1","portgroup":"Storage","mtu":9000}]}}})";
 
 TEST_F(DriftWalkTest, IdenticalDocumentsReportNothingBareOrWrapped) {
   // Given the sample host's own configuration as desired document, bare or
@@ -61,22 +61,22 @@ TEST_F(DriftWalkTest, NamedInstancesReportPropertiesBeforeTheirSet) {
   // report its properties and then one Set; the removed one is numbered after
   // the desired instances.
   const Calls calls = Walk(R"({"network":{"interfaces":{"vnic":[
-      {"name":"vmk0","portgroup":"Management","mtu":9000,"ipv4":{"address":"10.0.0.6","netmask":"255.255.255.0"}},
-      {"name":"vmk2","portgroup":"VM"}]}}})",
+      {"name":"vnic0","portgroup":"Management","mtu":9000,"ipv4":{"address":"10.0.0.6","netmask":"255.255.255.0"}},
+      {"name":"vnic2","portgroup":"VM"}]}}})",
                            kVnics);
   const std::string p = "/network/interfaces/vnic";
   ASSERT_EQ(calls.size(), 5u) << ::testing::PrintToString(calls);
   EXPECT_EQ(calls[0], "Property SET " + p + "/0/mtu 9000 1500");
   EXPECT_EQ(calls[1], "Property SET " + p + "/0/ipv4/address \"10.0.0.6\" \"10.0.0.5\"");
-  EXPECT_EQ(calls[2].rfind("Set " + p + "/0 [vmk0] ", 0), 0u) << calls[2];
-  EXPECT_EQ(calls[3], "Add " + p + "/1 [vmk2] {\"name\":\"vmk2\",\"portgroup\":\"VM\"}");
-  EXPECT_EQ(calls[4], "Delete " + p + "/2 [vmk1] {\"name\":\"vmk1\",\"portgroup\":\"Storage\",\"mtu\":9000}");
+  EXPECT_EQ(calls[2].rfind("Set " + p + "/0 [vnic0] ", 0), 0u) << calls[2];
+  EXPECT_EQ(calls[3], "Add " + p + "/1 [vnic2] {\"name\":\"vnic2\",\"portgroup\":\"VM\"}");
+  EXPECT_EQ(calls[4], "Delete " + p + "/2 [vnic1] {\"name\":\"vnic1\",\"portgroup\":\"Storage\",\"mtu\":9000}");
   // The drift record names the instance and marks each changed property.
   ASSERT_EQ(records_.size(), 1u);
   EXPECT_EQ(records_[0],
-            R"({"DRIFTOBJ":{"INSTANCEID":"vmk0","DRIFTOP":"SET"},"mtu":{"DRIFTOBJ":{"INSTANCEID":"vmk0","DRIFTOP":"SET"}},)"
-            R"("ipv4":{"DRIFTOBJ":{"INSTANCEID":"vmk0","DRIFTOP":"SET"},)"
-            R"("address":{"DRIFTOBJ":{"INSTANCEID":"vmk0","DRIFTOP":"SET"}}}})");
+            R"({"DRIFTOBJ":{"INSTANCEID":"vnic0","DRIFTOP":"SET"},"mtu":{"DRIFTOBJ":{"INSTANCEID":"vnic0","DRIFTOP":"SET"}},)"
+            R"("ipv4":{"DRIFTOBJ":{"INSTANCEID":"vnic0","DRIFTOP":"SET"},)"
+            R"("address":{"DRIFTOBJ":{"INSTANCEID":"vnic0","DRIFTOP":"SET"}}}})");
 }
 
 TEST_F(DriftWalkTest, PropertyActionsFollowWhichSideHoldsTheMember) {

@@ -88,7 +88,7 @@ TEST_F(DriftStoreTest, MalformedDocumentsThrowAndLeaveTheStoreUntouched) {
       R"({"network":{"dns":{"config":"x"}}})",
       R"({"network":{"dns":{"config":{"servers":["1.1.1.1"]}}},"storage":{"nfs":{"mounts":[{"server":"s"}]}}})",
       R"({"profile":{"network":{"nope":{"x":{}}}}})",
-      R"({"network":{"interfaces":{"vnic":[{"name":["vmk0"]}]}}})",
+      R"({"network":{"interfaces":{"vnic":[{"name":["vnic0"]}]}}})",
   };
   for (const std::string& text : documents) {
     Document desired = Parse(text);

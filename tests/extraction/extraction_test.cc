@@ -40,7 +40,7 @@ Document ExpectedCurrent() {
   doc.RemoveMember("quorlet");
   Value& users = doc["security"]["accounts"]["users"];
   for (auto it = users.Begin(); it != users.End();) {
-    it = std::string((*it)["name"].GetString()) == "vpxuser" ? users.Erase(it) : it + 1;
+    it = std::string((*it)["name"].GetString()) == "mgmtagent" ? users.Erase(it) : it + 1;
   }
   return doc;
 }
@@ -54,7 +54,7 @@ TEST_F(ExtractionTest, CurrentConfigurationIsTheStoredUserConfiguration) {
   EXPECT_EQ(Canonical(current), Canonical(ExpectedCurrent()));
   EXPECT_TRUE(current["network"]["routes"]["static"][0].HasMember("cs_generated_id"));
   // Instances keep the order in which they were stored.
-  EXPECT_STREQ(current["network"]["interfaces"]["vnic"][2]["name"].GetString(), "vmk2");
+  EXPECT_STREQ(current["network"]["interfaces"]["vnic"][2]["name"].GetString(), "vnic2");
 }
 
 TEST_F(ExtractionTest, UserConfigurationWithProfileIsPortable) {

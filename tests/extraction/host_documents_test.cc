@@ -53,8 +53,8 @@ TEST_F(HostDocumentsTest, SolutionUserInstancesAreFilteredOnlyForNamedIdentityKe
   auto userRow = [](const std::string& name) {
     return Row("security", "accounts", "users", name, R"({"name":")" + name + "\"}");
   };
-  const ConfigMapList users = {userRow("root"), userRow("vpxuser"), userRow("ops"), userRow("dcui")};
-  const ConfigMapList routes = {Row("network", "routes", "static", "vpxuser", "{}")};
+  const ConfigMapList users = {userRow("root"), userRow("mgmtagent"), userRow("ops"), userRow("localconsole")};
+  const ConfigMapList routes = {Row("network", "routes", "static", "mgmtagent", "{}")};
   const ConfigMapList ntp = {Row("services", "time", "ntp", "", "{}")};
 
   struct Case {
@@ -65,7 +65,7 @@ TEST_F(HostDocumentsTest, SolutionUserInstancesAreFilteredOnlyForNamedIdentityKe
   };
   const std::vector<Case> cases = {
       {"solution users dropped", users, Schema("security", "accounts", "users"), {"root", "ops"}},
-      {"generated identities untouched", routes, Schema("network", "routes", "static"), {"vpxuser"}},
+      {"generated identities untouched", routes, Schema("network", "routes", "static"), {"mgmtagent"}},
       {"singleton untouched", ntp, Schema("services", "time", "ntp"), {""}},
       {"empty list", {}, Schema("security", "accounts", "users"), {}},
   };
@@ -114,13 +114,13 @@ TEST_F(HostDocumentsTest, MapListSkipsSolutionInstancesAndEmptyValues) {
   result.SetObject();
   HoxConfigManager::ProcessConfigMapList(
       result,
-      {Row("security", "accounts", "users", "vpxuser", R"({"name":"vpxuser"})"),
-       Row("security", "accounts", "users", "dcui", R"({"name":"dcui","shell":null})"),
+      {Row("security", "accounts", "users", "mgmtagent", R"({"name":"mgmtagent"})"),
+       Row("security", "accounts", "users", "localconsole", R"({"name":"localconsole","shell":null})"),
        Row("hox", "system", "installer", "", R"({"mode":null})")},
       store, HoxConfigManager::DOCUMENT_CURRENT);
-  // vpxuser was created by a solution; dcui is only a solution user; the
+  // mgmtagent was created by a solution; localconsole is only a solution user; the
   // installer item holds nothing once nulls are gone.
-  EXPECT_EQ(Json(result), R"({"security":{"accounts":{"users":[{"name":"dcui"}]}}})");
+  EXPECT_EQ(Json(result), R"({"security":{"accounts":{"users":[{"name":"localconsole"}]}}})");
 }
 
 TEST_F(HostDocumentsTest, AutoConfigurationFillsMissingRequiredProperties) {

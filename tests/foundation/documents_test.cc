@@ -67,7 +67,7 @@ TEST(DocumentsTest, InstanceIdComesFromTheSchemasIdentityMember) {
   auto schema = std::make_shared<hoxcm_test::FakeSchemaObject>();
   schema->multiInstance = true;
   schema->identity = "name";
-  EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"name":"vmk0"})"), schema), "vmk0");
+  EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"name":"vnic0"})"), schema), "vnic0");
   EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"other":"x"})"), schema), "");
   EXPECT_EQ(CodeOf([&] { GetInstanceIdFromValue(Parse(R"({"name":5})"), schema); }), 2084);
   try {
@@ -76,7 +76,7 @@ TEST(DocumentsTest, InstanceIdComesFromTheSchemasIdentityMember) {
     EXPECT_STREQ(e.what(), "Invalid value for key name");
   }
   schema->identity.clear();
-  EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"name":"vmk0"})"), schema), "");
+  EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"name":"vnic0"})"), schema), "");
 }
 
 TEST(DocumentsTest, StringParsersRaiseInvalidArgumentAndTheFileParserConfigManager) {

@@ -35,7 +35,7 @@ TEST_F(StoreTest, ImportedDocumentIsReadBackOneRowPerObjectInKeyThenDocumentOrde
   }
   // Instances keep document order and are identified by their identity
   // member; singletons have no identifier.
-  EXPECT_EQ(Identifiers(rows, "vnic"), (std::vector<std::string>{"vmk0", "vmk1", "vmk2"}));
+  EXPECT_EQ(Identifiers(rows, "vnic"), (std::vector<std::string>{"vnic0", "vnic1", "vnic2"}));
   EXPECT_EQ(Identifiers(rows, "static"), (std::vector<std::string>{"5f0c1c9e-6a3b-4b8e-9d7a-1e2f3a4b5c6d",
                                                                     "a1b2c3d4-e5f6-4a7b-8c9d-0e1f2a3b4c5d"}));
   EXPECT_EQ(Identifiers(rows, "hostname"), (std::vector<std::string>{""}));
@@ -113,15 +113,15 @@ TEST_F(StoreTest, UserConfigChangesUpsertKeepingPositionAndDeleteById) {
 
 TEST_F(StoreTest, DefaultConfigurationIsReadPerKeyAndPerInstance) {
   ImportConfiguration(ConfigKind::Default, Json(R"({"network":{"dns":{"config":{"servers":["1.1.1.1"]}}},
-      "security":{"accounts":{"users":[{"name":"root","shell":"/bin/sh"},{"name":"dcui","shell":"/bin/sh"}]}}})"));
+      "security":{"accounts":{"users":[{"name":"root","shell":"/bin/sh"},{"name":"localconsole","shell":"/bin/sh"}]}}})"));
   auto db = GetDBStore();
   EXPECT_TRUE(GetDefaultUserConfigInternal(db, "network", "dns", "config").IsObject());
   EXPECT_TRUE(GetDefaultUserConfigInstancesInternal(db, "network", "dns", "config").IsArray());
   EXPECT_EQ(GetDefaultUserConfigInternal(db, "security", "accounts", "users").Size(), 2u);
   EXPECT_EQ(GetDefaultUserConfigMapList({"security", "accounts", "users"}, db).size(), 2u);
-  const auto dcui = GetDefaultUserConfigMapList({"security", "accounts", "users", "dcui"}, db);
-  ASSERT_EQ(dcui.size(), 1u);
-  EXPECT_EQ(dcui[0]->at("Identifier"), "dcui");
+  const auto localconsole = GetDefaultUserConfigMapList({"security", "accounts", "users", "localconsole"}, db);
+  ASSERT_EQ(localconsole.size(), 1u);
+  EXPECT_EQ(localconsole[0]->at("Identifier"), "localconsole");
   EXPECT_TRUE(GetUserConfigContents(db).empty());
 }
 

@@ -59,7 +59,7 @@ TEST(ConfigStoreDocumentTest, DocumentForHostKeepsOnlyThatHostsSectionMergedOver
 TEST(ConfigStoreDocumentTest, SplitDocumentMovesHostSpecificKeysAndIsUndoneByDocumentForHost) {
   const rapidjson::Document profile = Json(R"({
     "system": {"identity": {"hostname": {"hostname": "h1"}}, "kernel": {"boot_options": {"iommu": true}}},
-    "network": {"interfaces": {"vnic": [{"name": "vmk0"}]}}})");
+    "network": {"interfaces": {"vnic": [{"name": "vnic0"}]}}})");
   const rapidjson::Document schemaDocument = Json(R"({"type": "object", "properties": {
     "system": {"type": "object", "properties": {
       "identity": {"type": "object", "properties": {"hostname": {"type": "object", "hostSpecific": true}}},
@@ -71,7 +71,7 @@ TEST(ConfigStoreDocumentTest, SplitDocumentMovesHostSpecificKeysAndIsUndoneByDoc
   EXPECT_EQ(Compact(split),
             R"({"profile":{"system":{"kernel":{"boot_options":{"iommu":true}}}},"hostSpecific":)"
             R"({"4c4c4544-0042-3510-8053-b4c04f4e3132":{"system":{"identity":{"hostname":{"hostname":"h1"}}},)"
-            R"("network":{"interfaces":{"vnic":[{"name":"vmk0"}]}}}}})");
+            R"("network":{"interfaces":{"vnic":[{"name":"vnic0"}]}}}}})");
 
   rapidjson::Document merged;
   ConfigStoreDocument::GetDocumentForHost(split, merged, "4c4c4544-0042-3510-8053-b4c04f4e3132");

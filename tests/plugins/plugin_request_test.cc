@@ -17,11 +17,11 @@ std::shared_ptr<HoxConfigStore::ConfigStoreObject> Object(const HoxConfigStore::
 
 TEST(PluginRequestTest, ApplyRequestsCarryTextsInTheirFixedOrder) {
   TempRoot root;
-  const HoxConfigStore::ConfigStoreObjectId vnic("network", "interfaces", "vnic", "vmk0");
+  const HoxConfigStore::ConfigStoreObjectId vnic("network", "interfaces", "vnic", "vnic0");
   Document drift;
   ParseDocument(R"({"mtu":9000})", drift);
   std::vector<DesiredConfigInput> inputs = {
-      {Object(vnic, R"({"name":"vmk0","mtu":9000})"),
+      {Object(vnic, R"({"name":"vnic0","mtu":9000})"),
        std::make_shared<HoxConfigStore::DriftObject>(vnic, "SET", drift), "SET"},
       {Object(HoxConfigStore::ConfigStoreObjectId("network", "dns", "config"), R"({"servers":[]})"), nullptr, "ADD"},
   };

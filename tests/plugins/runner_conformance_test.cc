@@ -56,17 +56,17 @@ class RunnerConformanceTest : public PluginTest, public ::testing::WithParamInte
 TEST_P(RunnerConformanceTest, ASuccessfulApplyIsStoredInOneGo) {
   // Given an apply of one singleton and one new instance, the plugin runs
   // and the store then holds exactly what was applied.
-  const ConfigStoreObjectId vnic("network", "interfaces", "vnic", "vmk1");
+  const ConfigStoreObjectId vnic("network", "interfaces", "vnic", "vnic1");
   std::vector<DesiredConfigInput> inputs = Dns(R"({"servers":["10.0.0.2"],"search":[]})");
-  inputs.push_back({Object(vnic, R"({"name":"vmk1","portgroup":"pg","mtu":1500})"), nullptr, "ADD"});
+  inputs.push_back({Object(vnic, R"({"name":"vnic1","portgroup":"pg","mtu":1500})"), nullptr, "ADD"});
   EXPECT_EQ(Apply(inputs), ErrorInfo());
   EXPECT_EQ(root.ReadFile("/applied"), "2\n");
   EXPECT_EQ(StoredUserConfig(kDns), R"({"servers":["10.0.0.2"],"search":[]})");
-  EXPECT_NE(StoredUserConfig(vnic).find("vmk1"), std::string::npos);
+  EXPECT_NE(StoredUserConfig(vnic).find("vnic1"), std::string::npos);
 
   // Deletions are stored too.
-  EXPECT_EQ(Apply({{Object(vnic, R"({"name":"vmk1"})"), nullptr, "DELETE"}}), ErrorInfo());
-  EXPECT_EQ(StoredUserConfig(vnic).find("vmk1"), std::string::npos);
+  EXPECT_EQ(Apply({{Object(vnic, R"({"name":"vnic1"})"), nullptr, "DELETE"}}), ErrorInfo());
+  EXPECT_EQ(StoredUserConfig(vnic).find("vnic1"), std::string::npos);
 }
 
 TEST_P(RunnerConformanceTest, PluginErrorsComeBackAsTheyWereReported) {

@@ -89,8 +89,8 @@ TEST(SchemaStoreTest, SolutionUsersMutableDefaultsAndInfo) {
   ASSERT_TRUE(store);
   auto users = store->Find("security", "accounts", "users");
   ASSERT_TRUE(users);
-  EXPECT_EQ(users->GetSolutionUserNames(), (std::vector<std::string>{"vpxuser", "dcui"}));
-  EXPECT_EQ(users->GetSolutionInstanceIds(), (std::vector<std::string>{"vpxuser"}));
+  EXPECT_EQ(users->GetSolutionUserNames(), (std::vector<std::string>{"mgmtagent", "localconsole"}));
+  EXPECT_EQ(users->GetSolutionInstanceIds(), (std::vector<std::string>{"mgmtagent"}));
   EXPECT_TRUE(users->GetInstanceSchema()["properties"]["password"]["sensitive"].GetBool());
   EXPECT_EQ(store->GetMutableDefaultIds(), (std::set<SchemaObjectId>{{"services", "time", "ntp"}}));
   // Instances of store-generated identities may carry that member.
