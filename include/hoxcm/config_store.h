@@ -197,7 +197,8 @@ class HOXCM_API ConfigStore {
 
 // A transaction over the process's connection: every store write made until
 // Commit() (on this thread) belongs to it; destroyed uncommitted, it rolls
-// back. Transactions do not nest.
+// back. Transactions do not nest. Other threads' store calls wait until it
+// ends, so it must be committed or destroyed on the thread that began it.
 class HOXCM_API ConfigStoreTransaction {
  public:
   explicit ConfigStoreTransaction(const std::shared_ptr<ConfigStore>& store);
