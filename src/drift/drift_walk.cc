@@ -267,6 +267,20 @@ class DriftWalk {
       HostMatcher<std::string_view, std::function<std::string_view(SizeType)>> matcher(
           h.Size(), [&](SizeType j) { return NameOf(*hostIds[j]); });
       for (SizeType i = 0; i < d.Size(); ++i) {
+        if (const auto* index = matcher.IndexOnly()) {
+          // Instances in random order: fetch the index slot of a later
+          // instance, then the host instance it leads to, then its members.
+          constexpr SizeType kSlot = 12, kValue = 8, kMembers = 4;
+          if (i + kSlot < d.Size()) index->PrefetchSlot(NameOf(*desiredIds[i + kSlot]));
+          if (i + kValue < d.Size()) {
+            const SizeType p = index->Peek(NameOf(*desiredIds[i + kValue]));
+            if (p != kNone) __builtin_prefetch(&h[p]);
+          }
+          if (i + kMembers < d.Size()) {
+            const SizeType p = index->Peek(NameOf(*desiredIds[i + kMembers]));
+            if (p != kNone && h[p].MemberCount() > 0) __builtin_prefetch(&*h[p].MemberBegin());
+          }
+        }
         const Value& name = *desiredIds[i];
         const std::string_view key = NameOf(name);
         const SizeType j =

@@ -34,9 +34,11 @@ class PositionIndex {
     mask_ = capacity - 1;
   }
   void Insert(const Key& key, SizeType position) {
-    Slot& slot = Probe(key);
+    const std::uint64_t hash = HashOf(key);
+    Slot& slot = Probe(key, hash);
     if (slot.tail == kNone) {
       slot.key = key;
+      slot.hash = hash;
       slot.head = slot.tail = position;
     } else {
       next_[slot.tail] = position;
@@ -47,7 +49,7 @@ class PositionIndex {
   // order until it returns true; that position is then matched.
   template <typename Accept>
   SizeType TakeFirst(const Key& key, std::vector<bool>& matched, Accept&& accept) {
-    Slot& slot = Probe(key);
+    Slot& slot = Probe(key, HashOf(key));
     SizeType& head = slot.head;
     if (head == kNone) return kNone;
     while (head != kNone && matched[head]) head = next_[head];  // skip what is taken
@@ -60,9 +62,22 @@ class PositionIndex {
     return kNone;
   }
 
+  // Latency hiding for lookups in random order: fetch the slot of a key
+  // that will be looked up soon, and, once it is fetched, guess the host
+  // position it leads to (by hash only, without reading the key).
+  void PrefetchSlot(const Key& key) const { __builtin_prefetch(&slots_[HashOf(key) & mask_]); }
+  SizeType Peek(const Key& key) const {
+    const std::uint64_t hash = HashOf(key);
+    for (std::size_t i = hash & mask_; slots_[i].tail != kNone; i = (i + 1) & mask_) {
+      if (slots_[i].hash == hash) return slots_[i].head;
+    }
+    return kNone;
+  }
+
  private:
   struct Slot {
     Key key{};
+    std::uint64_t hash = 0;
     SizeType head = kNone;
     SizeType tail = kNone;
   };
@@ -71,10 +86,10 @@ class PositionIndex {
 
   // The slot holding `key`, or the empty slot where it belongs. A group
   // whose positions are all matched keeps its slot, so probing stays valid.
-  Slot& Probe(const Key& key) {
-    for (std::size_t i = HashOf(key) & mask_;; i = (i + 1) & mask_) {
+  Slot& Probe(const Key& key, std::uint64_t hash) {
+    for (std::size_t i = hash & mask_;; i = (i + 1) & mask_) {
       Slot& slot = slots_[i];
-      if (slot.tail == kNone || slot.key == key) return slot;
+      if (slot.tail == kNone || (slot.hash == hash && slot.key == key)) return slot;
     }
   }
 
@@ -121,6 +136,9 @@ class HostMatcher {
     return found;
   }
   const std::vector<bool>& matched() const { return matched_; }
+  // Once only the index is used, callers may hide its latency (see
+  // PositionIndex::PrefetchSlot and Peek).
+  const PositionIndex<Key>* IndexOnly() const { return indexOnly_ ? &*index_ : nullptr; }
 
  private:
   static constexpr std::size_t kMaxHoles = 8;
