@@ -1,5 +1,6 @@
 // Host facts read from files under a temporary root.
 #include <cerrno>
+#include <cstdlib>
 
 #include <gtest/gtest.h>
 #include <hoxcm/config_store.h>
@@ -71,6 +72,20 @@ TEST(HostFactsTest, FactsFileGivesQuickBootAndSwitchesAndMissingOrMalformedMeans
   root.WriteFile("/etc/tarvik/host-facts.json", "{\"stmSupported\": tru");
   FeatureState_InitSilentMode();
   EXPECT_FALSE(HostCtl::System::LoadHox::IsSTMSupported());
+
+  // A delta re-read logs every switch that changed, also one that was
+  // removed from the file (and so is off now).
+  root.WriteFile("/etc/tarvik/host-facts.json", R"({"features": {"a": true, "b": true, "c": false}})");
+  FeatureState_InitSilentMode();
+  root.WriteFile("/etc/tarvik/host-facts.json", R"({"features": {"b": true, "c": true}})");
+  ::setenv("HOX_LOG_LEVEL", "detail", 1);
+  testing::internal::CaptureStderr();
+  FeatureState_InitDeltaMode();
+  const std::string log = testing::internal::GetCapturedStderr();
+  ::unsetenv("HOX_LOG_LEVEL");
+  EXPECT_NE(log.find("Feature switch a is now 0"), std::string::npos) << log;
+  EXPECT_EQ(log.find("Feature switch b"), std::string::npos) << log;
+  EXPECT_NE(log.find("Feature switch c is now 1"), std::string::npos) << log;
 
   std::vector<std::string> problems;
   const auto facts = HoxPlatform::detail::ParseHostFacts(R"({"stmSupported": 1, "features": []})", problems);

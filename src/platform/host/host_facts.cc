@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <cstring>
 #include <mutex>
+#include <set>
 
 #include <hoxcm/config_store.h>
 #include <hoxcm/errors.h>
@@ -123,10 +124,20 @@ HostFacts LoadFacts(LoadMode mode) {
     }
   }
   if (mode == LoadMode::kDelta && cache.loaded && cache.path == path) {
-    for (const auto& [name, enabled] : facts.features) {
-      auto old = cache.facts.features.find(name);
-      const bool was = old != cache.facts.features.end() && old->second;
-      if (was != enabled) CSLogger::Log(CSLogger::kDetail, "Feature switch %s is now %d", name.c_str(), enabled);
+    const auto enabled = [](const HostFacts& f, const std::string& name) {
+      auto it = f.features.find(name);
+      return it != f.features.end() && it->second;
+    };
+    // A switch removed from the file is off now: both sides are compared.
+    std::set<std::string> names;
+    for (const HostFacts* f : {&cache.facts, &facts}) {
+      for (const auto& entry : f->features) names.insert(entry.first);
+    }
+    for (const std::string& name : names) {
+      const bool now = enabled(facts, name);
+      if (enabled(cache.facts, name) != now) {
+        CSLogger::Log(CSLogger::kDetail, "Feature switch %s is now %d", name.c_str(), now);
+      }
     }
   }
   cache.loaded = true;
