@@ -134,6 +134,10 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
       {"bad/x/optional_identity",
        R"({"multiInstance": true, "identity": "a", "schema": {"type": "object", "properties": {"a": {"type": "string"}}}})",
        "must be a required property"},
+      {"bad/x/secret_identity",
+       R"({"multiInstance": true, "identity": "a", "schema": {"type": "object",)"
+       R"( "properties": {"a": {"type": "string", "sensitive": true}}, "required": ["a"]}})",
+       "cannot be sensitive"},
       {"bad/x/operation", "{\"multiInstance\": false, \"rebootRequired\": [\"REBOOT\"], " + object + "}", "\"REBOOT\""},
       {"bad/x/trigger",
        R"({"multiInstance": false, "schema": {"type": "object", "properties": {"a": {"type": "integer", "rebootRequired": [1]}}}})",

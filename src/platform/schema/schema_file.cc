@@ -225,6 +225,12 @@ void CheckIdentity(rapidjson::Value& instance, const std::string& identity, rapi
       !ListsString(required->value, identity)) {
     Fail("identity member \"" + identity + "\" must be a required property of type \"string\"");
   }
+  // An instance's identity is shown wherever the instance is named (paths,
+  // logs, reports): it cannot be a secret.
+  auto sensitive = member->value.FindMember("sensitive");
+  if (sensitive != member->value.MemberEnd() && sensitive->value.IsTrue()) {
+    Fail("identity member \"" + identity + "\" cannot be sensitive");
+  }
 }
 
 KeySchema::Definition ReadDefinition(const rapidjson::Value& root, const SchemaObjectId& id, const std::string& path) {
