@@ -176,7 +176,8 @@ TEST(ConfigStoreDocumentTest, NormalizeValueSortsMembersAtEveryDepthAndKeepsArra
 }
 
 TEST(ConfigStoreDocumentTest, PatchesFillFromAutoConfigurationValues) {
-  const rapidjson::Document autoConf = Json(R"({"protocol":"udp","port":514,"tls":{"caFile":"/ca","verify":true}})");
+  const rapidjson::Document autoConf =
+      Json(R"({"protocol":"udp","port":514,"tls":{"caFile":"/ca","verify":true},"servers":["a","b","c","d"]})");
   struct Case {
     bool unionTag;
     std::string value;
@@ -191,6 +192,12 @@ TEST(ConfigStoreDocumentTest, PatchesFillFromAutoConfigurationValues) {
       {false, R"({"tls":{"caFile":"/mine"}})", "/tls", R"({"tls":{"caFile":"/mine","verify":true}})"},
       {true, R"({"protocol":"carrier-pigeon"})", "/protocol", R"({"protocol":"udp"})"},
       {true, R"({"remoteHost":"h"})", "/protocol", R"({"remoteHost":"h","protocol":"udp"})"},
+      // Only members of objects that exist are patched: nothing in the way
+      // is turned into an object, and no array is padded.
+      {false, R"({"tls":"off"})", "/tls/caFile", R"({"tls":"off"})"},
+      {true, R"({"tls":["x"]})", "/tls/caFile", R"({"tls":["x"]})"},
+      {false, R"({"remoteHost":"h"})", "/tls/caFile", R"({"remoteHost":"h"})"},
+      {false, R"({"servers":["a"]})", "/servers/3", R"({"servers":["a"]})"},
   };
   for (const Case& c : cases) {
     rapidjson::Document value = Json(c.value);

@@ -180,6 +180,16 @@ rapidjson::Pointer FieldPointer(const std::string& field) {
   return rapidjson::Pointer(field.empty() || field.front() == '/' ? field : "/" + field);
 }
 
+// Whether `pointer` names a member of an object that exists in `value`.
+// Setting through any other pointer would turn what stands in its way (a
+// string, an array) into an object, or pad an array with nulls.
+bool NamesMemberOfObject(const rapidjson::Pointer& pointer, Value& value) {
+  if (!pointer.IsValid() || pointer.GetTokenCount() == 0) return false;
+  const rapidjson::Pointer parent(pointer.GetTokens(), pointer.GetTokenCount() - 1);
+  const Value* container = parent.Get(value);
+  return container != nullptr && container->IsObject();
+}
+
 // The auto-configuration value of `field`; null (logged) when there is none.
 const Value* AutoConfSource(const rapidjson::Pointer& pointer, const std::string& field, const Value& autoConf) {
   if (!pointer.IsValid()) return nullptr;
@@ -339,7 +349,7 @@ void ConfigStoreDocument::PatchRequiredProperty(rapidjson::Value& value, const s
   if (source == nullptr) return;
   Value* existing = pointer.Get(value);
   if (existing == nullptr) {
-    pointer.Set(value, Value(*source, allocator), allocator);
+    if (NamesMemberOfObject(pointer, value)) pointer.Set(value, Value(*source, allocator), allocator);
     return;
   }
   // The field names an object: fill the members it lacks.
@@ -358,7 +368,7 @@ void ConfigStoreDocument::PatchUnionTagProperty(rapidjson::Value& value, const s
   const Value* source = AutoConfSource(pointer, field, autoConf);
   if (source == nullptr) return;
   // The tag is missing or names no variant: the auto-configured tag wins.
-  pointer.Set(value, Value(*source, allocator), allocator);
+  if (NamesMemberOfObject(pointer, value)) pointer.Set(value, Value(*source, allocator), allocator);
 }
 
 rapidjson::Document ConfigStoreDocument::CreateDocument(const std::string& text) {
