@@ -148,6 +148,10 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
       {"bad/x/regex",
        R"({"multiInstance": false, "schema": {"type": "object", "properties": {"a": {"type": "string", "pattern": "(["}}}})",
        "invalid regular expression"},
+      {"bad/x/long_regex",
+       R"({"multiInstance": false, "schema": {"type": "object", "properties": {"a": {"type": "string", "pattern": ")" +
+           std::string(200000, 'a') + R"("}}}})",
+       "longer than 4096 bytes"},
       {"bad/x/engine", R"({"multiInstance": false, "schema": {"type": "object", "minLength": "x"}})", "not usable"},
       {"bad/x/array", R"({"multiInstance": false, "schema": {"type": "array"}})", "\"type\": \"object\""},
       {"bad/x/mutable", "{\"multiInstance\": false, \"mutableDefault\": true, " + object + "}",

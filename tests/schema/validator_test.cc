@@ -100,6 +100,9 @@ TEST(ValidatorTest, ReportsEachFaultAtItsFieldWithItsKind) {
        {{"/1/caFile", 9}}},
       {R"({"type": "object", "minLength": "x"})", "{}", {{"", 31}}},
       {R"({"type": "string", "pattern": "(["})", R"("x")", {{"", 31}}},
+      // A pattern long enough to exhaust the stack of the regex compiler.
+      {R"({"type": "string", "pattern": ")" + std::string(200000, 'a') + R"("})", R"("x")", {{"", 31}}},
+      {R"({"patternProperties": {")" + std::string(200000, '(') + R"(": {}}})", R"({"x": 1})", {{"", 31}}},
       {R"({"$ref": "#"})", "{}", {{"", 31}}},
       {R"({"definitions": {"a": {"$ref": "#/definitions/b"}, "b": {"$ref": "#/definitions/a"}},
            "properties": {"x": {"$ref": "#/definitions/a"}}})",

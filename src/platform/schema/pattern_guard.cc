@@ -226,6 +226,29 @@ bool GuardPatternSubjects(const Value& schema, const Value& document, const std:
   return true;
 }
 
+std::string FindOverlongPattern(const Value& node) {
+  static const std::string kReason =
+      "a regular expression is longer than " + std::to_string(kMaxPatternLength) + " bytes";
+  if (node.IsObject()) {
+    for (const auto& m : node.GetObject()) {
+      if (m.name == "pattern" && m.value.IsString() && m.value.GetStringLength() > kMaxPatternLength) return kReason;
+      if (m.name == "patternProperties" && m.value.IsObject()) {
+        for (const auto& p : m.value.GetObject()) {
+          if (p.name.GetStringLength() > kMaxPatternLength) return kReason;
+        }
+      }
+      std::string found = FindOverlongPattern(m.value);
+      if (!found.empty()) return found;
+    }
+  } else if (node.IsArray()) {
+    for (const auto& v : node.GetArray()) {
+      std::string found = FindOverlongPattern(v);
+      if (!found.empty()) return found;
+    }
+  }
+  return std::string();
+}
+
 bool HasStringsLongerThan(const Value& v, std::size_t limit) {
   if (v.IsString()) return v.GetStringLength() > limit;
   if (v.IsObject()) {

@@ -1,4 +1,5 @@
-// Keeps the schema engine's regular expressions safe. The engine matches
+// Keeps the schema engine's regular expressions safe. Patterns themselves
+// are limited to kMaxPatternLength bytes. The engine matches
 // "pattern" and "patternProperties" with a backtracking matcher whose
 // recursion grows with the length of the subject: a long enough string would
 // exhaust the stack. So strings that a pattern may be applied to are limited
@@ -20,6 +21,16 @@ namespace JsonValidator::detail {
 constexpr std::size_t kMaxPatternSubject = 4096;
 // Subjects up to this length are matched safely on any thread's stack.
 constexpr std::size_t kSmallSubject = 256;
+
+// Compiling a regular expression recurses once per element of the pattern:
+// a pattern of some ten thousand elements exhausts a thread's stack before
+// any subject is matched. A schema with a longer pattern is not usable.
+constexpr std::size_t kMaxPatternLength = 4096;
+
+// Empty when every regular expression of `schema` ("pattern" values and
+// "patternProperties" names) is at most kMaxPatternLength bytes long;
+// otherwise the reason.
+std::string FindOverlongPattern(const rapidjson::Value& schema);
 
 // When `document` holds strings (values or member names) longer than the
 // limit that a pattern of `schema` may be applied to, reports each one as a

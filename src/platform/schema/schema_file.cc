@@ -9,6 +9,7 @@
 #include <hoxcm/json.h>
 
 #include "foundation/json_parse.h"
+#include "platform/schema/pattern_guard.h"
 #include "platform/schema/ref_check.h"
 #include "platform/schema/valijson.h"
 
@@ -83,6 +84,10 @@ std::vector<std::string> GetOperations(const rapidjson::Value& root, const char*
 }
 
 void CheckRegex(const std::string& pattern, const std::string& where) {
+  if (pattern.size() > JsonValidator::detail::kMaxPatternLength) {
+    Fail("regular expression at " + where + " is longer than " +
+         std::to_string(JsonValidator::detail::kMaxPatternLength) + " bytes");
+  }
   try {
     std::regex compiled(pattern);
   } catch (const std::regex_error& e) {

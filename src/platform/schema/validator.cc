@@ -67,6 +67,10 @@ std::string ContextToPath(const std::string& base, const std::vector<std::string
 }
 
 void RunEngine(const Value& schema, const Value& document, const std::string& path, std::vector<Finding>& out) {
+  if (std::string overlong = detail::FindOverlongPattern(schema); !overlong.empty()) {
+    out.push_back(SchemaInvalid(path, overlong));
+    return;
+  }
   rapidjson::Document guarded;
   const Value& subject = detail::GuardPatternSubjects(schema, document, path, guarded, out) ? guarded : document;
   if (std::string loop = detail::FindReferenceLoop(schema); !loop.empty()) {
