@@ -15,9 +15,6 @@
 namespace hoxcfg {
 namespace {
 
-// The library logs at information level during a walk; the answer matters
-// more on a terminal. HOX_LOG_LEVEL still asks for more.
-void QuietLibraryLog() { ::setenv("HOX_LOG_LEVEL", "-1", 0); }
 
 // The document as it applies to this host: host-specific sections (as an
 // export writes them) are reduced to this host's.
@@ -50,7 +47,6 @@ void RegisterCompliance(CLI::App& app, GlobalOptions& options) {
   cmd->add_flag("--json", *json, "Print the report document itself");
   cmd->callback([&options, file, json] {
     Run(options, [&] {
-      QuietLibraryLog();
       rapidjson::Document desired = LoadDocument(*file);
       HoxConfigManager::ComplianceResult result;
       HoxConfigManager::CheckCompliance(desired, result);
@@ -83,7 +79,6 @@ void RegisterDrift(CLI::App& app, GlobalOptions& options) {
   cmd->add_flag("--json", *json, "Print the tasks as a JSON array");
   cmd->callback([&options, file, boot, json] {
     Run(options, [&] {
-      QuietLibraryLog();
       rapidjson::Document desired = LoadDocument(*file);
       const std::vector<HoxConfigManager::DesiredConfigInput> tasks =
           *boot ? HoxConfigManager::GenerateBootTimeTasks(desired) : HoxConfigManager::GenerateApplyTasks(desired);

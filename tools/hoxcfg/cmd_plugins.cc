@@ -90,7 +90,6 @@ void RegisterPluginCommands(CLI::App& app, GlobalOptions& options) {
       ->fallthrough()
       ->callback([&options] {
         Run(options, [&] {
-          ::setenv("HOX_LOG_LEVEL", "-1", 0);
           std::cout << FormatJson(ListPlugins(), options) << std::flush;
           return kExitOk;
         });
@@ -99,7 +98,6 @@ void RegisterPluginCommands(CLI::App& app, GlobalOptions& options) {
       ->fallthrough()
       ->callback([&options] {
         Run(options, [&] {
-          ::setenv("HOX_LOG_LEVEL", "-1", 0);
           rapidjson::Document report;
           ValidateAllPlugins(PluginDirectory(), PluginSchemaDirectory(), report);
           std::cout << FormatJson(report, options) << std::flush;

@@ -18,9 +18,6 @@
 namespace hoxcfg {
 namespace {
 
-// The library logs every extracted item at information level; on a terminal
-// that drowns the answer. The tool is quiet unless HOX_LOG_LEVEL asks for more.
-void QuietLibraryLog() { ::setenv("HOX_LOG_LEVEL", "-1", 0); }
 
 // Reading commands must not create a store as a side effect: a mistyped
 // root is an error, not a new empty host.
@@ -66,7 +63,6 @@ void RegisterInit(CLI::App& app, GlobalOptions& options) {
   cmd->add_flag("--force", *force, "Allow initialising the real root /");
   cmd->callback([&options, sample, force] {
     Run(options, [&] {
-      QuietLibraryLog();
       const std::string root = HoxPlatform::HostRoot();
       if ((root == "/" || root.empty()) && !*force) {
         throw CommandError{kExitError, "refusing to initialise the real root /; pass --root DIR (or --force)"};
@@ -86,7 +82,6 @@ void RegisterExport(CLI::App& app, GlobalOptions& options) {
   cmd->add_option("--output,-o", *output, "Write the document to FILE (mode 0600) instead of stdout");
   cmd->callback([&options, output] {
     Run(options, [&] {
-      QuietLibraryLog();
       RequireHostRoot();
       const rapidjson::Document doc = HoxConfigManager::ExportDocument();
       // The export carries secrets in clear (it must be applicable to another
@@ -105,7 +100,6 @@ void RegisterShow(CLI::App& app, GlobalOptions& options) {
       ->check(CLI::IsMember({"current", "user", "desired", "smartnic"}));
   cmd->callback([&options, which] {
     Run(options, [&] {
-      QuietLibraryLog();
       RequireHostRoot();
       rapidjson::Document doc;
       if (*which == "current") {
@@ -130,7 +124,6 @@ void RegisterMaintenance(CLI::App& app, GlobalOptions& options) {
   auto add = [&](const char* name, const char* help, int action) {
     cmd->add_subcommand(name, help)->fallthrough()->callback([&options, action] {
       Run(options, [&] {
-        QuietLibraryLog();
         RequireHostRoot();
         if (action >= 0) HoxConfigStore::SetMaintenanceMode(action == 1);
         const bool enabled = HoxConfigManager::IsMaintenanceModeEnabled();

@@ -32,6 +32,10 @@ int RunCommand(const std::function<int()>& body) {
 
 void Run(GlobalOptions& options, const std::function<int()>& body) {
   ApplyRoot(options);
+  // The library logs every item it handles at information level; on a
+  // terminal that drowns the answer. The tool is quiet unless HOX_LOG_LEVEL
+  // asks for more.
+  ::setenv("HOX_LOG_LEVEL", "-1", 0);
   options.exitCode = RunCommand(body);
 }
 
