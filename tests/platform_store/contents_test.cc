@@ -109,6 +109,13 @@ TEST_F(StoreTest, UserConfigChangesUpsertKeepingPositionAndDeleteById) {
   EXPECT_STREQ(route[0]["cs_generated_id"].GetString(), "g-1");
   ApplyUserConfigChanges({{"DELETE", {"network", "routes", "static"}, R"({"cs_generated_id":"g-1"})"}});
   EXPECT_TRUE(GetCurrentConfigInternal(GetDBStore(), "network", "routes", "static").IsNull());
+
+  // An id and a value that name different instances are refused: the row
+  // would hold an instance that could never be found by its name.
+  EXPECT_THROW(ApplyUserConfigChanges(
+                   {{"SET", {"storage", "nfs", "mounts", "a"}, R"({"name":"z","server":"t","export":"/a"})"}}),
+               HoxConfigManager::ConfigManagerException);
+  EXPECT_EQ(std::get<4>(Rows(ConfigKind::User)[0]), R"({"name":"a","server":"t","export":"/a"})");
 }
 
 TEST_F(StoreTest, DefaultConfigurationIsReadPerKeyAndPerInstance) {

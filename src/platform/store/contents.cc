@@ -2,6 +2,7 @@
 // configuration, read as row maps and written from host documents or from
 // the changes of a plugin run.
 #include <set>
+#include <string_view>
 #include <tuple>
 
 #include <hoxcm/config_store.h>
@@ -61,7 +62,16 @@ std::string IdentifyInstance(rapidjson::Value& instance, rapidjson::MemoryPoolAl
     }
     return id;
   }
-  if (!requested.empty()) return requested;
+  if (!requested.empty()) {
+    // A row whose value names another instance could never be found again
+    // by that name (to be changed or deleted).
+    if (it != instance.MemberEnd() && it->value.IsString() &&
+        std::string_view(it->value.GetString(), it->value.GetStringLength()) != requested) {
+      HoxConfigManager::ThrowException<HoxConfigManager::ConfigManagerException>(
+          HoxConfigManager::InvalidKeyValue, member + " (the value names another instance than " + requested + ")");
+    }
+    return requested;
+  }
   if (it == instance.MemberEnd() || !it->value.IsString() || it->value.GetStringLength() == 0) {
     HoxConfigManager::ThrowException<HoxConfigManager::ConfigManagerException>(
         HoxConfigManager::InvalidKeyValue, member);
