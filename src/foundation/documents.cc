@@ -18,13 +18,11 @@ namespace HoxConfigManager {
 bool fileExists(const std::string& path) {
   struct stat st;
   if (::stat(path.c_str(), &st) != 0) {
+    // Every failure is logged, a missing file included: callers that probe
+    // for optional files see the reason in the log.
     const int err = errno;
-    // A missing file is the ordinary "no"; anything else is worth a line.
-    if (err != ENOENT && err != ENOTDIR) {
-      CSLogger::Log(CSLogger::kError,
-                    "Failed to query the status of \"%s\", error code: %d, error message: \"%s\"",
-                    path.c_str(), err, std::strerror(err));
-    }
+    CSLogger::Log(CSLogger::kError, "Failed to query the status of \"%s\", error code: %d, error message: \"%s\"",
+                  path.c_str(), err, std::strerror(err));
     return false;
   }
   return S_ISREG(st.st_mode);
