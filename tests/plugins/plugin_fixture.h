@@ -1,13 +1,14 @@
 // Shared setup of the plugin tests: a temporary root with the sample
-// schemas and the manifest schemas installed, and writers of manifests.
+// schemas and the manifest schemas installed, writers of manifests, store
+// objects, and what a call throws.
 #pragma once
 
+#include <filesystem>
+#include <functional>
 #include <string>
 #include <vector>
 
 #include <gtest/gtest.h>
-
-#include <filesystem>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/plugins.h>
@@ -17,6 +18,7 @@
 namespace hoxcm_test {
 
 inline const std::string kModules = "/usr/lib/tarvik/configmanager/apply_modules/";
+inline const std::string kPluginSchemas = "/usr/lib/tarvik/configmanager/plugin_schemas/";
 
 // A version-3 manifest.
 inline std::string V3Manifest(const std::string& type, const std::vector<std::string>& accepts,
@@ -30,6 +32,30 @@ inline std::string V3Manifest(const std::string& type, const std::vector<std::st
   return "{\"version\":3,\"type\":\"" + type + "\",\"accepts\":" + list(accepts) +
          ",\"apply\":{\"boot\":true,\"apply_group\":\"" + group + "\",\"REMEDIATE\":{\"provides\":\"" + provides +
          "\",\"depends\":" + list(depends) + "}}" + extra + "}";
+}
+
+inline std::shared_ptr<HoxConfigStore::ConfigStoreObject> Object(const HoxConfigStore::ConfigStoreObjectId& id,
+                                                                 const std::string& json) {
+  HoxConfigManager::Document value;
+  HoxConfigManager::ParseDocument(json, value);
+  return std::make_shared<HoxConfigStore::ConfigStoreObject>(id, value);
+}
+
+// What `f` throws: the library's code (-1 for any other exception, 0 when
+// nothing is thrown) and the message.
+struct Thrown {
+  int code = 0;
+  std::string message;
+};
+inline Thrown ThrownBy(const std::function<void()>& f) {
+  try {
+    f();
+  } catch (const HoxConfigStore::ConfigStoreException& e) {
+    return {e.GetErrorCode(), e.what()};
+  } catch (const std::exception& e) {
+    return {-1, e.what()};
+  }
+  return {};
 }
 
 class PluginTest : public ::testing::Test {

@@ -5,9 +5,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <atomic>
 #include <chrono>
-#include <filesystem>
 #include <thread>
 
 #include "plugins/plugin_fixture.h"
@@ -20,38 +18,19 @@ using Clock = std::chrono::steady_clock;
 
 constexpr const char* kApplyUnexpected = "com.tarvik.hox.settings.apply.plugin.unexpected.error";
 constexpr const char* kApplyAborted = "com.tarvik.hox.settings.apply.plugin.aborted";
+constexpr const char* kSuccess = R"(echo '{"id":"","args":[],"message":""}' > "$out")";
 
-// Aborts once `after` calls have said no.
-class CountingMonitor final : public PluginMonitor {
+// A monitor whose abort is decided by `aborted`.
+class Monitor final : public PluginMonitor {
  public:
-  explicit CountingMonitor(int after, std::string taskId = "task-1") : left_(after), taskId_(std::move(taskId)) {}
-  bool IsAborted() override { return left_.fetch_sub(1) <= 0; }
+  explicit Monitor(std::function<bool()> aborted = [] { return false; }, std::string taskId = "task-1")
+      : aborted_(std::move(aborted)), taskId_(std::move(taskId)) {}
+  bool IsAborted() override { return aborted_(); }
   std::string GetTaskId() override { return taskId_; }
 
  private:
-  std::atomic<int> left_;
-  std::string taskId_;
-};
-
-// Says "aborted" only to the thread that created it: the run's monitor
-// thread never sees the abort, the judgement after the runner was reaped
-// does.
-class LateAbortMonitor final : public PluginMonitor {
- public:
-  bool IsAborted() override { return std::this_thread::get_id() == owner_; }
-
- private:
-  const std::thread::id owner_ = std::this_thread::get_id();
-};
-
-// Aborts once a deadline has passed.
-class TimedMonitor final : public PluginMonitor {
- public:
-  explicit TimedMonitor(std::chrono::milliseconds delay) : deadline_(Clock::now() + delay) {}
-  bool IsAborted() override { return Clock::now() >= deadline_; }
-
- private:
-  const Clock::time_point deadline_;
+  const std::function<bool()> aborted_;
+  const std::string taskId_;
 };
 
 class PluginRunTest : public PluginTest {
@@ -62,10 +41,7 @@ class PluginRunTest : public PluginTest {
                  V3Manifest("python", {"network:dns:config"}, "network", "REMEDIATE:t", {},
                             R"(,"impact":{"supports":true},"validation":{"supports":true})"))
             .c_str());
-    HoxConfigStore::ConfigStoreObjectId id("network", "dns", "config");
-    Document value;
-    ParseDocument(R"({"servers":["10.0.0.1"],"search":["example.org"]})", value);
-    inputs_.push_back({std::make_shared<HoxConfigStore::ConfigStoreObject>(id, value), nullptr, "SET"});
+    inputs_.push_back({Object({"network", "dns", "config"}, R"({"servers":["10.0.0.1"]})"), nullptr, "SET"});
   }
 
   // Installs a shell script as the script runner. `body` runs with $root
@@ -77,7 +53,7 @@ class PluginRunTest : public PluginTest {
                              body + "\n");
     ::chmod(root.Path(path).c_str(), 0755);
   }
-  ErrorInfo Apply(std::shared_ptr<PluginMonitor> monitor = std::make_shared<CountingMonitor>(1 << 30)) {
+  ErrorInfo Apply(std::shared_ptr<PluginMonitor> monitor = std::make_shared<Monitor>()) {
     return plugin_->Apply(inputs_, "ctx", monitor);
   }
 
@@ -85,17 +61,17 @@ class PluginRunTest : public PluginTest {
   std::vector<DesiredConfigInput> inputs_;
 };
 
-constexpr const char* kSuccess = R"(echo '{"id":"","args":[],"message":""}' > "$out")";
-
-TEST_F(PluginRunTest, ASuccessfulRunReturnsTheResultFile) {
+TEST_F(PluginRunTest, ASuccessfulRunReturnsTheResultFileWithoutASecondLongTail) {
+  // Three runs that each waited out the monitor's poll interval would take
+  // three seconds; the monitor must be woken when the runner is reaped.
   Runner(kSuccess);
-  EXPECT_EQ(Apply(), ErrorInfo());
+  const auto start = Clock::now();
+  for (int i = 0; i < 3; ++i) EXPECT_EQ(Apply(), ErrorInfo());
+  EXPECT_LT(Clock::now() - start, std::chrono::milliseconds(2500));
   // The request carried the task and the context and was private.
   PluginRequest request;
   request.Load(PluginRequestPath());
-  EXPECT_EQ(request.GetTaskId(), "task-1");
-  EXPECT_EQ(request.GetClusterContext(), "ctx");
-  EXPECT_EQ(request.GetType(), "APPLY");
+  EXPECT_EQ(request.GetTaskId() + " " + request.GetClusterContext() + " " + request.GetType(), "task-1 ctx APPLY");
   struct stat st;
   ASSERT_EQ(::stat(PluginRequestPath().c_str(), &st), 0);
   EXPECT_EQ(st.st_mode & 0777, 0600u);
@@ -115,10 +91,8 @@ TEST_F(PluginRunTest, ASuccessfulRunReturnsTheResultFile) {
 }
 
 TEST_F(PluginRunTest, RunnerFailuresBecomeUnexpectedErrors) {
-  const struct {
-    const char* body;
-    std::string message;  // a part of the error's message
-  } cases[] = {
+  const std::pair<const char*, std::string> cases[] = {
+      // The runner's body, and a part of the error's message.
       {"exit 2", "Config Manager plugin failed: t, pid="},
       {"exit 2", ", status=No such file or directory"},
       {"kill -9 $$", "terminated with signal=9"},
@@ -128,14 +102,14 @@ TEST_F(PluginRunTest, RunnerFailuresBecomeUnexpectedErrors) {
       {R"(echo '{"id":5}' > "$out")", "Invalid JSON"},
       {R"(echo '[]' > "$out")", "Invalid JSON"},
   };
-  for (const auto& c : cases) {
+  for (const auto& [body, message] : cases) {
     // A result left by an earlier run must never be taken for this run's.
     root.WriteFile("/var/tarvik/lifecycle/cm-plugin-output.json", R"({"id":"","args":[],"message":""})");
-    Runner(c.body);
+    Runner(body);
     const ErrorInfo error = Apply();
-    EXPECT_EQ(error.id, kApplyUnexpected) << c.body;
-    EXPECT_EQ(error.args, std::vector<std::string>{"t"}) << c.body;
-    EXPECT_NE(error.message.find(c.message), std::string::npos) << c.body << ": " << error.message;
+    EXPECT_EQ(error.id, kApplyUnexpected) << body;
+    EXPECT_EQ(error.args, std::vector<std::string>{"t"}) << body;
+    EXPECT_NE(error.message.find(message), std::string::npos) << body << ": " << error.message;
   }
   std::filesystem::remove(root.Path("/usr/lib/tarvik/configmanager/bin/py_plugin_runner"));
   EXPECT_EQ(Apply().message, "Failed to fork plugin runner. No such file or directory");
@@ -149,32 +123,26 @@ TEST_F(PluginRunTest, RunnerFailuresBecomeUnexpectedErrors) {
   EXPECT_FALSE(validation.error.message.empty());
 }
 
-TEST_F(PluginRunTest, AnAbortTerminatesASleepingRunnerWithinAboutASecond) {
+TEST_F(PluginRunTest, AnAbortEndsTheRunWhetherTheRunnerSleepsOrHasExited) {
+  // A sleeping runner is terminated within about a second of the abort.
   Runner("touch \"$root/started\"; exec /bin/sleep 30");
   const auto start = Clock::now();
-  const ErrorInfo error = Apply(std::make_shared<TimedMonitor>(std::chrono::milliseconds(200)));
-  const auto elapsed = Clock::now() - start;
+  const ErrorInfo error = Apply(std::make_shared<Monitor>([deadline = start + std::chrono::milliseconds(200)] {
+    return Clock::now() >= deadline;
+  }));
+  EXPECT_LT(Clock::now() - start, std::chrono::milliseconds(2500));
   EXPECT_EQ(error.id, kApplyAborted);
   EXPECT_EQ(error.args, std::vector<std::string>{"t"});
-  EXPECT_LT(elapsed, std::chrono::milliseconds(2500));
   EXPECT_TRUE(std::filesystem::exists(root.Path("/started")));
-}
 
-TEST_F(PluginRunTest, AnAbortAfterTheRunnerExitedStillAbortsTheRun) {
-  // The runner succeeds and is never signalled; the abort is noticed only
-  // when the run is judged.
+  // An abort said only to the calling thread: the run's monitor thread never
+  // sees it and the runner succeeds; the judgement after reaping does.
   Runner("touch \"$root/finished\"; " + std::string(kSuccess));
-  EXPECT_EQ(Apply(std::make_shared<LateAbortMonitor>()).id, kApplyAborted);
+  EXPECT_EQ(Apply(std::make_shared<Monitor>([owner = std::this_thread::get_id()] {
+              return std::this_thread::get_id() == owner;
+            })).id,
+            kApplyAborted);
   EXPECT_TRUE(std::filesystem::exists(root.Path("/finished")));
-}
-
-TEST_F(PluginRunTest, ASuccessfulRunHasNoSecondLongTail) {
-  // Three runs that each waited out the monitor's poll interval would take
-  // three seconds; the monitor must be woken when the runner is reaped.
-  Runner(kSuccess);
-  const auto start = Clock::now();
-  for (int i = 0; i < 3; ++i) EXPECT_EQ(Apply(), ErrorInfo());
-  EXPECT_LT(Clock::now() - start, std::chrono::milliseconds(2500));
 }
 
 TEST_F(PluginRunTest, ACppPluginWithoutModuleFailsBeforeAnythingIsWritten) {
@@ -207,13 +175,11 @@ TEST_F(PluginRunTest, RunsOfTwoProcessesNeverOverlap) {
   Runner(R"sh(id=$(/bin/sed -n 's/.*"taskId":"\([^"]*\)".*/\1/p' "$root/var/tarvik/lifecycle/cm-plugin-input.json")
 echo "start $id" >> "$root/log"; /bin/sleep 0.3; echo "end $id" >> "$root/log")sh"
          "\n" + std::string(kSuccess));
+  const auto never = [] { return false; };
   const pid_t child = ::fork();
   ASSERT_GE(child, 0);
-  if (child == 0) {
-    const ErrorInfo error = plugin_->Apply(inputs_, "", std::make_shared<CountingMonitor>(1 << 30, "child"));
-    ::_exit(error.id.empty() ? 0 : 1);
-  }
-  const ErrorInfo error = plugin_->Apply(inputs_, "", std::make_shared<CountingMonitor>(1 << 30, "parent"));
+  if (child == 0) ::_exit(plugin_->Apply(inputs_, "", std::make_shared<Monitor>(never, "child")).id.empty() ? 0 : 1);
+  const ErrorInfo error = plugin_->Apply(inputs_, "", std::make_shared<Monitor>(never, "parent"));
   int status = 0;
   ASSERT_EQ(::waitpid(child, &status, 0), child);
   EXPECT_EQ(error, ErrorInfo());

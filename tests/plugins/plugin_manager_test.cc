@@ -8,6 +8,7 @@ namespace hoxcm_test {
 namespace {
 
 using namespace HoxConfigManager;
+using HoxConfigStore::ConfigStoreObjectId;
 
 std::size_t Position(const std::vector<std::string>& order, const std::string& name) {
   const auto it = std::find(order.begin(), order.end(), name);
@@ -15,51 +16,32 @@ std::size_t Position(const std::vector<std::string>& order, const std::string& n
   return static_cast<std::size_t>(it - order.begin());
 }
 
-int LoadCode(PluginType type) {
-  try {
-    PluginManager manager(type);
-  } catch (const HoxConfigStore::ConfigStoreException& e) {
-    return e.GetErrorCode();
+// Each name of `chain` comes before the next in `order`.
+void ExpectChain(const std::vector<std::string>& order, const std::vector<std::string>& chain) {
+  for (std::size_t i = 1; i < chain.size(); ++i) {
+    EXPECT_LT(Position(order, chain[i - 1]), Position(order, chain[i])) << chain[i - 1] << " before " << chain[i];
   }
-  return 0;
 }
 
 using PluginManagerTest = PluginTest;
 
-TEST_F(PluginManagerTest, NoManifestsGiveAnEmptyRegistryAndTheGroupOrder) {
+TEST_F(PluginManagerTest, OperationsRunInsideTheirGroupAfterWhatTheyDependOn) {
   // Files that only look like manifests are not read at all.
   Manifest("a/plugin.JSON", "{");
   Manifest("a/plugin.json.bak", "{");
-  PluginManager manager(APPLY);
-  EXPECT_TRUE(manager.GetPlugins().empty());
-  EXPECT_TRUE(manager.List().empty());
-  EXPECT_EQ(manager.GetDependencies(), (std::vector<std::string>{"system-early", "network", "storage", "system"}));
+  EXPECT_TRUE(PluginManager(APPLY).GetPlugins().empty());
+  EXPECT_EQ(PluginManager(APPLY).GetDependencies(),
+            (std::vector<std::string>{"system-early", "network", "storage", "system"}));
   EXPECT_TRUE(PluginManager(IMPACT).GetDependencies().empty());
-}
 
-TEST_F(PluginManagerTest, AnOperationRunsInsideItsGroup) {
-  // Given a "network" plugin providing A, A comes after "system-early" and
-  // before "network"; "storage" and "system" follow.
-  Manifest("a/plugin.json", V3Manifest("python", {"network:dns:config"}, "network", "A", {}));
-  const auto order = PluginManager(APPLY).GetDependencies();
-  ASSERT_EQ(order.size(), 5u);
-  EXPECT_LT(Position(order, "system-early"), Position(order, "A"));
-  EXPECT_LT(Position(order, "A"), Position(order, "network"));
-  EXPECT_LT(Position(order, "network"), Position(order, "storage"));
-  EXPECT_LT(Position(order, "storage"), Position(order, "system"));
-}
-
-TEST_F(PluginManagerTest, DependsChainsAcrossPluginsAndVersions) {
   Manifest("b/plugin.json", V3Manifest("python", {"network:dns:config"}, "network", "B", {"C"}));
   Manifest("c/plugin.json", V3Manifest("python", {"network:routes:static"}, "network", "C", {}));
   Manifest("services/time/ntp/p.json",
            R"({"version":2,"type":"python","apply":{"boot":false,"apply_group":"system",
                "operations":{"SET":{"provides":"SET:ntp","depends":["B"]}}}})");
   const auto order = PluginManager(APPLY).GetDependencies();
-  EXPECT_LT(Position(order, "C"), Position(order, "B"));
-  EXPECT_LT(Position(order, "B"), Position(order, "network"));
-  EXPECT_LT(Position(order, "storage"), Position(order, "SET:ntp"));
-  EXPECT_LT(Position(order, "SET:ntp"), Position(order, "system"));
+  EXPECT_EQ(order.size(), 7u);
+  ExpectChain(order, {"system-early", "C", "B", "network", "storage", "SET:ntp", "system"});
 }
 
 TEST_F(PluginManagerTest, OrderFailuresBecomeTheGraphError) {
@@ -76,31 +58,31 @@ TEST_F(PluginManagerTest, OrderFailuresBecomeTheGraphError) {
   for (const auto& c : cases) {
     std::filesystem::remove_all(root.Path(kModules));
     for (const auto& [path, text] : c.manifests) Manifest(path, text);
-    EXPECT_EQ(LoadCode(APPLY), PluginDependencyGraphFailed) << c.what;
-    EXPECT_EQ(LoadCode(APPLY_BOOT), PluginDependencyGraphFailed) << c.what;
+    for (PluginType type : {APPLY, APPLY_BOOT}) {
+      EXPECT_EQ(ThrownBy([&] { PluginManager m(type); }).code, PluginDependencyGraphFailed) << c.what;
+    }
     // Managers that never order apply operations do not care.
-    EXPECT_EQ(LoadCode(IMPACT), 0) << c.what;
+    EXPECT_EQ(ThrownBy([] { PluginManager m(IMPACT); }).code, 0) << c.what;
   }
 }
 
 TEST_F(PluginManagerTest, FindReturnsEveryOwnerAndKeepsOnlyPluginsOfTheKind) {
-  const std::string impact = R"(,"impact":{"supports":true})";
-  const std::string a = Manifest("a/plugin.json", V3Manifest("python", {"network:dns:config"}, "network", "A", {}, impact));
-  const std::string b = Manifest("b/plugin.json",
-                                 V3Manifest("python", {"network:dns:config", "network:routes:static"}, "network", "B", {}));
+  Manifest("a/plugin.json",
+           V3Manifest("python", {"network:dns:config"}, "network", "A", {}, R"(,"impact":{"supports":true})"));
+  Manifest("b/plugin.json", V3Manifest("python", {"network:dns:config", "network:routes:static"}, "network", "B", {}));
   PluginManager apply(APPLY);
-  const auto owners = apply.Find(HoxConfigStore::ConfigStoreObjectId("network", "dns", "config", "ignored"));
+  const auto owners = apply.Find(ConfigStoreObjectId("network", "dns", "config", "ignored"));
   ASSERT_EQ(owners.size(), 2u);
   std::vector<std::string> ids = {owners[0]->GetId(), owners[1]->GetId()};
   std::sort(ids.begin(), ids.end());
   EXPECT_EQ(ids, (std::vector<std::string>{"a", "b"}));
   EXPECT_EQ(apply.List().size(), 3u);
-  EXPECT_TRUE(apply.Find(HoxConfigStore::ConfigStoreObjectId("storage", "nfs", "mounts")).empty());
+  EXPECT_TRUE(apply.Find(ConfigStoreObjectId("storage", "nfs", "mounts")).empty());
 
-  PluginManager impactManager(IMPACT);
-  ASSERT_EQ(impactManager.GetPlugins().size(), 1u);
-  EXPECT_EQ(impactManager.GetPlugins()[0]->GetId(), "a");
-  EXPECT_TRUE(impactManager.Find(HoxConfigStore::ConfigStoreObjectId("network", "routes", "static")).empty());
+  PluginManager impact(IMPACT);
+  ASSERT_EQ(impact.GetPlugins().size(), 1u);
+  EXPECT_EQ(impact.GetPlugins()[0]->GetId(), "a");
+  EXPECT_TRUE(impact.Find(ConfigStoreObjectId("network", "routes", "static")).empty());
 }
 
 TEST_F(PluginManagerTest, SamplePluginsChainEveryApplyKey) {
@@ -116,32 +98,27 @@ TEST_F(PluginManagerTest, SamplePluginsChainEveryApplyKey) {
       for (const char* action : {"SET", "ADD", "DELETE"}) Position(order, std::string(action) + ":" + plugin->GetId());
     }
   }
-  EXPECT_LT(Position(order, "REMEDIATE:hox"), Position(order, "REMEDIATE:system:identity"));
-  EXPECT_LT(Position(order, "REMEDIATE:system:identity"), Position(order, "REMEDIATE:network"));
-  EXPECT_LT(Position(order, "REMEDIATE:network"), Position(order, "REMEDIATE:storage"));
-  EXPECT_LT(Position(order, "REMEDIATE:storage"), Position(order, "REMEDIATE:system:kernel"));
-  EXPECT_LT(Position(order, "REMEDIATE:network"), Position(order, "SET:services:time:ntp"));
-  EXPECT_LT(Position(order, "REMEDIATE:services:syslog"), Position(order, "REMEDIATE:quorlet"));
+  ExpectChain(order, {"REMEDIATE:hox", "REMEDIATE:system:identity", "REMEDIATE:network", "REMEDIATE:storage",
+                      "REMEDIATE:system:kernel"});
+  ExpectChain(order, {"REMEDIATE:network", "SET:services:time:ntp"});
+  ExpectChain(order, {"REMEDIATE:services:syslog", "REMEDIATE:quorlet"});
 }
 
 TEST_F(PluginManagerTest, AThousandPluginsLoadAndOrder) {
   // Given 1,000 plugins in one group, each depending on the one before.
+  std::vector<std::string> chain;
   for (int i = 0; i < 1000; ++i) {
-    const std::string name = "p" + std::to_string(i);
-    std::vector<std::string> depends;
-    if (i > 0) depends.push_back("P" + std::to_string(i - 1));
-    Manifest(name + "/plugin.json",
-             V3Manifest("python", {"storage:nfs:mounts"}, "storage", "P" + std::to_string(i), depends));
+    chain.push_back("P" + std::to_string(i));
+    Manifest("p" + std::to_string(i) + "/plugin.json",
+             V3Manifest("python", {"storage:nfs:mounts"}, "storage", chain.back(),
+                        i ? std::vector<std::string>{chain[i - 1]} : std::vector<std::string>{}));
   }
   PluginManager manager(APPLY);
-  EXPECT_EQ(manager.GetPlugins().size(), 1000u);
-  EXPECT_EQ(manager.Find(HoxConfigStore::ConfigStoreObjectId("storage", "nfs", "mounts")).size(), 1000u);
+  EXPECT_EQ(manager.Find(ConfigStoreObjectId("storage", "nfs", "mounts")).size(), 1000u);
   const auto order = manager.GetDependencies();
   ASSERT_EQ(order.size(), 1004u);
-  for (int i = 1; i < 1000; ++i) {
-    EXPECT_LT(Position(order, "P" + std::to_string(i - 1)), Position(order, "P" + std::to_string(i)));
-  }
-  EXPECT_LT(Position(order, "P999"), Position(order, "storage"));
+  chain.push_back("storage");
+  ExpectChain(order, chain);
 }
 
 }  // namespace

@@ -1,32 +1,25 @@
-// The request document: its wire format and the runner-side getters.
-#include <functional>
-
+// The documents exchanged with a runner: the request's wire format and its
+// runner-side getters, and the result files, of which nothing malformed
+// may read as success.
 #include "plugins/plugin_fixture.h"
 
 namespace hoxcm_test {
 namespace {
 
 using namespace HoxConfigManager;
-
-std::shared_ptr<HoxConfigStore::ConfigStoreObject> Object(const HoxConfigStore::ConfigStoreObjectId& id,
-                                                          const char* json) {
-  Document value;
-  ParseDocument(json, value);
-  return std::make_shared<HoxConfigStore::ConfigStoreObject>(id, value);
-}
+using HoxConfigStore::ConfigStoreObjectId;
 
 TEST(PluginRequestTest, ApplyRequestsCarryTextsInTheirFixedOrder) {
   TempRoot root;
-  const HoxConfigStore::ConfigStoreObjectId vnic("network", "interfaces", "vnic", "vnic0");
+  const ConfigStoreObjectId vnic("network", "interfaces", "vnic", "vnic0");
   Document drift;
   ParseDocument(R"({"mtu":9000})", drift);
   std::vector<DesiredConfigInput> inputs = {
       {Object(vnic, R"({"name":"vnic0","mtu":9000})"),
        std::make_shared<HoxConfigStore::DriftObject>(vnic, "SET", drift), "SET"},
-      {Object(HoxConfigStore::ConfigStoreObjectId("network", "dns", "config"), R"({"servers":[]})"), nullptr, "ADD"},
+      {Object(ConfigStoreObjectId("network", "dns", "config"), R"({"servers":[]})"), nullptr, "ADD"},
   };
-  PluginRequest request("net", "APPLY", "", 3, inputs);
-  request.Dump(PluginRequestPath(), "task", "cluster");
+  PluginRequest("net", "APPLY", "", 3, inputs).Dump(PluginRequestPath(), "task", "cluster");
   const std::string text = root.ReadFile("/var/tarvik/lifecycle/cm-plugin-input.json");
   EXPECT_EQ(text.substr(0, text.find("\"data\"")), R"({"key":"net","version":3,"type":"APPLY","module":"",)");
   EXPECT_NE(text.find(R"({"operation":"ADD","config":"{\"servers\":[]}","component":"network","group":"dns",)"
@@ -39,7 +32,6 @@ TEST(PluginRequestTest, ApplyRequestsCarryTextsInTheirFixedOrder) {
   loaded.Load(PluginRequestPath());
   EXPECT_EQ(loaded.GetId(), "net");
   EXPECT_EQ(loaded.GetVersion(), 3);
-  EXPECT_EQ(loaded.GetModule(), "");
   const auto data = loaded.GetData();
   ASSERT_EQ(data.size(), 2u);
   EXPECT_EQ(data[0].operation, "SET");
@@ -47,37 +39,35 @@ TEST(PluginRequestTest, ApplyRequestsCarryTextsInTheirFixedOrder) {
   EXPECT_TRUE(data[0].hasDrift);
   EXPECT_FALSE(data[1].hasDrift);
   EXPECT_EQ(data[1].config, R"({"servers":[]})");
-}
 
-TEST(PluginRequestTest, ValidationRequestsCarryValuesAndReferences) {
-  TempRoot root;
-  const HoxConfigStore::ConfigStoreObjectId host("system", "identity", "hostname");
-  PluginRequest request("net", "VALIDATE", "libnet.so", 3,
-                        {Object(HoxConfigStore::ConfigStoreObjectId("network", "dns", "config"), R"({"a":1})")},
-                        {Object(host, R"({"hostname":"h"})")});
-  request.Dump(PluginRequestPath(), "", "");
-  PluginRequest loaded;
+  // The validation form carries values and references.
+  const ConfigStoreObjectId host("system", "identity", "hostname");
+  PluginRequest("net", "VALIDATE", "libnet.so", 3, {Object(ConfigStoreObjectId("network", "dns", "config"), "{}")},
+                {Object(host, R"({"hostname":"h"})")})
+      .Dump(PluginRequestPath(), "", "");
   loaded.Load(PluginRequestPath());
-  EXPECT_EQ(loaded.GetData().at(0).config, R"({"a":1})");
-  EXPECT_EQ(loaded.GetReferences(), std::vector<HoxConfigStore::ConfigStoreObjectId>{host});
+  EXPECT_EQ(loaded.GetModule(), "libnet.so");
+  EXPECT_EQ(loaded.GetData().at(0).config, "{}");
+  EXPECT_EQ(loaded.GetReferences(), std::vector<ConfigStoreObjectId>{host});
   EXPECT_EQ(JsonToString(loaded.GetDocument()["references"][0]["config"]), R"({"hostname":"h"})");
 }
 
 TEST(PluginRequestTest, MissingMembersAreNamed) {
   TempRoot root;
+  using Get = std::function<void(const PluginRequest&)>;
+  const std::string missing = "The PluginRequest structure does not contain ";
   const struct {
     const char* text;
-    std::function<void(const PluginRequest&)> get;
-    const char* message;
+    Get get;
+    std::string message;
   } cases[] = {
-      {"{}", [](const PluginRequest& r) { r.GetVersion(); }, "The PluginRequest structure does not contain version."},
-      {"{}", [](const PluginRequest& r) { r.GetType(); }, "The PluginRequest structure does not contain type"},
-      {"{}", [](const PluginRequest& r) { r.GetModule(); }, "The PluginRequest structure does not contain module"},
-      {"{}", [](const PluginRequest& r) { r.GetId(); }, "The PluginRequest structure does not contain key"},
-      {"{}", [](const PluginRequest& r) { r.GetTaskId(); }, "The PluginRequest structure does not contain taskId"},
-      {"{}", [](const PluginRequest& r) { r.GetClusterContext(); },
-       "The PluginRequest structure does not contain context"},
-      {"{}", [](const PluginRequest& r) { r.GetData(); }, "The PluginRequest structure does not contain data"},
+      {"{}", [](const PluginRequest& r) { r.GetVersion(); }, missing + "version."},
+      {"{}", [](const PluginRequest& r) { r.GetType(); }, missing + "type"},
+      {"{}", [](const PluginRequest& r) { r.GetModule(); }, missing + "module"},
+      {"{}", [](const PluginRequest& r) { r.GetId(); }, missing + "key"},
+      {"{}", [](const PluginRequest& r) { r.GetTaskId(); }, missing + "taskId"},
+      {"{}", [](const PluginRequest& r) { r.GetClusterContext(); }, missing + "context"},
+      {"{}", [](const PluginRequest& r) { r.GetData(); }, missing + "data"},
       {R"({"version":"3"})", [](const PluginRequest& r) { r.GetVersion(); }, "Invalid JSON"},
       {"[]", [](const PluginRequest& r) { r.GetId(); }, "Invalid JSON"},
       {R"({"data":[{"component":1}]})", [](const PluginRequest& r) { r.GetData(); }, "Invalid JSON"},
@@ -86,13 +76,42 @@ TEST(PluginRequestTest, MissingMembersAreNamed) {
     root.WriteFile("/r.json", c.text);
     PluginRequest request;
     request.Load(root.Path("/r.json"));
-    try {
-      c.get(request);
-      ADD_FAILURE() << c.message;
-    } catch (const std::exception& e) {
-      EXPECT_STREQ(e.what(), c.message);
-    }
+    const Thrown thrown = ThrownBy([&] { c.get(request); });
+    EXPECT_NE(thrown.code, 0) << c.message;
+    EXPECT_EQ(thrown.message, c.message);
   }
+}
+
+TEST(ResultReadersTest, ErrorRecordsRoundTrip) {
+  const ErrorInfo error("com.x.failed", {"a \"quoted\" arg", "ü"}, "line\nbreak");
+  ErrorInfo back;
+  back.Deserialize(error.Serialize());
+  EXPECT_EQ(back, error);
+  back.Deserialize(R"({"id":""})");
+  EXPECT_EQ(back, ErrorInfo());
+}
+
+TEST(ResultReadersTest, MalformedResultsAreRefused) {
+  TempRoot root;
+  const std::string path = root.Path("/r.json");
+  const std::function<void()> readers[] = {[&] { ErrorInfo::Load(path); }, [&] { ImpactPluginResult::Load(path); },
+                                           [&] { ValidationPluginResult::Load(path); }};
+  const std::pair<const char*, int> cases[] = {
+      {"", 0}, {"{", 0}, {"{}", 0}, {R"({"id":1})", 0}, {R"({"id":"","args":[1]})", 0}, {R"({"id":"","args":"a"})", 0},
+      {"{}", 1}, {R"({"impacts":{}})", 1}, {R"({"impacts":[{"impact":3}]})", 1}, {R"({"impacts":[{}]})", 1},
+      {R"({"impacts":[],"error":[]})", 1},
+      {"{}", 2}, {R"({"errors":[{"errors":[]}]})", 2}, {R"({"errors":[{"field":"f"}]})", 2},
+      {R"({"errors":[{"field":"f","errors":[{}]}]})", 2},
+  };
+  for (const auto& [text, reader] : cases) {
+    root.WriteFile("/r.json", text);
+    EXPECT_GT(ThrownBy(readers[reader]).code, 0) << reader << ": " << text;
+  }
+  EXPECT_THROW(ErrorInfo::Load(root.Path("/missing.json")), std::runtime_error);
+  // A failure report stands in for the verdicts.
+  root.WriteFile("/r.json", R"({"error":{"id":"x","args":["a"],"message":"m"}})");
+  EXPECT_EQ(ImpactPluginResult::Load(path).error, ErrorInfo("x", {"a"}, "m"));
+  EXPECT_EQ(ValidationPluginResult::Load(path).error, ErrorInfo("x", {"a"}, "m"));
 }
 
 }  // namespace

@@ -1,7 +1,12 @@
 // One suite, run against both runners: the same plugin written for each
 // interface must give the same results, failures included. Then the sample
-// plugins, end to end.
-#include <filesystem>
+// plugins end to end: the apply tasks of a changed document, grouped per
+// plugin and run in the registry's order, leave the host compliant with
+// that document and its files rewritten.
+#include <unordered_map>
+
+#include <hoxcm/drift.h>
+#include <hoxcm/operations.h>
 
 #include "plugins/plugin_fixture.h"
 
@@ -12,12 +17,7 @@ using namespace HoxConfigManager;
 using HoxConfigStore::ConfigStoreObjectId;
 
 const ConfigStoreObjectId kDns("network", "dns", "config");
-
-std::shared_ptr<HoxConfigStore::ConfigStoreObject> Object(const ConfigStoreObjectId& id, const std::string& json) {
-  Document value;
-  ParseDocument(json, value);
-  return std::make_shared<HoxConfigStore::ConfigStoreObject>(id, value);
-}
+constexpr const char* kApplyUnexpected = "com.tarvik.hox.settings.apply.plugin.unexpected.error";
 
 std::string StoredUserConfig(const ConfigStoreObjectId& id) {
   return JsonToString(HoxConfigStore::GetCurrentConfigInternal(HoxConfigStore::GetDBStore(), id.component, id.group,
@@ -32,22 +32,17 @@ class RunnerConformanceTest : public PluginTest, public ::testing::WithParamInte
     root.WriteFile(dir + "plugin.json",
                    V3Manifest(GetParam(), {"network:dns:config"}, "network", "REMEDIATE:conformance", {},
                               R"(,"impact":{"supports":true},"validation":{"supports":true})"));
-    if (GetParam() == "c++") {
-      std::filesystem::copy_file(BuildPath("tests/plugins/libconformance.so"), root.Path(dir + "libconformance.so"));
-      moduleFile_ = root.Path(dir + "libconformance.so");
-    } else {
-      std::filesystem::copy_file(SourcePath("tests/plugins/conformance_plugin.py"), root.Path(dir + "plugin.py"));
-      moduleFile_ = root.Path(dir + "plugin.py");
-    }
+    moduleFile_ = root.Path(dir + (GetParam() == "c++" ? "libconformance.so" : "plugin.py"));
+    std::filesystem::copy_file(GetParam() == "c++" ? BuildPath("tests/plugins/libconformance.so")
+                                                   : SourcePath("tests/plugins/conformance_plugin.py"),
+                               moduleFile_);
     plugin_ = std::make_shared<Plugin>(root.Path(dir + "plugin.json").c_str());
   }
 
   ErrorInfo Apply(const std::vector<DesiredConfigInput>& inputs) {
     return plugin_->Apply(inputs, "", PluginMonitor::Dummy());
   }
-  std::vector<DesiredConfigInput> Dns(const std::string& json, const std::string& action = "SET") {
-    return {{Object(kDns, json), nullptr, action}};
-  }
+  std::vector<DesiredConfigInput> Dns(const std::string& json) { return {{Object(kDns, json), nullptr, "SET"}}; }
 
   std::shared_ptr<Plugin> plugin_;
   std::string moduleFile_;
@@ -69,29 +64,36 @@ TEST_P(RunnerConformanceTest, ASuccessfulApplyIsStoredInOneGo) {
   EXPECT_EQ(StoredUserConfig(vnic).find("vnic1"), std::string::npos);
 }
 
-TEST_P(RunnerConformanceTest, PluginErrorsComeBackAsTheyWereReported) {
+TEST_P(RunnerConformanceTest, FailuresComeBackAsReportedOrAsTheRunnersErrorNumber) {
   EXPECT_EQ(Apply(Dns(R"({"behaviour":"fail"})")), ErrorInfo("conformance.failed", {"a1"}, "failed on purpose"));
   // Nothing of a failed apply reaches the store.
   EXPECT_EQ(StoredUserConfig(kDns).find("behaviour"), std::string::npos);
   EXPECT_EQ(plugin_->Impact(Dns(R"({"behaviour":"fail"})"), "", PluginMonitor::Dummy()).error.id,
             "conformance.failed");
-}
 
-TEST_P(RunnerConformanceTest, RunnerFailuresExitWithTheirErrorNumber) {
-  const struct {
-    const char* config;
-    const char* status;
-  } cases[] = {
-      {R"({"behaviour":"throw"})", "status=State not recoverable"},
-      {R"({"behaviour":"garbage"})", "status=Bad message"},
+  // The module put in place of the plugin's ("" keeps it, "-" removes it),
+  // the data, and the status text of the runner's exit.
+  struct Case {
+    std::string library, config, status;
   };
-  for (const auto& c : cases) {
+  std::vector<Case> all = {{"", R"({"behaviour":"throw"})", "status=State not recoverable"},
+                           {"", R"({"behaviour":"garbage"})", "status=Bad message"}};
+  // The interface version belongs to the C interface.
+  if (GetParam() == "c++") {
+    all.push_back({"libwrongabi.so", "{}", "status=Protocol error"});
+    all.push_back({"libnodescribe.so", "{}", "status=Function not implemented"});
+  }
+  all.push_back({"-", "{}", "status=Can not access a needed shared library"});
+  for (const Case& c : all) {
+    if (c.library == "-") std::filesystem::remove(moduleFile_);
+    if (c.library.size() > 1) {
+      std::filesystem::copy_file(BuildPath("tests/plugins/" + c.library), moduleFile_,
+                                 std::filesystem::copy_options::overwrite_existing);
+    }
     const ErrorInfo error = Apply(Dns(c.config));
-    EXPECT_EQ(error.id, "com.tarvik.hox.settings.apply.plugin.unexpected.error") << c.config;
+    EXPECT_EQ(error.id, kApplyUnexpected) << c.library << c.config;
     EXPECT_NE(error.message.find(c.status), std::string::npos) << error.message;
   }
-  std::filesystem::remove(moduleFile_);
-  EXPECT_NE(Apply(Dns("{}")).message.find("status=Can not access a needed shared library"), std::string::npos);
 }
 
 TEST_P(RunnerConformanceTest, ImpactAndValidationResults) {
@@ -109,30 +111,8 @@ TEST_P(RunnerConformanceTest, ImpactAndValidationResults) {
   EXPECT_EQ(validation.errors[0].errors.at(0), ErrorInfo("conformance.bad", {"x"}, "bad"));
 }
 
-// Shared objects only: the interface version belongs to the C interface.
-class SharedObjectRunnerTest : public RunnerConformanceTest {};
-
-TEST_P(SharedObjectRunnerTest, RefusesSharedObjectsOfAnotherInterface) {
-  const struct {
-    const char* library;
-    const char* status;
-  } cases[] = {
-      {"libwrongabi.so", "status=Protocol error"},
-      {"libnodescribe.so", "status=Function not implemented"},
-  };
-  for (const auto& c : cases) {
-    std::filesystem::copy_file(BuildPath(std::string("tests/plugins/") + c.library), moduleFile_,
-                               std::filesystem::copy_options::overwrite_existing);
-    const ErrorInfo error = Apply(Dns("{}"));
-    EXPECT_EQ(error.id, "com.tarvik.hox.settings.apply.plugin.unexpected.error") << c.library;
-    EXPECT_NE(error.message.find(c.status), std::string::npos) << error.message;
-  }
-}
-
 INSTANTIATE_TEST_SUITE_P(BothRunners, RunnerConformanceTest, ::testing::Values("c++", "python"),
                          [](const auto& info) { return info.param == "c++" ? "Cpp" : "Python"; });
-INSTANTIATE_TEST_SUITE_P(CppRunner, SharedObjectRunnerTest, ::testing::Values("c++"),
-                         [](const auto&) { return "Cpp"; });
 
 class SamplePluginsTest : public PluginTest {
  protected:
@@ -141,34 +121,11 @@ class SamplePluginsTest : public PluginTest {
     root.InstallSamplePlugins();
   }
   std::shared_ptr<Plugin> Owner(PluginType type, const ConfigStoreObjectId& id) {
-    PluginManager manager(type);
-    const auto owners = manager.Find(id);
-    EXPECT_EQ(owners.size(), 1u);
+    const auto owners = PluginManager(type).Find(id);
+    EXPECT_EQ(owners.size(), 1u) << id.toString();
     return owners.empty() ? nullptr : owners[0];
   }
 };
-
-TEST_F(SamplePluginsTest, ApplyWritesTheHostFiles) {
-  const struct {
-    ConfigStoreObjectId id;
-    std::string value;
-    std::string file;
-    std::string content;
-  } cases[] = {
-      {kDns, R"({"servers":["10.0.0.1","10.0.0.2"],"search":["example.org"]})", "/etc/resolv.conf",
-       "# written by the network plugin\nsearch example.org\nnameserver 10.0.0.1\nnameserver 10.0.0.2\n"},
-      {{"system", "identity", "hostname"}, R"({"hostname":"esx1","domain":"example.org"})", "/etc/hostname",
-       "esx1.example.org\n"},
-      {{"services", "time", "ntp"}, R"({"enabled":true,"servers":["ntp1"]})", "/etc/ntp.conf",
-       "# written by the ntp plugin\nserver ntp1 iburst\n"},
-  };
-  for (const auto& c : cases) {
-    const auto plugin = Owner(APPLY, c.id);
-    ASSERT_TRUE(plugin);
-    EXPECT_EQ(plugin->Apply({{Object(c.id, c.value), nullptr, "SET"}}, "", PluginMonitor::Dummy()), ErrorInfo());
-    EXPECT_EQ(root.ReadFile(c.file), c.content);
-  }
-}
 
 TEST_F(SamplePluginsTest, ImpactAndValidationVerdicts) {
   const ConfigStoreObjectId rule("network", "firewall", "rules", "ssh");
@@ -177,16 +134,69 @@ TEST_F(SamplePluginsTest, ImpactAndValidationVerdicts) {
   ASSERT_EQ(impact.impacts.size(), 1u);
   EXPECT_EQ(impact.impacts[0].impact, 1);
 
-  const auto dns = Owner(VALIDATE, kDns)->Validate({Object(kDns, R"({"servers":["10.0.0.1","fe80::1"]})")}, {}, "",
-                                                   PluginMonitor::Dummy());
-  ASSERT_EQ(dns.errors.size(), 1u);
-  EXPECT_EQ(dns.errors[0].field, "/network/dns/config/servers/1");
-
   const ConfigStoreObjectId host("system", "identity", "hostname");
-  const auto name = Owner(VALIDATE, host)->Validate({Object(host, R"({"hostname":"-bad_name"})")}, {}, "",
-                                                    PluginMonitor::Dummy());
-  ASSERT_EQ(name.errors.size(), 1u);
-  EXPECT_EQ(name.errors[0].field, "/system/identity/hostname/hostname");
+  const std::pair<std::shared_ptr<HoxConfigStore::ConfigStoreObject>, const char*> cases[] = {
+      {Object(kDns, R"({"servers":["10.0.0.1","fe80::1"]})"), "/network/dns/config/servers/1"},
+      {Object(host, R"({"hostname":"-bad_name"})"), "/system/identity/hostname/hostname"},
+  };
+  for (const auto& [object, field] : cases) {
+    const auto verdict = Owner(VALIDATE, object->GetConfigStoreObjectId())->Validate({object}, {}, "",
+                                                                                     PluginMonitor::Dummy());
+    ASSERT_EQ(verdict.errors.size(), 1u) << field;
+    EXPECT_EQ(verdict.errors[0].field, field);
+  }
+}
+
+TEST_F(SamplePluginsTest, ApplyingADocumentMakesTheHostCompliantAndWritesItsFiles) {
+  for (const auto& [kind, file] : {std::pair{HoxConfigStore::ConfigKind::Default, "default-config.json"},
+                                   std::pair{HoxConfigStore::ConfigKind::User, "user-config.json"}}) {
+    Document doc;
+    CreateDocumentFromFile(SourcePath(std::string("data/sample-host/") + file).c_str(), doc);
+    HoxConfigStore::ImportConfiguration(kind, doc);
+  }
+  Document desired = ExtractCurrentConfiguration();
+  Allocator& a = desired.GetAllocator();
+  Value& profile = desired.HasMember("profile") ? desired["profile"] : desired;
+  profile["network"]["dns"]["config"]["servers"].SetArray().PushBack("192.0.2.53", a).PushBack("192.0.2.54", a);
+  profile["system"]["identity"]["hostname"]["hostname"].SetString("renamed", a);
+  profile["services"]["time"]["ntp"]["servers"].SetArray().PushBack("ntp.example.org", a);
+  profile["services"]["time"]["ntp"]["enabled"].SetBool(true);
+  Value& users = profile["security"]["accounts"]["users"];
+  users.Erase(users.End() - 1);  // a deletion
+  Document check;
+  check.CopyFrom(desired, check.GetAllocator());
+  ComplianceResult before;
+  CheckCompliance(check, before);
+  ASSERT_FALSE(before.compliant);
+
+  // What the apply operation does with its tasks, reduced to the plugin
+  // framework's part: one group per "<action>:<plugin id>", run in the
+  // registry's order.
+  PluginManager manager(APPLY);
+  std::unordered_map<std::string, TaskMap> groups;
+  for (const DesiredConfigInput& task : GenerateApplyTasks(desired)) {
+    const auto owners = manager.Find(task.object->GetConfigStoreObjectId());
+    ASSERT_EQ(owners.size(), 1u) << task.object->GetConfigStoreObjectId().toString();
+    const std::string key = (owners[0]->GetVersion() == 3 ? "REMEDIATE" : task.action) + ":" + owners[0]->GetId();
+    groups.try_emplace(key, TaskMap{owners[0], {}}).first->second.inputs.push_back(task);
+  }
+  std::size_t ran = 0;
+  for (const std::string& name : manager.GetDependencies()) {
+    const auto group = groups.find(name);
+    if (group == groups.end()) continue;
+    EXPECT_EQ(group->second.plugin->Apply(group->second.inputs, "", PluginMonitor::Dummy()), ErrorInfo()) << name;
+    ++ran;
+  }
+  EXPECT_EQ(ran, groups.size()) << "a group is missing from the order";
+
+  ComplianceResult after;
+  check.CopyFrom(desired, check.GetAllocator());
+  CheckCompliance(check, after);
+  EXPECT_TRUE(after.compliant) << JsonToString(after.document);
+  EXPECT_EQ(root.ReadFile("/etc/resolv.conf"), "# written by the network plugin\nsearch lab.example.com example.com\n"
+                                               "nameserver 192.0.2.53\nnameserver 192.0.2.54\n");
+  EXPECT_EQ(root.ReadFile("/etc/hostname"), "renamed.lab.example.com\n");
+  EXPECT_EQ(root.ReadFile("/etc/ntp.conf"), "# written by the ntp plugin\nserver ntp.example.org iburst\n");
 }
 
 }  // namespace

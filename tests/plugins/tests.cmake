@@ -3,8 +3,6 @@ hoxcm_add_test(plugins_test
   plugins/plugin_manager_test.cc
   plugins/plugin_request_test.cc
   plugins/plugin_launcher_test.cc
-  plugins/apply_compliance_test.cc
-  plugins/result_readers_test.cc
   plugins/runner_conformance_test.cc)
 # The runners, the sample plugins and the conformance plugin must be built
 # before the tests that start them.
