@@ -15,7 +15,8 @@
 namespace {
 
 using HoxConfigManager::Document;
-using HoxConfigManager::Value;
+
+enum Kind { kApply, kImpact, kValidate };
 
 char* Copy(const std::string& text) {
   char* out = static_cast<char*>(std::malloc(text.size() + 1));
@@ -23,75 +24,43 @@ char* Copy(const std::string& text) {
   return out;
 }
 
-struct Item {
-  std::string operation, component, group, key;
-  Document config;
-};
-
-std::vector<Item> Items(const char* text, std::string* behaviour) {
+char* Run(Kind kind, const char* text, const char* root) {
   Document request;
   HoxConfigManager::ParseDocument(text, request);
-  std::vector<Item> items;
-  for (const Value& e : request["data"].GetArray()) {
-    Item item;
-    if (e.HasMember("operation")) item.operation = e["operation"].GetString();
-    item.component = e["component"].GetString();
-    item.group = e["group"].GetString();
-    item.key = e["key"].GetString();
-    if (e["config"].IsString()) {
-      HoxConfigManager::ParseDocument(e["config"].GetString(), item.config);
+  const auto& data = request["data"];
+  std::string behaviour = "ok", impacts, errors;
+  for (rapidjson::SizeType i = 0; i < data.Size(); ++i) {
+    Document config;
+    if (data[i]["config"].IsString()) {
+      HoxConfigManager::ParseDocument(data[i]["config"].GetString(), config);
     } else {
-      item.config.CopyFrom(e["config"], item.config.GetAllocator());
+      config.CopyFrom(data[i]["config"], config.GetAllocator());
     }
-    items.push_back(std::move(item));
+    if (i == 0 && config.IsObject() && config.HasMember("behaviour")) behaviour = config["behaviour"].GetString();
+    const std::string c = data[i]["component"].GetString(), g = data[i]["group"].GetString(),
+                      k = data[i]["key"].GetString();
+    const int impact = config.HasMember("impact") ? config["impact"].GetInt() : 0;
+    impacts += std::string(impacts.empty() ? "" : ",") + "{\"impact\":" + std::to_string(impact) +
+               ",\"component\":\"" + c + "\",\"group\":\"" + g + "\",\"key\":\"" + k + "\",\"reason\":\"r\"}";
+    if (!config.HasMember("bad")) continue;
+    errors += std::string(errors.empty() ? "" : ",") + "{\"field\":\"/" + c + "/" + g + "/" + k +
+              "/bad\",\"errors\":[{\"id\":\"conformance.bad\",\"args\":[\"x\"],\"message\":\"bad\"}]}";
   }
-  *behaviour = "ok";
-  if (!items.empty() && items[0].config.IsObject() && items[0].config.HasMember("behaviour")) {
-    *behaviour = items[0].config["behaviour"].GetString();
-  }
-  if (*behaviour == "throw") throw std::runtime_error("thrown on purpose");
-  return items;
-}
-
-char* Apply(const char* request, const char* root) {
-  std::string behaviour;
-  const auto items = Items(request, &behaviour);
+  if (behaviour == "throw") throw std::runtime_error("thrown on purpose");
   if (behaviour == "garbage") return Copy("not json");
+  if (kind == kValidate) return Copy("{\"errors\":[" + errors + "]}");
+  if (kind == kImpact) {
+    return Copy(behaviour == "fail" ? R"({"error":{"id":"conformance.failed","args":[],"message":"m"}})"
+                                    : "{\"impacts\":[" + impacts + "]}");
+  }
   if (behaviour == "fail") return Copy(R"({"id":"conformance.failed","args":["a1"],"message":"failed on purpose"})");
-  std::ofstream(std::string(root) + "/applied") << items.size() << "\n";
+  std::ofstream(std::string(root) + "/applied") << data.Size() << "\n";
   return Copy(R"({"id":"","args":[],"message":""})");
 }
 
-char* Impact(const char* request, const char*) {
-  std::string behaviour;
-  const auto items = Items(request, &behaviour);
-  if (behaviour == "garbage") return Copy("not json");
-  if (behaviour == "fail") return Copy(R"({"error":{"id":"conformance.failed","args":[],"message":"m"}})");
-  std::string out = "{\"impacts\":[";
-  for (std::size_t i = 0; i < items.size(); ++i) {
-    const int impact = items[i].config.HasMember("impact") ? items[i].config["impact"].GetInt() : 0;
-    out += (i ? "," : "") + std::string("{\"impact\":") + std::to_string(impact) + ",\"component\":\"" +
-           items[i].component + "\",\"group\":\"" + items[i].group + "\",\"key\":\"" + items[i].key +
-           "\",\"reason\":\"r\"}";
-  }
-  return Copy(out + "]}");
-}
-
-char* Validate(const char* request, const char*) {
-  std::string behaviour;
-  const auto items = Items(request, &behaviour);
-  if (behaviour == "garbage") return Copy("not json");
-  std::string out = "{\"errors\":[";
-  bool first = true;
-  for (const Item& item : items) {
-    if (!item.config.HasMember("bad")) continue;
-    out += (first ? "" : ",") + std::string("{\"field\":\"/") + item.component + "/" + item.group + "/" + item.key +
-           "/bad\",\"errors\":[{\"id\":\"conformance.bad\",\"args\":[\"x\"],\"message\":\"bad\"}]}";
-    first = false;
-  }
-  return Copy(out + "]}");
-}
-
+char* Apply(const char* request, const char* root) { return Run(kApply, request, root); }
+char* Impact(const char* request, const char* root) { return Run(kImpact, request, root); }
+char* Validate(const char* request, const char* root) { return Run(kValidate, request, root); }
 void Free(char* p) { std::free(p); }
 
 const hoxcm_plugin_table kTable = {HOXCM_PLUGIN_ABI_VERSION, "conformance", Apply, Impact, Validate, Free};

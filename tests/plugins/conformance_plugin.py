@@ -3,6 +3,8 @@ conformance_plugin.cc."""
 
 import os
 
+FAILED = {"id": "conformance.failed", "args": ["a1"], "message": "failed on purpose"}
+
 
 def _items(request, host):
     items = host.items(request)
@@ -16,10 +18,8 @@ def _items(request, host):
 
 def apply(request, host):
     items, behaviour = _items(request, host)
-    if behaviour == "garbage":
-        return "not json"
-    if behaviour == "fail":
-        return {"id": "conformance.failed", "args": ["a1"], "message": "failed on purpose"}
+    if behaviour != "ok":
+        return FAILED if behaviour == "fail" else "not json"
     with open(os.path.join(host.root, "applied"), "w") as f:
         f.write("%d\n" % len(items))
     return None
@@ -27,10 +27,8 @@ def apply(request, host):
 
 def impact(request, host):
     items, behaviour = _items(request, host)
-    if behaviour == "garbage":
-        return "not json"
-    if behaviour == "fail":
-        return {"error": {"id": "conformance.failed", "args": [], "message": "m"}}
+    if behaviour != "ok":
+        return {"error": dict(FAILED, args=[], message="m")} if behaviour == "fail" else "not json"
     return [{"impact": i["config"].get("impact", 0), "component": i["component"], "group": i["group"],
              "key": i["key"], "reason": "r"} for i in items]
 

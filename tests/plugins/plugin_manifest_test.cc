@@ -123,16 +123,14 @@ TEST_F(PluginManifestTest, CapabilitiesPerVersion) {
   EXPECT_TRUE(v3.GetReferences().empty());
 }
 
-class PluginSchemaFileTest : public ::testing::Test {
- protected:
-  std::string Write(const std::string& name, const std::string& text) {
-    root.WriteFile("/s/" + name, text);
-    return root.Path("/s/" + name);
-  }
-  TempRoot root;
-};
+// Writes a manifest schema file under the root's /s/ and returns its path.
+std::string WriteSchema(const TempRoot& root, const std::string& name, const std::string& text) {
+  root.WriteFile("/s/" + name, text);
+  return root.Path("/s/" + name);
+}
 
-TEST_F(PluginSchemaFileTest, EachDefectHasItsOwnText) {
+TEST(PluginSchemaFileTest, EachDefectHasItsOwnText) {
+  TempRoot root;
   const std::string of = "of the property \"properties\" from ";
   const std::string minimum = "The property \"minimum\" of the property \"version\" " + of + "the schema P has a value ";
   const std::pair<const char*, std::string> cases[] = {
@@ -151,7 +149,7 @@ TEST_F(PluginSchemaFileTest, EachDefectHasItsOwnText) {
       {nullptr, "Failed to open the schema file \"P\""},
   };
   for (const auto& [text, message] : cases) {
-    const std::string path = text ? Write("x.json", text) : root.Path("/s/none.json");
+    const std::string path = text ? WriteSchema(root, "x.json", text) : root.Path("/s/none.json");
     Document schema;
     std::string error;
     CreatePluginSchemaFromFile(path, schema, error);
@@ -160,20 +158,20 @@ TEST_F(PluginSchemaFileTest, EachDefectHasItsOwnText) {
   }
   Document schema;
   std::string error;
-  EXPECT_EQ(CreatePluginSchemaFromFile(Write("ok.json", R"({"properties":{"version":{"minimum":2,"maximum":7}}})"),
-                                       schema, error),
-            2);
+  const std::string ok = WriteSchema(root, "ok.json", R"({"properties":{"version":{"minimum":2,"maximum":7}}})");
+  EXPECT_EQ(CreatePluginSchemaFromFile(ok, schema, error), 2);
   EXPECT_EQ(error, "");
 }
 
-TEST_F(PluginSchemaFileTest, SchemasAreFiledUnderTheirMinimumAndAllOrNone) {
+TEST(PluginSchemaFileTest, SchemasAreFiledUnderTheirMinimumAndAllOrNone) {
+  TempRoot root;
   const std::string dir = root.Path("/s/");
-  Write("plugin_version_1_schema.json", R"({"properties":{"version":{"minimum":3,"maximum":3}}})");
-  Write("plugin_version_2_schema.json", R"({"properties":{"version":{"minimum":2,"maximum":2}}})");
+  WriteSchema(root, "plugin_version_1_schema.json", R"({"properties":{"version":{"minimum":3,"maximum":3}}})");
+  WriteSchema(root, "plugin_version_2_schema.json", R"({"properties":{"version":{"minimum":2,"maximum":2}}})");
   std::string error;
   EXPECT_TRUE(CreatePluginSchemas(dir, error).empty());
   EXPECT_NE(error.find("Failed to open the schema file"), std::string::npos);
-  Write("plugin_version_3_schema.json", R"({"properties":{"version":{"minimum":1,"maximum":1}}})");
+  WriteSchema(root, "plugin_version_3_schema.json", R"({"properties":{"version":{"minimum":1,"maximum":1}}})");
   error.clear();
   const auto schemas = CreatePluginSchemas(dir, error);
   EXPECT_EQ(error, "");
