@@ -1,11 +1,5 @@
 // Host document utilities and the row-level steps of extraction: documents
 // from store rows, the solution filters, auto-configuration, boot documents.
-#include <memory>
-#include <string>
-#include <vector>
-
-#include <gtest/gtest.h>
-
 #include <hoxcm/config_store.h>
 #include <hoxcm/documents.h>
 #include <hoxcm/operations.h>
@@ -16,21 +10,15 @@
 namespace hoxcm_test {
 namespace {
 
-using HoxConfigManager::Document;
-using HoxConfigManager::Value;
+using namespace HoxConfigManager;
 using HoxConfigStore::ConfigMap;
 using HoxConfigStore::ConfigMapList;
-
-std::string Json(const Value& value) { return HoxConfigManager::JsonToString(value); }
 
 std::shared_ptr<ConfigMap> Row(const std::string& component, const std::string& group, const std::string& key,
                                const std::string& identifier, const std::string& value,
                                const char* autoConf = nullptr) {
-  auto row = std::make_shared<ConfigMap>(ConfigMap{{"Component", component},
-                                                   {"ConfigGroup", group},
-                                                   {"Name", key},
-                                                   {"Identifier", identifier},
-                                                   {"Value", value}});
+  auto row = std::make_shared<ConfigMap>(ConfigMap{
+      {"Component", component}, {"ConfigGroup", group}, {"Name", key}, {"Identifier", identifier}, {"Value", value}});
   if (autoConf != nullptr) (*row)["AutoConfValue"] = autoConf;
   return row;
 }
@@ -41,36 +29,29 @@ std::shared_ptr<HoxSchemaStore::SchemaObject> Schema(const char* c, const char* 
   return schema;
 }
 
-std::vector<std::string> Identifiers(const ConfigMapList& rows) {
-  std::vector<std::string> ids;
-  for (const auto& row : rows) ids.push_back(row->at("Identifier"));
-  return ids;
-}
-
-class HostDocumentsTest : public SampleHostTest {};
+using HostDocumentsTest = SampleHostTest;
 
 TEST_F(HostDocumentsTest, SolutionUserInstancesAreFilteredOnlyForNamedIdentityKeys) {
-  auto userRow = [](const std::string& name) {
+  auto user = [](const std::string& name) {
     return Row("security", "accounts", "users", name, R"({"name":")" + name + "\"}");
   };
-  const ConfigMapList users = {userRow("root"), userRow("mgmtagent"), userRow("ops"), userRow("localconsole")};
-  const ConfigMapList routes = {Row("network", "routes", "static", "mgmtagent", "{}")};
-  const ConfigMapList ntp = {Row("services", "time", "ntp", "", "{}")};
-
-  struct Case {
+  const struct {
     const char* what;
     ConfigMapList rows;
     std::shared_ptr<HoxSchemaStore::SchemaObject> schema;
     std::vector<std::string> kept;
-  };
-  const std::vector<Case> cases = {
-      {"solution users dropped", users, Schema("security", "accounts", "users"), {"root", "ops"}},
-      {"generated identities untouched", routes, Schema("network", "routes", "static"), {"mgmtagent"}},
-      {"singleton untouched", ntp, Schema("services", "time", "ntp"), {""}},
+  } cases[] = {
+      {"solution users dropped", {user("root"), user("mgmtagent"), user("ops"), user("localconsole")},
+       Schema("security", "accounts", "users"), {"root", "ops"}},
+      {"generated identities untouched", {Row("network", "routes", "static", "mgmtagent", "{}")},
+       Schema("network", "routes", "static"), {"mgmtagent"}},
+      {"singleton untouched", {Row("services", "time", "ntp", "", "{}")}, Schema("services", "time", "ntp"), {""}},
       {"empty list", {}, Schema("security", "accounts", "users"), {}},
   };
-  for (const Case& c : cases) {
-    EXPECT_EQ(Identifiers(HoxConfigManager::FilterSolutionUserInstances(c.rows, c.schema)), c.kept) << c.what;
+  for (const auto& c : cases) {
+    std::vector<std::string> kept;
+    for (const auto& row : FilterSolutionUserInstances(c.rows, c.schema)) kept.push_back(row->at("Identifier"));
+    EXPECT_EQ(kept, c.kept) << c.what;
   }
 }
 
@@ -78,62 +59,59 @@ TEST_F(HostDocumentsTest, DocumentFromRowsFollowsTheKeyShape) {
   auto users = Schema("security", "accounts", "users");
   auto ntp = Schema("services", "time", "ntp");
   Document doc;
-  HoxConfigManager::CreateDocumentFromMap(
-      {Row("security", "accounts", "users", "a", R"({"name":"a"})"),
-       Row("security", "accounts", "users", "b", R"({"name":"b"})")},
-      users, doc);
-  EXPECT_EQ(Json(doc), R"([{"name":"a"},{"name":"b"}])");
-  HoxConfigManager::CreateDocumentFromMap({}, users, doc);
-  EXPECT_EQ(Json(doc), "[]");
-  HoxConfigManager::CreateDocumentFromMap({Row("services", "time", "ntp", "", R"({"enabled":true})")}, ntp, doc);
-  EXPECT_EQ(Json(doc), R"({"enabled":true})");
-  HoxConfigManager::CreateDocumentFromMap({}, ntp, doc);
+  CreateDocumentFromMap({Row("security", "accounts", "users", "a", R"({"name":"a"})"),
+                         Row("security", "accounts", "users", "b", R"({"name":"b"})")},
+                        users, doc);
+  EXPECT_EQ(JsonToString(doc), R"([{"name":"a"},{"name":"b"}])");
+  CreateDocumentFromMap({}, users, doc);
+  EXPECT_EQ(JsonToString(doc), "[]");
+  CreateDocumentFromMap({Row("services", "time", "ntp", "", R"({"enabled":true})")}, ntp, doc);
+  EXPECT_EQ(JsonToString(doc), R"({"enabled":true})");
+  CreateDocumentFromMap({}, ntp, doc);
   EXPECT_TRUE(doc.IsNull());
-  try {
-    HoxConfigManager::CreateDocumentFromMap({Row("services", "time", "ntp", "", "{")}, ntp, doc);
-    FAIL();
-  } catch (const HoxConfigManager::InvalidArgumentException& e) {
-    EXPECT_EQ(e.GetErrorCode(), 2080);
-  }
-}
+  EXPECT_EQ(ThrownBy([&] { CreateDocumentFromMap({Row("services", "time", "ntp", "", "{")}, ntp, doc); }).code, 2080);
 
-TEST_F(HostDocumentsTest, ExternalDefaultHidesSolutionUsers) {
-  auto users = Schema("security", "accounts", "users");
+  // The external default hides solution users.
   auto db = HoxConfigStore::GetDBStore(0, true);
-  Document doc;
-  HoxConfigManager::GetExternalDefaultUserConfig({"security", "accounts", "users"}, db, users, doc);
-  EXPECT_EQ(Json(doc), R"([{"name":"root","shell":"/bin/sh","groups":["root"]}])");
-  HoxConfigManager::GetExternalDefaultUserConfig({"services", "time", "ntp"}, db, Schema("services", "time", "ntp"),
-                                                 doc);
-  EXPECT_EQ(Json(doc), R"({"enabled":false,"servers":[]})");
+  GetExternalDefaultUserConfig({"security", "accounts", "users"}, db, users, doc);
+  EXPECT_EQ(JsonToString(doc), R"([{"name":"root","shell":"/bin/sh","groups":["root"]}])");
+  GetExternalDefaultUserConfig({"services", "time", "ntp"}, db, ntp, doc);
+  EXPECT_EQ(JsonToString(doc), R"({"enabled":false,"servers":[]})");
 }
 
-TEST_F(HostDocumentsTest, MapListSkipsSolutionInstancesAndEmptyValues) {
+TEST_F(HostDocumentsTest, MapListSkipsSolutionInstancesAndEmptyValuesAndPatchesAutoConfiguration) {
   auto store = HoxSchemaStore::SchemaStore::GetStore();
+  const std::pair<DocumentType, const char*> empty[] = {
+      {DOCUMENT_CURRENT, "{}"}, {DOCUMENT_PROFILE, R"({"profile":{}})"}, {DOCUMENT_DESIRED, "{}"}};
+  for (const auto& [type, expected] : empty) {
+    Document result;
+    result.SetObject();
+    ProcessConfigMapList(result, {}, store, type);
+    EXPECT_EQ(JsonToString(result), expected) << "type " << type;
+  }
+  // mgmtagent was created by a solution; localconsole is only a solution
+  // user; the installer item holds nothing once nulls are gone; the stored
+  // ntp row lacks "enabled", which auto-configuration supplies.
   Document result;
   result.SetObject();
-  HoxConfigManager::ProcessConfigMapList(
-      result,
-      {Row("security", "accounts", "users", "mgmtagent", R"({"name":"mgmtagent"})"),
-       Row("security", "accounts", "users", "localconsole", R"({"name":"localconsole","shell":null})"),
-       Row("hox", "system", "installer", "", R"({"mode":null})")},
-      store, HoxConfigManager::DOCUMENT_CURRENT);
-  // mgmtagent was created by a solution; localconsole is only a solution user; the
-  // installer item holds nothing once nulls are gone.
-  EXPECT_EQ(Json(result), R"({"security":{"accounts":{"users":[{"name":"localconsole"}]}}})");
+  ProcessConfigMapList(result,
+                       {Row("security", "accounts", "users", "mgmtagent", R"({"name":"mgmtagent"})"),
+                        Row("security", "accounts", "users", "localconsole", R"({"name":"localconsole","shell":null})"),
+                        Row("hox", "system", "installer", "", R"({"mode":null})"),
+                        Row("services", "time", "ntp", "", R"({"servers":[]})", R"({"enabled":true})")},
+                       store, DOCUMENT_CURRENT);
+  EXPECT_EQ(JsonToString(result), R"({"security":{"accounts":{"users":[{"name":"localconsole"}]}},)"
+                                  R"("services":{"time":{"ntp":{"servers":[],"enabled":true}}}})");
 }
 
 TEST_F(HostDocumentsTest, AutoConfigurationFillsMissingRequiredProperties) {
   auto ntp = Schema("services", "time", "ntp");
   auto syslog = Schema("services", "syslog", "config");
-  struct Case {
+  const struct {
     const char* what;
     std::shared_ptr<HoxSchemaStore::SchemaObject> schema;
-    const char* value;
-    const char* autoConf;
-    const char* expected;
-  };
-  const std::vector<Case> cases = {
+    const char *value, *autoConf, *expected;
+  } cases[] = {
       {"required property patched", ntp, R"({"servers":["a"]})", R"({"enabled":true})",
        R"({"servers":["a"],"enabled":true})"},
       {"nothing to patch", ntp, R"({"enabled":false})", R"({"enabled":true})", R"({"enabled":false})"},
@@ -143,65 +121,41 @@ TEST_F(HostDocumentsTest, AutoConfigurationFillsMissingRequiredProperties) {
       {"finding without auto configuration value", syslog, R"({"port":1})", R"({"protocol":"tcp"})",
        R"({"port":1,"protocol":"tcp"})"},
   };
-  for (const Case& c : cases) {
+  for (const auto& c : cases) {
     Document value;
-    HoxConfigManager::ParseDocument(c.value, value);
-    HoxConfigManager::ProcessAutoConfig(value, c.schema->GetInstanceSchema(), c.autoConf, value.GetAllocator());
-    EXPECT_EQ(Json(value), c.expected) << c.what;
+    ParseDocument(c.value, value);
+    ProcessAutoConfig(value, c.schema->GetInstanceSchema(), c.autoConf, value.GetAllocator());
+    EXPECT_EQ(JsonToString(value), c.expected) << c.what;
   }
   Document value;
-  HoxConfigManager::ParseDocument("{}", value);
-  EXPECT_THROW(HoxConfigManager::ProcessAutoConfig(value, ntp->GetInstanceSchema(), "{", value.GetAllocator()),
-               HoxConfigManager::InvalidArgumentException);
-
-  // Through the map list: the stored row lacks "enabled".
-  Document result;
-  result.SetObject();
-  const ConfigMapList rows = {Row("services", "time", "ntp", "", R"({"servers":[]})", R"({"enabled":true})")};
-  HoxConfigManager::ProcessConfigMapList(result, rows, HoxSchemaStore::SchemaStore::GetStore(),
-                                         HoxConfigManager::DOCUMENT_CURRENT);
-  EXPECT_EQ(Json(result["services"]["time"]["ntp"]), R"({"servers":[],"enabled":true})");
+  ParseDocument("{}", value);
+  EXPECT_THROW(ProcessAutoConfig(value, ntp->GetInstanceSchema(), "{", value.GetAllocator()), InvalidArgumentException);
 }
 
 TEST_F(HostDocumentsTest, MergedBootDocumentIsWrittenOnlyWhenEveryKeyHasASchema) {
   root_.WriteFile("/sys/class/dmi/id/product_uuid", "4C4C4544-0042-3510-8053-B4C04F4E3132\n");
   root_.WriteFile("/tmp/good.json", R"({"services":{"time":{"ntp":{"enabled":true}}}})");
   root_.WriteFile("/tmp/bad.json", R"({"services":{"time":{"sundial":{"enabled":true}}}})");
-
-  HoxConfigManager::CreateMergedBootDocument(root_.Path("/tmp/good.json"), root_.Path("/tmp/out.json"));
+  CreateMergedBootDocument(root_.Path("/tmp/good.json"), root_.Path("/tmp/out.json"));
   EXPECT_EQ(root_.ReadFile("/tmp/out.json"), R"({"services":{"time":{"ntp":{"enabled":true}}}})");
 
-  try {
-    HoxConfigManager::CreateMergedBootDocument(root_.Path("/tmp/bad.json"), root_.Path("/tmp/out2.json"));
-    FAIL();
-  } catch (const HoxConfigManager::SchemaNotFound& e) {
-    EXPECT_EQ(e.GetErrorCode(), 2021);
-    EXPECT_NE(std::string(e.what()).find("sundial"), std::string::npos) << e.what();
-  }
-  EXPECT_FALSE(HoxConfigManager::fileExists(root_.Path("/tmp/out2.json")));
-  EXPECT_THROW(HoxConfigManager::CreateMergedBootDocument(root_.Path("/tmp/none.json"), root_.Path("/tmp/out3.json")),
-               HoxConfigManager::ConfigManagerException);
+  const Thrown unknown = ThrownBy([&] { CreateMergedBootDocument(root_.Path("/tmp/bad.json"), root_.Path("/tmp/o2")); });
+  EXPECT_EQ(unknown.code, 2021);
+  EXPECT_NE(unknown.message.find("sundial"), std::string::npos) << unknown.message;
+  EXPECT_FALSE(fileExists(root_.Path("/tmp/o2")));
+  EXPECT_GT(ThrownBy([&] { CreateMergedBootDocument(root_.Path("/tmp/none.json"), root_.Path("/tmp/o3")); }).code, 0);
 }
-
-}  // namespace
-}  // namespace hoxcm_test
-
-namespace hoxcm_test {
-namespace {
 
 TEST(StoreValueParsingTest, NonAsciiTextIsStillValidatedAtEveryOffset) {
   // Store values are mostly ASCII and skip the per-character check; a single
   // byte of invalid UTF-8 anywhere (inside a machine word or in the tail)
   // must still be refused, and valid multi-byte text must still parse.
-  const std::string prefix = R"({"s":")";
   for (std::size_t padding = 0; padding < 17; ++padding) {
-    const std::string ascii(padding, 'a');
+    const std::string text = R"({"s":")" + std::string(padding, 'a');
     Document doc;
-    EXPECT_THROW(HoxConfigManager::ParseDocument(prefix + ascii + "\xff\"}", doc),
-                 HoxConfigManager::InvalidArgumentException)
-        << padding;
-    ASSERT_NO_THROW(HoxConfigManager::ParseDocument(prefix + ascii + "Z\xc3\xbcrich\"}", doc)) << padding;
-    EXPECT_EQ(std::string(doc["s"].GetString()), ascii + "Z\xc3\xbcrich");
+    EXPECT_THROW(ParseDocument(text + "\xff\"}", doc), InvalidArgumentException) << padding;
+    ASSERT_NO_THROW(ParseDocument(text + "Z\xc3\xbcrich\"}", doc)) << padding;
+    EXPECT_EQ(std::string(doc["s"].GetString()), std::string(padding, 'a') + "Z\xc3\xbcrich");
   }
 }
 

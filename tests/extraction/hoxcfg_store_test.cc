@@ -1,55 +1,35 @@
 // hoxcfg init, export, show and maintenance, run as real processes against a
 // temporary root.
 #include <sys/stat.h>
-#include <sys/wait.h>
-
-#include <cstdlib>
-#include <string>
-
-#include <gtest/gtest.h>
 
 #include <hoxcm/documents.h>
 
 #include "extraction/sample_host.h"
-#include "support/temp_root.h"
+#include "support/run_hoxcfg.h"
 
 namespace hoxcm_test {
 namespace {
 
-struct Outcome {
-  int exitCode;
-  std::string out;
-  std::string err;
-};
+constexpr const char* kStore = "/var/lib/tarvik/configstore/configstore.db";
 
 class HoxcfgStoreTest : public ::testing::Test {
  protected:
-  // Runs hoxcfg with `args` (shell words) and HOX_ROOT set to the root.
-  Outcome Run(const std::string& args) {
-    const std::string out = root_.Path("/tmp/stdout"), err = root_.Path("/tmp/stderr");
-    root_.WriteFile("/tmp/stdout", "");
-    const std::string command = BuildPath("tools/hoxcfg") + " " + args + " >" + out + " 2>" + err;
-    const int status = std::system(command.c_str());
-    return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, root_.ReadFile("/tmp/stdout"),
-            root_.ReadFile("/tmp/stderr")};
-  }
-
+  HoxcfgOutcome Run(const std::string& args) { return RunHoxcfg(root_, args); }
   void InitSample() {
-    const Outcome init = Run("init --sample");
+    const HoxcfgOutcome init = Run("init --sample");
     ASSERT_EQ(init.exitCode, 0) << init.err;
   }
-
   TempRoot root_;
 };
 
-TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExports) {
-  const Outcome init = Run("init --root " + root_.path() + " --sample");
+TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExportsToAPrivateFile) {
+  const HoxcfgOutcome init = Run("init --root " + root_.path() + " --sample");
   ASSERT_EQ(init.exitCode, 0) << init.err;
   EXPECT_NE(init.out.find("installed schemas"), std::string::npos) << init.out;
-  EXPECT_TRUE(HoxConfigManager::fileExists(root_.Path("/var/lib/tarvik/configstore/configstore.db")));
+  EXPECT_TRUE(HoxConfigManager::fileExists(root_.Path(kStore)));
   EXPECT_TRUE(HoxConfigManager::fileExists(root_.Path("/etc/tarvik/host-facts.json")));
 
-  const Outcome exported = Run("export");
+  const HoxcfgOutcome exported = Run("export");
   ASSERT_EQ(exported.exitCode, 0) << exported.err;
   HoxConfigManager::Document doc;
   ASSERT_NO_THROW(HoxConfigManager::ParseDocument(exported.out, doc)) << exported.out;
@@ -59,14 +39,11 @@ TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExports) {
   // Run twice, init leaves the same host.
   EXPECT_EQ(Run("init --sample").exitCode, 0);
   EXPECT_EQ(Run("export").out, exported.out);
-}
 
-TEST_F(HoxcfgStoreTest, ExportToAFileIsPrivate) {
-  InitSample();
   const std::string file = root_.Path("/tmp/host.json");
-  const Outcome exported = Run("export --output " + file);
-  ASSERT_EQ(exported.exitCode, 0) << exported.err;
-  EXPECT_EQ(exported.out, "");
+  const HoxcfgOutcome toFile = Run("export --output " + file);
+  ASSERT_EQ(toFile.exitCode, 0) << toFile.err;
+  EXPECT_EQ(toFile.out, "");
   struct stat st {};
   ASSERT_EQ(::stat(file.c_str(), &st), 0);
   EXPECT_EQ(st.st_mode & 0777, 0600u);
@@ -77,7 +54,7 @@ TEST_F(HoxcfgStoreTest, ExportToAFileIsPrivate) {
 TEST_F(HoxcfgStoreTest, ShowMasksSensitiveValues) {
   InitSample();
   for (const char* which : {"", "current", "user"}) {
-    const Outcome shown = Run(std::string("show ") + which + " --compact");
+    const HoxcfgOutcome shown = Run(std::string("show ") + which + " --compact");
     ASSERT_EQ(shown.exitCode, 0) << which << shown.err;
     EXPECT_EQ(shown.out.find("s3cr3t-chap-01"), std::string::npos) << which;
     EXPECT_NE(shown.out.find("******"), std::string::npos) << which;
@@ -96,28 +73,20 @@ TEST_F(HoxcfgStoreTest, MaintenanceModeIsEnteredAndExited) {
 }
 
 TEST_F(HoxcfgStoreTest, ErrorsPrintTheCodeAndNothingOnStdout) {
-  InitSample();
-  // A store row that is not JSON.
-  ExecStoreSql("UPDATE config_item SET value = '{oops' WHERE name = 'hostname'");
-  for (const char* command : {"export", "show current"}) {
-    const Outcome failed = Run(command);
+  auto expectError = [&](const std::string& command, const std::string& code) {
+    const HoxcfgOutcome failed = Run(command);
     EXPECT_EQ(failed.exitCode, 2) << command;
     EXPECT_EQ(failed.out, "") << command;
-    EXPECT_EQ(failed.err.rfind("hoxcfg: error 2080: ", 0), 0u) << command << ": " << failed.err;
-  }
-}
-
-TEST_F(HoxcfgStoreTest, ReadingCommandsNeedAnInitialisedRoot) {
-  for (const char* command : {"export", "show", "maintenance status"}) {
-    const Outcome failed = Run(command);
-    EXPECT_EQ(failed.exitCode, 2) << command;
-    EXPECT_EQ(failed.err.rfind("hoxcfg: error 2001: ", 0), 0u) << command << ": " << failed.err;
-  }
-  EXPECT_FALSE(HoxConfigManager::fileExists(root_.Path("/var/lib/tarvik/configstore/configstore.db")));
-}
-
-TEST_F(HoxcfgStoreTest, InitRefusesTheRealRootWithoutForce) {
-  const Outcome refused = Run("init --root /");
+    EXPECT_EQ(failed.err.rfind("hoxcfg: error " + code + ": ", 0), 0u) << command << ": " << failed.err;
+  };
+  // Reading commands need an initialised root, and create nothing.
+  for (const char* command : {"export", "show", "maintenance status"}) expectError(command, "2001");
+  EXPECT_FALSE(HoxConfigManager::fileExists(root_.Path(kStore)));
+  // A store row that is not JSON.
+  InitSample();
+  ExecStoreSql("UPDATE config_item SET value = '{oops' WHERE name = 'hostname'");
+  for (const char* command : {"export", "show current"}) expectError(command, "2080");
+  const HoxcfgOutcome refused = Run("init --root /");
   EXPECT_EQ(refused.exitCode, 2);
   EXPECT_NE(refused.err.find("refusing"), std::string::npos) << refused.err;
 }

@@ -11,6 +11,7 @@
 #include <hoxcm/json.h>
 
 #include "support/temp_root.h"
+#include "support/thrown.h"
 
 namespace hoxcm_test {
 
@@ -33,7 +34,7 @@ class SampleHostTest : public ::testing::Test {
                     const std::string& identifier, const std::string& value) const;
   void DeleteRawRows(int kind, const std::string& component, const std::string& group,
                      const std::string& key) const;
-  // Every row of the store, in a stable order, as text.
+  // Every row of the store, every column, in a stable order, as text.
   std::vector<std::string> DumpRows() const;
 
   TempRoot root_;

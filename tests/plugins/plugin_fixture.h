@@ -1,10 +1,9 @@
 // Shared setup of the plugin tests: a temporary root with the sample
-// schemas and the manifest schemas installed, writers of manifests, store
-// objects, and what a call throws.
+// schemas and the manifest schemas installed, and writers of manifests and
+// store objects.
 #pragma once
 
 #include <filesystem>
-#include <functional>
 #include <string>
 #include <vector>
 
@@ -14,6 +13,7 @@
 #include <hoxcm/plugins.h>
 
 #include "support/temp_root.h"
+#include "support/thrown.h"
 
 namespace hoxcm_test {
 
@@ -39,23 +39,6 @@ inline std::shared_ptr<HoxConfigStore::ConfigStoreObject> Object(const HoxConfig
   HoxConfigManager::Document value;
   HoxConfigManager::ParseDocument(json, value);
   return std::make_shared<HoxConfigStore::ConfigStoreObject>(id, value);
-}
-
-// What `f` throws: the library's code (-1 for any other exception, 0 when
-// nothing is thrown) and the message.
-struct Thrown {
-  int code = 0;
-  std::string message;
-};
-inline Thrown ThrownBy(const std::function<void()>& f) {
-  try {
-    f();
-  } catch (const HoxConfigStore::ConfigStoreException& e) {
-    return {e.GetErrorCode(), e.what()};
-  } catch (const std::exception& e) {
-    return {-1, e.what()};
-  }
-  return {};
 }
 
 class PluginTest : public ::testing::Test {

@@ -1,0 +1,29 @@
+// What a call throws, as a value tests can compare: the library's error
+// code and message. Header-only; thread-safe.
+#pragma once
+
+#include <exception>
+#include <functional>
+#include <string>
+
+#include <hoxcm/errors.h>
+
+namespace hoxcm_test {
+
+struct Thrown {
+  int code = 0;  // the library's code; -1 for any other exception; 0 when nothing was thrown
+  std::string message;
+};
+
+inline Thrown ThrownBy(const std::function<void()>& f) {
+  try {
+    f();
+  } catch (const HoxConfigStore::ConfigStoreException& e) {
+    return {e.GetErrorCode(), e.what()};
+  } catch (const std::exception& e) {
+    return {-1, e.what()};
+  }
+  return {};
+}
+
+}  // namespace hoxcm_test
