@@ -1,5 +1,7 @@
 // Configuration contents, namespace objects and host state as readers and
 // writers of the store see them.
+#include <algorithm>
+
 #include <hoxcm/schema_store.h>
 
 #include "platform_store/store_fixture.h"
@@ -23,68 +25,77 @@ std::vector<std::string> Identifiers(const std::vector<RowTuple>& rows, const st
   return ids;
 }
 
-TEST_F(StoreTest, ImportedDocumentIsReadBackOneRowPerObjectInKeyThenDocumentOrder) {
-  ImportConfiguration(ConfigKind::User, SampleUserConfig());
+TEST_F(StoreTest, ImportedDocumentIsReadBackInKeyThenDocumentOrderAndRebuildsExactly) {
+  const rapidjson::Document source = SampleUserConfig();
+  ImportConfiguration(ConfigKind::User, source);
   const auto rows = Rows(ConfigKind::User);
-  ASSERT_FALSE(rows.empty());
-  // Ordered by component, group, key.
-  for (std::size_t i = 1; i < rows.size(); ++i) {
-    const auto a = std::make_tuple(std::get<0>(rows[i - 1]), std::get<1>(rows[i - 1]), std::get<2>(rows[i - 1]));
-    const auto b = std::make_tuple(std::get<0>(rows[i]), std::get<1>(rows[i]), std::get<2>(rows[i]));
-    EXPECT_LE(a, b);
-  }
+  EXPECT_TRUE(std::is_sorted(rows.begin(), rows.end(), [](const RowTuple& a, const RowTuple& b) {
+    return std::tie(std::get<0>(a), std::get<1>(a), std::get<2>(a)) <
+           std::tie(std::get<0>(b), std::get<1>(b), std::get<2>(b));
+  }));
   // Instances keep document order and are identified by their identity
   // member; singletons have no identifier.
   EXPECT_EQ(Identifiers(rows, "vnic"), (std::vector<std::string>{"vnic0", "vnic1", "vnic2"}));
   EXPECT_EQ(Identifiers(rows, "static"), (std::vector<std::string>{"5f0c1c9e-6a3b-4b8e-9d7a-1e2f3a4b5c6d",
                                                                     "a1b2c3d4-e5f6-4a7b-8c9d-0e1f2a3b4c5d"}));
   EXPECT_EQ(Identifiers(rows, "hostname"), (std::vector<std::string>{""}));
-
-  // The contents rebuild the document exactly.
   auto db = GetDBStore();
-  const rapidjson::Document source = SampleUserConfig();
   for (const auto& component : source.GetObject()) {
     for (const auto& group : component.value.GetObject()) {
       for (const auto& key : group.value.GetObject()) {
-        const rapidjson::Document item = GetCurrentConfigInternal(db, component.name.GetString(),
-                                                                  group.name.GetString(), key.name.GetString());
-        EXPECT_TRUE(item == key.value) << key.name.GetString();
+        EXPECT_TRUE(GetCurrentConfigInternal(db, component.name.GetString(), group.name.GetString(),
+                                             key.name.GetString()) == key.value)
+            << key.name.GetString();
       }
     }
   }
   EXPECT_TRUE(GetCurrentConfigInternal(db, "no", "such", "key").IsNull());
 }
 
-TEST_F(StoreTest, GeneratedIdentitiesAreKeptOrCreatedAndStoredInTheValue) {
+TEST_F(StoreTest, KindsAreSeparateAndEachIsReplacedWhole) {
   ImportConfiguration(ConfigKind::User, Json(R"({"network":{"routes":{"static":[
       {"cs_generated_id":"r-1","destination":"10.0.0.0/8","gateway":"10.0.0.1"},
       {"destination":"10.1.0.0/16","gateway":"10.0.0.1"}]}}})"));
-  const auto rows = Rows(ConfigKind::User);
-  ASSERT_EQ(rows.size(), 2u);
-  EXPECT_EQ(std::get<3>(rows[0]), "r-1");
-  const std::string generated = std::get<3>(rows[1]);
-  EXPECT_EQ(generated.size(), 36u);
-  EXPECT_EQ(Json(std::get<4>(rows[1]))["cs_generated_id"].GetString(), generated);
-}
+  // A generated identity is kept, or created and written into the value.
+  const auto user = Rows(ConfigKind::User);
+  ASSERT_EQ(user.size(), 2u);
+  EXPECT_EQ(std::get<3>(user[0]), "r-1");
+  EXPECT_EQ(std::get<3>(user[1]).size(), 36u);
+  EXPECT_EQ(Json(std::get<4>(user[1]))["cs_generated_id"].GetString(), std::get<3>(user[1]));
 
-TEST_F(StoreTest, KindsAreSeparateAndDesiredConfigurationIsReplacedWhole) {
-  ImportConfiguration(ConfigKind::User, SampleUserConfig());
-  rapidjson::Document first = Json(R"({"profile":{"system":{"identity":{"hostname":{"hostname":"a"}}},
+  rapidjson::Document desired = Json(R"({"profile":{"system":{"identity":{"hostname":{"hostname":"a"}}},
       "storage":{"nfs":{"mounts":[{"name":"m1","server":"s","export":"/e"}]}}}})");
-  SetDesiredUserConfig(first);
+  SetDesiredUserConfig(desired);
   EXPECT_EQ(Rows(ConfigKind::Desired).size(), 2u);
-  rapidjson::Document second = Json(R"({"system":{"identity":{"hostname":{"hostname":"b"}}}})");
-  SetDesiredUserConfig(second);
-  const auto desired = Rows(ConfigKind::Desired);
-  ASSERT_EQ(desired.size(), 1u);
-  EXPECT_EQ(std::get<4>(desired[0]), R"({"hostname":"b"})");
-
+  desired = Json(R"({"system":{"identity":{"hostname":{"hostname":"b"}}}})");
+  SetDesiredUserConfig(desired);
+  // A staged object replaces its own row; a new instance gets an identity.
+  auto schemas = HoxSchemaStore::SchemaStore::GetStore();
+  ProcessDesiredObject(desired.GetAllocator(), GetDBStore(), "system", "identity", "hostname",
+                       HoxSchemaStore::GetSchema("system", "identity", "hostname", schemas), Json(R"({"hostname":"c"})"));
+  ProcessDesiredObject(desired.GetAllocator(), GetDBStore(), "network", "routes", "static",
+                       HoxSchemaStore::GetSchema("network", "routes", "static", schemas), Json(R"({"gateway":"g"})"));
+  const auto staged = Rows(ConfigKind::Desired);
+  ASSERT_EQ(staged.size(), 2u);
+  EXPECT_EQ(std::get<3>(staged[0]).size(), 36u);
+  EXPECT_EQ(staged[1], (RowTuple{"system", "identity", "hostname", "", R"({"hostname":"c"})"}));
   rapidjson::Document nic = Json(R"({"nic":{"port":{"speed":{"gbps":25}}}})");
   SetDesiredSmartnicConfiguration(nic);
   EXPECT_EQ(GetDesiredSmartnicConfiguration(GetDBStore()).size(), 1u);
   EXPECT_TRUE(GetSmartnicConfiguration(GetDBStore()).empty());
-  EXPECT_EQ(Rows(ConfigKind::User), Rows(GetUserConfigContents(GetDBStore())));
-  EXPECT_EQ(Identifiers(Rows(ConfigKind::User), "vnic").size(), 3u);
+
+  // Defaults are read per key, per instance, and as instances of a singleton.
+  ImportConfiguration(ConfigKind::Default, Json(R"({"network":{"dns":{"config":{"servers":["1.1.1.1"]}}},
+      "security":{"accounts":{"users":[{"name":"root","shell":"/bin/sh"},{"name":"localconsole","shell":"/bin/sh"}]}}})"));
+  auto db = GetDBStore();
+  EXPECT_TRUE(GetDefaultUserConfigInternal(db, "network", "dns", "config").IsObject());
+  EXPECT_TRUE(GetDefaultUserConfigInstancesInternal(db, "network", "dns", "config").IsArray());
+  EXPECT_EQ(GetDefaultUserConfigInternal(db, "security", "accounts", "users").Size(), 2u);
+  EXPECT_EQ(GetDefaultUserConfigMapList({"security", "accounts", "users"}, db).size(), 2u);
+  const auto localconsole = GetDefaultUserConfigMapList({"security", "accounts", "users", "localconsole"}, db);
+  ASSERT_EQ(localconsole.size(), 1u);
+  EXPECT_EQ(localconsole[0]->at("Identifier"), "localconsole");
+  EXPECT_EQ(Rows(ConfigKind::User), user);
 }
 
 TEST_F(StoreTest, UserConfigChangesUpsertKeepingPositionAndDeleteById) {
@@ -115,96 +126,48 @@ TEST_F(StoreTest, UserConfigChangesUpsertKeepingPositionAndDeleteById) {
   EXPECT_THROW(ApplyUserConfigChanges(
                    {{"SET", {"storage", "nfs", "mounts", "a"}, R"({"name":"z","server":"t","export":"/a"})"}}),
                HoxConfigManager::ConfigManagerException);
-  EXPECT_EQ(std::get<4>(Rows(ConfigKind::User)[0]), R"({"name":"a","server":"t","export":"/a"})");
-}
-
-TEST_F(StoreTest, DefaultConfigurationIsReadPerKeyAndPerInstance) {
-  ImportConfiguration(ConfigKind::Default, Json(R"({"network":{"dns":{"config":{"servers":["1.1.1.1"]}}},
-      "security":{"accounts":{"users":[{"name":"root","shell":"/bin/sh"},{"name":"localconsole","shell":"/bin/sh"}]}}})"));
-  auto db = GetDBStore();
-  EXPECT_TRUE(GetDefaultUserConfigInternal(db, "network", "dns", "config").IsObject());
-  EXPECT_TRUE(GetDefaultUserConfigInstancesInternal(db, "network", "dns", "config").IsArray());
-  EXPECT_EQ(GetDefaultUserConfigInternal(db, "security", "accounts", "users").Size(), 2u);
-  EXPECT_EQ(GetDefaultUserConfigMapList({"security", "accounts", "users"}, db).size(), 2u);
-  const auto localconsole = GetDefaultUserConfigMapList({"security", "accounts", "users", "localconsole"}, db);
-  ASSERT_EQ(localconsole.size(), 1u);
-  EXPECT_EQ(localconsole[0]->at("Identifier"), "localconsole");
-  EXPECT_TRUE(GetUserConfigContents(db).empty());
-}
-
-TEST_F(StoreTest, StagedObjectsAreUpsertedIntoTheDesiredConfiguration) {
-  auto db = GetDBStore();
-  auto schemas = HoxSchemaStore::SchemaStore::GetStore();
-  ASSERT_NE(schemas, nullptr);
-  auto routes = HoxSchemaStore::GetSchema("network", "routes", "static", schemas);
-  auto hostname = HoxSchemaStore::GetSchema("system", "identity", "hostname", schemas);
-  rapidjson::Document scratch;
-  ProcessDesiredObject(scratch.GetAllocator(), db, "system", "identity", "hostname", hostname,
-                       Json(R"({"hostname":"a"})"));
-  ProcessDesiredObject(scratch.GetAllocator(), db, "system", "identity", "hostname", hostname,
-                       Json(R"({"hostname":"b"})"));
-  ProcessDesiredObject(scratch.GetAllocator(), db, "network", "routes", "static", routes,
-                       Json(R"({"destination":"d","gateway":"g"})"));
-  const auto rows = Rows(ConfigKind::Desired);
-  ASSERT_EQ(rows.size(), 2u);
-  EXPECT_EQ(std::get<4>(rows[1]), R"({"hostname":"b"})");
-  EXPECT_EQ(std::get<3>(rows[0]).size(), 36u);
+  EXPECT_EQ(Rows(ConfigKind::User), rows);
 }
 
 TEST_F(StoreTest, RowsKeepAutoConfigurationValuesAndBadValuesFailOnlyTheirReader) {
   ApplyUserConfigChanges({{"SET", {"services", "syslog", "config"}, R"({"remoteHost":"h"})"}});
   SetAutoConfValue(ConfigKind::User, {"services", "syslog", "config"}, R"({"protocol":"udp"})");
-  auto rows = GetUserConfigContents(GetDBStore());
-  ASSERT_EQ(rows.size(), 1u);
-  EXPECT_EQ(rows[0]->at("AutoConfValue"), R"({"protocol":"udp"})");
+  EXPECT_EQ(GetUserConfigContents(GetDBStore())[0]->at("AutoConfValue"), R"({"protocol":"udp"})");
   SetAutoConfValue(ConfigKind::User, {"services", "syslog", "config"}, "");
   EXPECT_EQ(GetUserConfigContents(GetDBStore())[0]->count("AutoConfValue"), 0u);
 
   // A row written by someone else whose value is not JSON.
   RawSql(StorePath(), "UPDATE config_item SET value = '{broken' WHERE name = 'config'");
   EXPECT_EQ(GetUserConfigContents(GetDBStore())[0]->at("Value"), "{broken");
-  try {
-    GetCurrentConfigInternal(GetDBStore(), "services", "syslog", "config");
-    FAIL() << "expected 2080";
-  } catch (const HoxConfigManager::InvalidArgumentException& e) {
-    EXPECT_EQ(e.GetErrorCode(), 2080);
-  }
+  EXPECT_EQ(Fails([] { GetCurrentConfigInternal(GetDBStore(), "services", "syslog", "config"); }).code, 2080);
 }
 
-TEST_F(StoreTest, NamespaceObjectsKeepTheirValuesByteForByte) {
+TEST_F(StoreTest, NamespaceObjectsKeepTheirValuesByteForByteAndAreReplacedWhole) {
   auto global = ConfigStore::GetStore(sGlobalNamespace);
-  auto other = ConfigStore::GetStore("elsewhere");
   const ConfigStoreObjectId id("autodeploy", "bootstrap", "hox");
   const std::string xml = "<?xml version=\"1.0\"?>\r\n<rules>\n\t<rule name=\"ünï\"/>\n</rules>\n";
   ConfigStoreObject object(id);
   object.SetValue("waiter_notify", R"({"url":"https://x"})");
   object.SetValue("firewall", xml);
   global->SetObject(object);
-  EXPECT_EQ(other->GetObject(id), nullptr);
-
+  EXPECT_EQ(ConfigStore::GetStore("elsewhere")->GetObject(id), nullptr);
   auto read = global->GetObject(id);
   ASSERT_NE(read, nullptr);
-  std::string value;
-  ASSERT_TRUE(read->GetValue("firewall", &value));
-  EXPECT_EQ(value, xml);
-  EXPECT_STREQ(read->GetData()["waiter_notify"].GetString(), R"({"url":"https://x"})");
-  EXPECT_FALSE(read->GetValue("missing", &value));
+  EXPECT_EQ(read->GetValues(), object.GetValues());
+  EXPECT_STREQ(read->GetData()["firewall"].GetString(), xml.c_str());
 
-  // Setting an object replaces all its values.
   ConfigStoreObject smaller(id);
   smaller.SetValue("firewall", "");
   global->SetObject(smaller);
-  EXPECT_EQ(global->GetObject(id)->GetValues().size(), 1u);
+  EXPECT_EQ(global->GetObject(id)->GetValues(), smaller.GetValues());
   global->DeleteObject(id);
   EXPECT_EQ(global->GetObject(id), nullptr);
 }
 
-TEST_F(StoreTest, HostStateHasDefaultsAndKeepsWhatIsSet) {
+TEST_F(StoreTest, HostStateHasDefaultsKeepsWhatIsSetAndRefusesDamagedRows) {
   EXPECT_EQ(GetBootMode(), BOOTMODE_NORMAL);
   EXPECT_FALSE(GetMaintenanceMode());
-  rapidjson::Document record = getBootApplyRecord();
-  EXPECT_FALSE(record["isBootComplete"].GetBool());
-  EXPECT_STREQ(record["bootApplyRecord"].GetString(), "");
+  EXPECT_EQ(Compact(getBootApplyRecord()), R"({"isBootComplete":false,"bootApplyRecord":""})");
   EXPECT_TRUE(GetBootTimeRestoreFailures().empty());
 
   SetBootMode(BOOTMODE_DESIRED_STAGED);
@@ -213,10 +176,9 @@ TEST_F(StoreTest, HostStateHasDefaultsAndKeepsWhatIsSet) {
   SetBootComplete(true);
   AddBootTimeRestoreFailure({"network", "dns", "config"});
   AddBootTimeRestoreFailure({"system", "kernel", "boot_options"});
-
   EXPECT_EQ(GetBootMode(), BOOTMODE_DESIRED_STAGED);
   EXPECT_TRUE(GetMaintenanceMode());
-  record = getBootApplyRecord();
+  const rapidjson::Document record = getBootApplyRecord();
   EXPECT_TRUE(record["isBootComplete"].GetBool());
   EXPECT_STREQ(record["bootApplyRecord"].GetString(), R"({"errorInfo":"","time":"01-01-2026 10-00-00"})");
   const auto failures = GetBootTimeRestoreFailures();

@@ -5,8 +5,6 @@
 
 #include <sqlite3.h>
 
-#include <fstream>
-#include <sstream>
 #include <string>
 #include <tuple>
 #include <vector>
@@ -43,23 +41,43 @@ inline rapidjson::Document Json(const std::string& text) {
   return doc;
 }
 
-inline std::string FileBytes(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
-  std::stringstream ss;
-  ss << in.rdbuf();
-  return ss.str();
+inline std::string Compact(const rapidjson::Value& value) {
+  std::string out;
+  HoxConfigStore::ConfigStoreDocument::SerializeValue(value, out);
+  return out;
 }
 
-// Runs SQL on the store file through a connection of its own.
-inline void RawSql(const std::string& path, const std::string& sql) {
+// Runs SQL on the store file through a connection of its own; returns the
+// first column of the first row it yields ("" when none).
+inline std::string RawSql(const std::string& path, const std::string& sql) {
   sqlite3* db = nullptr;
-  ASSERT_EQ(sqlite3_open(path.c_str(), &db), SQLITE_OK);
+  EXPECT_EQ(sqlite3_open(path.c_str(), &db), SQLITE_OK);
+  std::string first;
+  auto keepFirst = [](void* out, int, char** values, char**) {
+    auto* s = static_cast<std::string*>(out);
+    if (s->empty() && values[0] != nullptr) *s = values[0];
+    return 0;
+  };
   char* error = nullptr;
-  const int rc = sqlite3_exec(db, sql.c_str(), nullptr, nullptr, &error);
-  const std::string message = error != nullptr ? error : "";
+  EXPECT_EQ(sqlite3_exec(db, sql.c_str(), keepFirst, &first, &error), SQLITE_OK) << (error ? error : "");
   sqlite3_free(error);
   sqlite3_close(db);
-  ASSERT_EQ(rc, SQLITE_OK) << message;
+  return first;
+}
+
+// What a store call throws: its error code (0 when it returns) and message.
+struct Failure {
+  int code = 0;
+  std::string what;
+};
+template <typename F>
+Failure Fails(F&& f) {
+  try {
+    f();
+  } catch (const HoxConfigStore::ConfigStoreException& e) {
+    return {e.GetErrorCode(), e.what()};
+  }
+  return {};
 }
 
 class StoreTest : public ::testing::Test {
