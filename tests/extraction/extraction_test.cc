@@ -26,7 +26,7 @@ std::string Canonical(const Value& value) {
 
 using ExtractionTest = SampleHostTest;
 
-TEST_F(ExtractionTest, CurrentConfigurationIsTheStoredUserConfiguration) {
+TEST_F(ExtractionTest, CurrentAndUserConfigurationsFromTheStore) {
   // Given the imported sample host, the current configuration holds every
   // stored item, store-generated identities included, but not the quorlet
   // daemon on a host not integrated with the desired-state platform, nor
@@ -43,29 +43,27 @@ TEST_F(ExtractionTest, CurrentConfigurationIsTheStoredUserConfiguration) {
   // Instances keep the order in which they were stored.
   EXPECT_STREQ(current["network"]["interfaces"]["vnic"][2]["name"].GetString(), "vnic2");
 
-  SetFeatures(R"({"dspIntegrated": false})");
-  EXPECT_FALSE(ExtractCurrentConfiguration().HasMember("quorlet"));
-  SetFeatures(R"({"dspIntegrated": true})");
-  EXPECT_EQ(JsonToString(ExtractCurrentConfiguration()["quorlet"]["system"]["quorlet_daemon"]), R"({"enabled":false})");
-}
-
-TEST_F(ExtractionTest, UserConfigurationWithProfileIsPortable) {
-  // The profile drops store-generated identities and solution instances but
-  // keeps solution users that the host's administrator configured.
+  // The portable profile drops store-generated identities and solution
+  // instances but keeps solution users that the administrator configured.
   const Document user = ExtractUserConfiguration(true);
   ASSERT_EQ(user.MemberCount(), 1u);
   const Value& profile = user["profile"];
   for (const Value& route : profile["network"]["routes"]["static"].GetArray()) {
     EXPECT_FALSE(route.HasMember("cs_generated_id")) << JsonToString(route);
   }
-  std::vector<std::string> users;
-  for (const Value& u : profile["security"]["accounts"]["users"].GetArray()) users.push_back(u["name"].GetString());
-  EXPECT_EQ(users, (std::vector<std::string>{"root", "ops"}));
+  std::vector<std::string> names;
+  for (const Value& u : profile["security"]["accounts"]["users"].GetArray()) names.push_back(u["name"].GetString());
+  EXPECT_EQ(names, (std::vector<std::string>{"root", "ops"}));
   EXPECT_FALSE(profile.HasMember("quorlet"));
 
   const Document plain = ExtractUserConfiguration(false);
   EXPECT_FALSE(plain.HasMember("profile"));
   EXPECT_TRUE(plain.HasMember("network"));
+
+  SetFeatures(R"({"dspIntegrated": false})");
+  EXPECT_FALSE(ExtractCurrentConfiguration().HasMember("quorlet"));
+  SetFeatures(R"({"dspIntegrated": true})");
+  EXPECT_EQ(JsonToString(ExtractCurrentConfiguration()["quorlet"]["system"]["quorlet_daemon"]), R"({"enabled":false})");
 }
 
 TEST_F(ExtractionTest, DesiredConfigurationIsWhatWasStaged) {

@@ -51,7 +51,7 @@ TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExportsToAPrivateFile) {
   EXPECT_NE(root_.ReadFile("/tmp/host.json").find("s3cr3t-chap-01"), std::string::npos);
 }
 
-TEST_F(HoxcfgStoreTest, ShowMasksSensitiveValues) {
+TEST_F(HoxcfgStoreTest, ShowMasksSensitiveValuesAndMaintenanceModeIsEnteredAndExited) {
   InitSample();
   for (const char* which : {"", "current", "user"}) {
     const HoxcfgOutcome shown = Run(std::string("show ") + which + " --compact");
@@ -62,10 +62,7 @@ TEST_F(HoxcfgStoreTest, ShowMasksSensitiveValues) {
   }
   EXPECT_EQ(Run("show desired").out, "{}\n");
   EXPECT_EQ(Run("show everything").exitCode, 2);
-}
 
-TEST_F(HoxcfgStoreTest, MaintenanceModeIsEnteredAndExited) {
-  InitSample();
   EXPECT_EQ(Run("maintenance status").out, "maintenance mode: not entered\n");
   EXPECT_EQ(Run("maintenance enter").out, "maintenance mode: entered\n");
   EXPECT_EQ(Run("maintenance status").out, "maintenance mode: entered\n");
