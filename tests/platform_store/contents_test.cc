@@ -172,15 +172,13 @@ TEST_F(StoreTest, HostStateHasDefaultsKeepsWhatIsSetAndRefusesDamagedRows) {
 
   SetBootMode(BOOTMODE_DESIRED_STAGED);
   SetMaintenanceMode(true);
-  setBootApplyRecord(R"({"errorInfo":"","time":"01-01-2026 10-00-00"})");
+  setBootApplyRecord(R"({"time":"t"})");
   SetBootComplete(true);
   AddBootTimeRestoreFailure({"network", "dns", "config"});
   AddBootTimeRestoreFailure({"system", "kernel", "boot_options"});
   EXPECT_EQ(GetBootMode(), BOOTMODE_DESIRED_STAGED);
   EXPECT_TRUE(GetMaintenanceMode());
-  const rapidjson::Document record = getBootApplyRecord();
-  EXPECT_TRUE(record["isBootComplete"].GetBool());
-  EXPECT_STREQ(record["bootApplyRecord"].GetString(), R"({"errorInfo":"","time":"01-01-2026 10-00-00"})");
+  EXPECT_EQ(Compact(getBootApplyRecord()), R"({"isBootComplete":true,"bootApplyRecord":"{\"time\":\"t\"}"})");
   const auto failures = GetBootTimeRestoreFailures();
   ASSERT_EQ(failures.size(), 2u);
   EXPECT_EQ(failures[1].key, "boot_options");

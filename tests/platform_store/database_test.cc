@@ -1,6 +1,5 @@
 // Opening, refusing and transacting on the configuration store file.
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -19,9 +18,7 @@ TEST_F(StoreTest, MissingStoreIsCreatedPrivatelyInWalModeUnlessCreationIsRefused
   EXPECT_EQ(Fails([] { GetDBStore(0, false); }).code, 2001);
   EXPECT_FALSE(std::filesystem::exists(StorePath()));
 
-  auto db = GetDBStore();
-  EXPECT_EQ(db->GetPath(), StorePath());
-  EXPECT_EQ(GetDBStore().get(), db.get());  // one connection per root
+  EXPECT_EQ(GetDBStore()->GetPath(), StorePath());
   EXPECT_EQ(RawSql(StorePath(), "SELECT version FROM schema_version"), "1");
   EXPECT_EQ(RawSql(StorePath(), "PRAGMA journal_mode"), "wal");
   // The store holds sensitive values in clear: nobody else may read it.
@@ -35,14 +32,10 @@ TEST_F(StoreTest, MissingStoreIsCreatedPrivatelyInWalModeUnlessCreationIsRefused
 
 // Files that are not a store of this version must be refused as they are.
 TEST_F(StoreTest, CorruptForeignOrNewerStoresAreRefusedAndLeftUntouched) {
-  struct Case {
-    std::string contents;  // empty: made by `sql` on a fresh store
-    std::string sql;
-    const char* reason;
-  };
   std::string header("SQLite format 3", 16);
   header += std::string(84, '\x7f') + std::string(4000, 'x');
-  const std::vector<Case> cases = {
+  // (file contents, or empty for a fresh store changed by SQL; SQL; reason)
+  const std::vector<std::tuple<std::string, std::string, const char*>> cases = {
       {std::string(8192, '\xa5'), "", "not a readable"},
       {header, "", "not a readable"},
       {"", "DROP TABLE schema_version; CREATE TABLE other (x)", "not a configuration store"},
@@ -53,26 +46,26 @@ TEST_F(StoreTest, CorruptForeignOrNewerStoresAreRefusedAndLeftUntouched) {
       {"", "UPDATE schema_version SET version = 'one'", "layout version \"one\" is not valid"},
       {"", "INSERT INTO schema_version VALUES (1)", "more than one layout version"},
   };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.reason + (" " + c.sql));
+  for (const auto& [contents, sql, reason] : cases) {
+    SCOPED_TRACE(reason + (" " + sql));
     TempRoot root;
     const std::string path = root.Path(kStoreHostPath);
-    if (c.contents.empty()) {
+    if (contents.empty()) {
       // A valid store made by another process, then changed behind its back.
       const pid_t child = fork();
       if (child == 0) {
         GetDBStore();
         _exit(0);
       }
-      waitpid(child, nullptr, 0);
-      RawSql(path, "PRAGMA journal_mode = DELETE; " + c.sql);
+      ExitCodeOf(child);
+      RawSql(path, "PRAGMA journal_mode = DELETE; " + sql);
     } else {
-      root.WriteFile(kStoreHostPath, c.contents);
+      root.WriteFile(kStoreHostPath, contents);
     }
     const std::string before = root.ReadFile(kStoreHostPath);
     const Failure f = Fails([] { GetDBStore(); });
     EXPECT_EQ(f.code, 2001);
-    EXPECT_NE(f.what.find(c.reason), std::string::npos) << f.what;
+    EXPECT_NE(f.what.find(reason), std::string::npos) << f.what;
     EXPECT_TRUE(root.ReadFile(kStoreHostPath) == before) << "the refused file was changed";
     EXPECT_EQ(ConfigStore::GetStore(sGlobalNamespace), nullptr);
   }
@@ -102,9 +95,7 @@ TEST_F(StoreTest, TransactionCommitsOnlyWhenCommittedAndHidesItsWritesUntilThen)
   writeAll();
   const pid_t child = fork();
   if (child == 0) _exit(GetBootMode() == BOOTMODE_NORMAL && Rows(ConfigKind::User).empty() ? 0 : 1);
-  int status = 0;
-  waitpid(child, &status, 0);
-  EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "another process saw uncommitted writes";
+  EXPECT_EQ(ExitCodeOf(child), 0) << "another process saw uncommitted writes";
   transaction.Commit();
   EXPECT_NE(global->GetObject(id), nullptr);
   EXPECT_EQ(GetBootMode(), BOOTMODE_DESIRED_STAGED);

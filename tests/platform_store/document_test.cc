@@ -105,11 +105,7 @@ TEST(ConfigStoreDocumentTest, CleanupActionsDropWhatEachPromises) {
   const std::string input = R"({"cs_generated_id":"g","name":"x","mtu":1500,"extra":1,"gone":null,)"
                             R"("ipv4":{"address":null,"dhcp":false,"junk":2},"tags":[{"k":1,"z":null,"q":3}],)"
                             R"("options":{"Port":"22"},"empty":{}})";
-  struct Case {
-    std::vector<CLEANUP_ACTIONS> actions;
-    std::string expected;
-  };
-  const std::vector<Case> cases = {
+  const std::vector<std::pair<std::vector<CLEANUP_ACTIONS>, std::string>> cases = {
       {{CLEANUP_REMOVE_GENERATED_ID},
        R"({"name":"x","mtu":1500,"extra":1,"gone":null,"ipv4":{"address":null,"dhcp":false,"junk":2},)"
        R"("tags":[{"k":1,"z":null,"q":3}],"options":{"Port":"22"},"empty":{}})"},
@@ -129,10 +125,10 @@ TEST(ConfigStoreDocumentTest, CleanupActionsDropWhatEachPromises) {
         CLEANUP_REMOVE_EMPTY_OBJECTS},
        R"({"name":"x","tags":[{"k":1}],"options":{"Port":"22"}})"},
   };
-  for (const Case& c : cases) {
+  for (const auto& [actions, expected] : cases) {
     rapidjson::Document value = Json(input);
-    ConfigStoreDocument::CleanupObject(value, schema, c.actions, value.GetAllocator());
-    EXPECT_EQ(Compact(value), c.expected);
+    ConfigStoreDocument::CleanupObject(value, schema, actions, value.GetAllocator());
+    EXPECT_EQ(Compact(value), expected);
   }
   // A multi-instance key's array schema cleans its instances by "items".
   const rapidjson::Document arraySchema = Json(R"({"type":"array","items":)" + Compact(schema) + "}");
@@ -150,13 +146,7 @@ TEST(ConfigStoreDocumentTest, NormalizeValueSortsMembersAtEveryDepthAndKeepsArra
 TEST(ConfigStoreDocumentTest, PatchesFillFromAutoConfigurationValues) {
   const rapidjson::Document autoConf =
       Json(R"({"protocol":"udp","port":514,"tls":{"caFile":"/ca","verify":true},"servers":["a","b","c","d"]})");
-  struct Case {
-    bool unionTag;
-    std::string value;
-    std::string field;
-    std::string expected;
-  };
-  const std::vector<Case> cases = {
+  const std::vector<std::tuple<bool, const char*, const char*, const char*>> cases = {  // union tag?
       {false, R"({"remoteHost":"h"})", "/port", R"({"remoteHost":"h","port":514})"},
       {false, R"({"remoteHost":"h"})", "port", R"({"remoteHost":"h","port":514})"},
       {false, R"({"port":1})", "/port", R"({"port":1})"},              // present: kept
@@ -171,14 +161,11 @@ TEST(ConfigStoreDocumentTest, PatchesFillFromAutoConfigurationValues) {
       {false, R"({"remoteHost":"h"})", "/tls/caFile", R"({"remoteHost":"h"})"},
       {false, R"({"servers":["a"]})", "/servers/3", R"({"servers":["a"]})"},
   };
-  for (const Case& c : cases) {
-    rapidjson::Document value = Json(c.value);
-    if (c.unionTag) {
-      ConfigStoreDocument::PatchUnionTagProperty(value, c.field, autoConf, value.GetAllocator());
-    } else {
-      ConfigStoreDocument::PatchRequiredProperty(value, c.field, autoConf, value.GetAllocator());
-    }
-    EXPECT_EQ(Compact(value), c.expected) << c.value << " " << c.field;
+  for (const auto& [unionTag, text, field, expected] : cases) {
+    rapidjson::Document value = Json(text);
+    (unionTag ? ConfigStoreDocument::PatchUnionTagProperty : ConfigStoreDocument::PatchRequiredProperty)(
+        value, field, autoConf, value.GetAllocator());
+    EXPECT_EQ(Compact(value), expected) << text << " " << field;
   }
 }
 

@@ -4,6 +4,7 @@
 #pragma once
 
 #include <sqlite3.h>
+#include <sys/wait.h>
 
 #include <string>
 #include <tuple>
@@ -78,6 +79,13 @@ Failure Fails(F&& f) {
     return {e.GetErrorCode(), e.what()};
   }
   return {};
+}
+
+// Waits for a child process: its exit code, or -1 when it did not exit.
+inline int ExitCodeOf(pid_t child) {
+  int status = 0;
+  waitpid(child, &status, 0);
+  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
 class StoreTest : public ::testing::Test {
