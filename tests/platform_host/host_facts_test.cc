@@ -1,6 +1,8 @@
 // Host facts read from files under a temporary root.
 #include <cerrno>
 #include <cstdlib>
+#include <tuple>
+#include <vector>
 
 #include <gtest/gtest.h>
 #include <hoxcm/config_store.h>
@@ -12,40 +14,31 @@
 namespace hoxcm_test {
 namespace {
 
+constexpr const char* kFacts = "/etc/tarvik/host-facts.json";
+
 TEST(HostFactsTest, HardwareIdentityComesFromDmiThenMachineIdElseFails) {
   TempRoot root;
   EXPECT_THROW(HostCtl::Host::GetHardwareInfo(), HostCtl::Lib::HostCtlException);
   root.WriteFile("/etc/machine-id", "0123456789abcdef0123456789abcdef\n");
   EXPECT_EQ(HostCtl::Host::GetHardwareInfo().biosUuid, "0123456789abcdef0123456789abcdef");
+  root.WriteFile("/sys/class/dmi/id/product_uuid", "\n");  // empty: no identity
+  EXPECT_EQ(HostCtl::Host::GetHardwareInfo().biosUuid, "0123456789abcdef0123456789abcdef");
   root.WriteFile("/sys/class/dmi/id/product_uuid", "  4C4C4544-0042-3510-8053-B4C04F4E3132\n");
   root.WriteFile("/sys/class/dmi/id/sys_vendor", "Example Inc.\n");
   const auto info = HostCtl::Host::GetHardwareInfo();
-  EXPECT_EQ(info.biosUuid, "4C4C4544-0042-3510-8053-B4C04F4E3132");
-  EXPECT_EQ(info.vendor, "Example Inc.");
-  EXPECT_EQ(info.product, "");
-  // An empty DMI file is no identity: the machine id is used.
-  root.WriteFile("/sys/class/dmi/id/product_uuid", "\n");
-  EXPECT_EQ(HostCtl::Host::GetHardwareInfo().biosUuid, "0123456789abcdef0123456789abcdef");
+  EXPECT_EQ(info.biosUuid + "|" + info.vendor + "|" + info.product, "4C4C4544-0042-3510-8053-B4C04F4E3132|Example Inc.|");
 }
 
-TEST(HostFactsTest, KernelReleaseSplitsIntoVersionPatchAndUpdate) {
-  struct Case {
-    const char* release;
-    const char* version;
-    const char* expected[4];  // build, version, patch, update
+TEST(HostFactsTest, KernelReleaseSplitsIntoBuildVersionPatchAndUpdate) {
+  const std::vector<std::tuple<const char*, const char*, const char*>> cases = {
+      {"6.1.0-13-amd64", "#1 SMP PREEMPT_DYNAMIC Debian 6.1.55-1 (2023-09-29)", "1|6.1.0|13|amd64"},
+      {"6.5.0-1-cloud-amd64", "#42 SMP", "42|6.5.0|1|cloud-amd64"},
+      {"5.15.0", "SMP Tue", "SMP Tue|5.15.0||"},
+      {"", "", "|||"},
   };
-  const Case cases[] = {
-      {"6.1.0-13-amd64", "#1 SMP PREEMPT_DYNAMIC Debian 6.1.55-1 (2023-09-29)", {"1", "6.1.0", "13", "amd64"}},
-      {"6.5.0-1-cloud-amd64", "#42 SMP", {"42", "6.5.0", "1", "cloud-amd64"}},
-      {"5.15.0", "SMP Tue", {"SMP Tue", "5.15.0", "", ""}},
-      {"", "", {"", "", "", ""}},
-  };
-  for (const Case& c : cases) {
-    const auto v = HoxPlatform::detail::ParseKernelRelease(c.release, c.version);
-    EXPECT_EQ(v.build, c.expected[0]) << c.release;
-    EXPECT_EQ(v.version, c.expected[1]) << c.release;
-    EXPECT_EQ(v.patch, c.expected[2]) << c.release;
-    EXPECT_EQ(v.update, c.expected[3]) << c.release;
+  for (const auto& [release, version, expected] : cases) {
+    const auto v = HoxPlatform::detail::ParseKernelRelease(release, version);
+    EXPECT_EQ(v.build + "|" + v.version + "|" + v.patch + "|" + v.update, expected) << release;
   }
   EXPECT_FALSE(QmkCtl::System::SystemInfoImpl::GetQmkVersion().version.empty());
 }
@@ -54,30 +47,29 @@ TEST(HostFactsTest, FactsFileGivesQuickBootAndSwitchesAndMissingOrMalformedMeans
   TempRoot root;
   EXPECT_FALSE(HostCtl::System::LoadHox::IsSupported());
   EXPECT_FALSE(FeatureState_IsEnabled("Qmkapps_BlockSshFileEdits"));
-
-  root.WriteFile("/etc/tarvik/host-facts.json",
-                 R"({"quickBootSupported": true, "features": {"Qmkapps_BlockSshFileEdits": true, "x": "yes"}})");
+  root.WriteFile(kFacts, R"({"quickBootSupported": true, "features": {"Qmkapps_BlockSshFileEdits": true, "x": "yes"}})");
   FeatureState_InitDeltaMode();
   EXPECT_TRUE(HostCtl::System::LoadHox::IsSupported());
   EXPECT_FALSE(HostCtl::System::LoadHox::IsSTMSupported());
   EXPECT_TRUE(FeatureState_IsEnabled("Qmkapps_BlockSshFileEdits"));
   EXPECT_FALSE(FeatureState_IsEnabled("x"));
   EXPECT_FALSE(FeatureState_IsEnabled(nullptr));
-
   // A changed file is seen without any call to re-initialise.
-  root.WriteFile("/etc/tarvik/host-facts.json", R"({"stmSupported": true, "features": {}})");
+  root.WriteFile(kFacts, R"({"stmSupported": true, "features": {}})");
   EXPECT_TRUE(HostCtl::System::LoadHox::IsSTMSupported());
   EXPECT_FALSE(FeatureState_IsEnabled("Qmkapps_BlockSshFileEdits"));
-
-  root.WriteFile("/etc/tarvik/host-facts.json", "{\"stmSupported\": tru");
+  root.WriteFile(kFacts, "{\"stmSupported\": tru");
   FeatureState_InitSilentMode();
   EXPECT_FALSE(HostCtl::System::LoadHox::IsSTMSupported());
+  std::vector<std::string> problems;
+  EXPECT_FALSE(HoxPlatform::detail::ParseHostFacts(R"({"stmSupported": 1, "features": []})", problems).stmSupported);
+  EXPECT_EQ(problems.size(), 2u);
 
   // A delta re-read logs every switch that changed, also one that was
   // removed from the file (and so is off now).
-  root.WriteFile("/etc/tarvik/host-facts.json", R"({"features": {"a": true, "b": true, "c": false}})");
+  root.WriteFile(kFacts, R"({"features": {"a": true, "b": true, "c": false}})");
   FeatureState_InitSilentMode();
-  root.WriteFile("/etc/tarvik/host-facts.json", R"({"features": {"b": true, "c": true}})");
+  root.WriteFile(kFacts, R"({"features": {"b": true, "c": true}})");
   ::setenv("HOX_LOG_LEVEL", "detail", 1);
   testing::internal::CaptureStderr();
   FeatureState_InitDeltaMode();
@@ -86,14 +78,9 @@ TEST(HostFactsTest, FactsFileGivesQuickBootAndSwitchesAndMissingOrMalformedMeans
   EXPECT_NE(log.find("Feature switch a is now 0"), std::string::npos) << log;
   EXPECT_EQ(log.find("Feature switch b"), std::string::npos) << log;
   EXPECT_NE(log.find("Feature switch c is now 1"), std::string::npos) << log;
-
-  std::vector<std::string> problems;
-  const auto facts = HoxPlatform::detail::ParseHostFacts(R"({"stmSupported": 1, "features": []})", problems);
-  EXPECT_FALSE(facts.stmSupported);
-  EXPECT_EQ(problems.size(), 2u);
 }
 
-TEST(HostFactsTest, MaintenanceModeNodeReadsTheStore) {
+TEST(HostFactsTest, MaintenanceModeNodeReadsTheStoreAndFailsWithoutOne) {
   TempRoot root;
   EXPECT_EQ(VSI_CheckSig(), 0);
   bool enabled = true;
@@ -104,8 +91,6 @@ TEST(HostFactsTest, MaintenanceModeNodeReadsTheStore) {
   EXPECT_TRUE(enabled);
   EXPECT_EQ(VSI_Get("noSuchNode", &enabled), ENOENT);
   EXPECT_EQ(VSI_Get("maintenanceMode", nullptr), EINVAL);
-
-  // A store that cannot be used fails the signature check.
   TempRoot broken;
   broken.WriteFile("/var/lib/tarvik/configstore/configstore.db", std::string(4096, 'x'));
   EXPECT_NE(VSI_CheckSig(), 0);
