@@ -10,6 +10,8 @@
 namespace hoxcm_test {
 namespace {
 
+using namespace HoxConfigManager;
+
 constexpr const char* kStore = "/var/lib/tarvik/configstore/configstore.db";
 
 class HoxcfgStoreTest : public ::testing::Test {
@@ -26,13 +28,13 @@ TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExportsToAPrivateFile) {
   const HoxcfgOutcome init = Run("init --root " + root_.path() + " --sample");
   ASSERT_EQ(init.exitCode, 0) << init.err;
   EXPECT_NE(init.out.find("installed schemas"), std::string::npos) << init.out;
-  EXPECT_TRUE(HoxConfigManager::fileExists(root_.Path(kStore)));
-  EXPECT_TRUE(HoxConfigManager::fileExists(root_.Path("/etc/tarvik/host-facts.json")));
+  EXPECT_TRUE(fileExists(root_.Path(kStore)));
+  EXPECT_TRUE(fileExists(root_.Path("/etc/tarvik/host-facts.json")));
 
   const HoxcfgOutcome exported = Run("export");
   ASSERT_EQ(exported.exitCode, 0) << exported.err;
-  HoxConfigManager::Document doc;
-  ASSERT_NO_THROW(HoxConfigManager::ParseDocument(exported.out, doc)) << exported.out;
+  Document doc;
+  ASSERT_NO_THROW(ParseDocument(exported.out, doc)) << exported.out;
   const auto* uuid = rapidjson::Pointer("/metadata/reference_host/uuid").Get(doc);
   ASSERT_NE(uuid, nullptr);
   EXPECT_STREQ(uuid->GetString(), "4c4c4544-0042-3510-8053-b4c04f4e3132");
@@ -78,7 +80,7 @@ TEST_F(HoxcfgStoreTest, ErrorsPrintTheCodeAndNothingOnStdout) {
   };
   // Reading commands need an initialised root, and create nothing.
   for (const char* command : {"export", "show", "maintenance status"}) expectError(command, "2001");
-  EXPECT_FALSE(HoxConfigManager::fileExists(root_.Path(kStore)));
+  EXPECT_FALSE(fileExists(root_.Path(kStore)));
   // A store row that is not JSON.
   InitSample();
   ExecStoreSql("UPDATE config_item SET value = '{oops' WHERE name = 'hostname'");
