@@ -90,7 +90,9 @@ TEST_F(StoreTest, ProcessesCreatingTheStoreAtOnceAllSucceed) {
   std::vector<pid_t> children;
   for (int i = 0; i < 4; ++i) {
     const pid_t child = fork();
-    if (child == 0) _exit(Fails([i] { AddBootTimeRestoreFailure({"c", "g", std::to_string(i)}); }).code == 0 ? 0 : 1);
+    if (child == 0) {
+      _exit(ThrownBy([i] { AddBootTimeRestoreFailure({"c", "g", std::to_string(i)}); }).code == 0 ? 0 : 1);
+    }
     children.push_back(child);
   }
   for (pid_t child : children) EXPECT_EQ(ExitCodeOf(child), 0);

@@ -36,8 +36,8 @@ TEST_F(StoreTest, ImportedDocumentIsReadBackInKeyThenDocumentOrderAndRebuildsExa
   // Instances keep document order and are identified by their identity
   // member; singletons have no identifier.
   EXPECT_EQ(Identifiers(rows, "vnic"), (std::vector<std::string>{"vnic0", "vnic1", "vnic2"}));
-  EXPECT_EQ(Identifiers(rows, "static"), (std::vector<std::string>{"5f0c1c9e-6a3b-4b8e-9d7a-1e2f3a4b5c6d",
-                                                                    "a1b2c3d4-e5f6-4a7b-8c9d-0e1f2a3b4c5d"}));
+  EXPECT_EQ(Identifiers(rows, "static"),
+            (std::vector<std::string>{"5f0c1c9e-6a3b-4b8e-9d7a-1e2f3a4b5c6d", "a1b2c3d4-e5f6-4a7b-8c9d-0e1f2a3b4c5d"}));
   EXPECT_EQ(Identifiers(rows, "hostname"), (std::vector<std::string>{""}));
   auto db = GetDBStore();
   for (const auto& component : source.GetObject()) {
@@ -72,7 +72,8 @@ TEST_F(StoreTest, KindsAreSeparateAndEachIsReplacedWhole) {
   // A staged object replaces its own row; a new instance gets an identity.
   auto schemas = HoxSchemaStore::SchemaStore::GetStore();
   ProcessDesiredObject(desired.GetAllocator(), GetDBStore(), "system", "identity", "hostname",
-                       HoxSchemaStore::GetSchema("system", "identity", "hostname", schemas), Json(R"({"hostname":"c"})"));
+                       HoxSchemaStore::GetSchema("system", "identity", "hostname", schemas),
+                       Json(R"({"hostname":"c"})"));
   ProcessDesiredObject(desired.GetAllocator(), GetDBStore(), "network", "routes", "static",
                        HoxSchemaStore::GetSchema("network", "routes", "static", schemas), Json(R"({"gateway":"g"})"));
   const auto staged = Rows(ConfigKind::Desired);
@@ -139,7 +140,7 @@ TEST_F(StoreTest, RowsKeepAutoConfigurationValuesAndBadValuesFailOnlyTheirReader
   // A row written by someone else whose value is not JSON.
   RawSql(StorePath(), "UPDATE config_item SET value = '{broken' WHERE name = 'config'");
   EXPECT_EQ(GetUserConfigContents(GetDBStore())[0]->at("Value"), "{broken");
-  EXPECT_EQ(Fails([] { GetCurrentConfigInternal(GetDBStore(), "services", "syslog", "config"); }).code, 2080);
+  EXPECT_EQ(ThrownBy([] { GetCurrentConfigInternal(GetDBStore(), "services", "syslog", "config"); }).code, 2080);
 }
 
 TEST_F(StoreTest, NamespaceObjectsKeepTheirValuesByteForByteAndAreReplacedWhole) {

@@ -15,7 +15,7 @@ namespace {
 using namespace HoxConfigStore;
 
 TEST_F(StoreTest, MissingStoreIsCreatedPrivatelyInWalModeUnlessCreationIsRefused) {
-  EXPECT_EQ(Fails([] { GetDBStore(0, false); }).code, 2001);
+  EXPECT_EQ(ThrownBy([] { GetDBStore(0, false); }).code, 2001);
   EXPECT_FALSE(std::filesystem::exists(StorePath()));
 
   EXPECT_EQ(GetDBStore()->GetPath(), StorePath());
@@ -63,9 +63,9 @@ TEST_F(StoreTest, CorruptForeignOrNewerStoresAreRefusedAndLeftUntouched) {
       root.WriteFile(kStoreHostPath, contents);
     }
     const std::string before = root.ReadFile(kStoreHostPath);
-    const Failure f = Fails([] { GetDBStore(); });
+    const Thrown f = ThrownBy([] { GetDBStore(); });
     EXPECT_EQ(f.code, 2001);
-    EXPECT_NE(f.what.find(reason), std::string::npos) << f.what;
+    EXPECT_NE(f.message.find(reason), std::string::npos) << f.message;
     EXPECT_TRUE(root.ReadFile(kStoreHostPath) == before) << "the refused file was changed";
     EXPECT_EQ(ConfigStore::GetStore(sGlobalNamespace), nullptr);
   }
@@ -121,19 +121,20 @@ TEST_F(StoreTest, FailedWritersLeaveTheStoreAsItWas) {
   const auto before = Rows(ConfigKind::User);
   // A malformed value in the middle of a batch, an unknown operation: nothing
   // of the batch lands.
-  EXPECT_EQ(Fails([] {
+  EXPECT_EQ(ThrownBy([] {
               ApplyUserConfigChanges({{"SET", {"system", "identity", "hostname"}, R"({"hostname":"b"})"},
                                       {"ADD", {"storage", "nfs", "mounts", "x"}, "{not json"}});
             }).code,
             2080);
-  EXPECT_EQ(Fails([] { ApplyUserConfigChanges({{"RENAME", {"system", "identity", "hostname"}, "{}"}}); }).code, 2000);
+  EXPECT_EQ(ThrownBy([] { ApplyUserConfigChanges({{"RENAME", {"system", "identity", "hostname"}, "{}"}}); }).code,
+            2000);
   // Two instances with one identity, a named instance without identity, a
   // singleton given as an array.
   for (const auto& [text, code] : std::vector<std::pair<const char*, int>>{
            {R"({"storage":{"nfs":{"mounts":[{"name":"a","export":"/a"},{"name":"a","export":"/b"}]}}})", 2084},
            {R"({"storage":{"nfs":{"mounts":[{"server":"s"}]}}})", 2084},
            {R"({"system":{"identity":{"hostname":[]}}})", 2000}}) {
-    EXPECT_EQ(Fails([&] { ImportConfiguration(ConfigKind::User, Json(text)); }).code, code) << text;
+    EXPECT_EQ(ThrownBy([&] { ImportConfiguration(ConfigKind::User, Json(text)); }).code, code) << text;
   }
   EXPECT_EQ(Rows(ConfigKind::User), before);
 

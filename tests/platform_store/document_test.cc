@@ -173,7 +173,7 @@ TEST(ConfigStoreDocumentTest, CreateDocumentParsesOrThrowsJsonParseFailed) {
   EXPECT_EQ(Compact(ConfigStoreDocument::CreateDocument(R"( {"a": [1, "\u00e9"]} )")), "{\"a\":[1,\"\xc3\xa9\"]}");
   for (const std::string& bad : {std::string(), std::string("{"), std::string("{\"a\":1} x"),
                                  std::string("\"\xff\""), std::string(600, '[')}) {
-    EXPECT_EQ(Fails([&] { ConfigStoreDocument::CreateDocument(bad); }).code, 2080) << bad;
+    EXPECT_EQ(ThrownBy([&] { ConfigStoreDocument::CreateDocument(bad); }).code, 2080) << bad;
   }
 }
 

@@ -15,6 +15,7 @@
 #include <hoxcm/documents.h>
 
 #include "support/temp_root.h"
+#include "support/thrown.h"
 
 namespace hoxcm_test {
 
@@ -64,21 +65,6 @@ inline std::string RawSql(const std::string& path, const std::string& sql) {
   sqlite3_free(error);
   sqlite3_close(db);
   return first;
-}
-
-// What a store call throws: its error code (0 when it returns) and message.
-struct Failure {
-  int code = 0;
-  std::string what;
-};
-template <typename F>
-Failure Fails(F&& f) {
-  try {
-    f();
-  } catch (const HoxConfigStore::ConfigStoreException& e) {
-    return {e.GetErrorCode(), e.what()};
-  }
-  return {};
 }
 
 // Waits for a child process: its exit code, or -1 when it did not exit.
