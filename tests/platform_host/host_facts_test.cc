@@ -26,7 +26,8 @@ TEST(HostFactsTest, HardwareIdentityComesFromDmiThenMachineIdElseFails) {
   root.WriteFile("/sys/class/dmi/id/product_uuid", "  4C4C4544-0042-3510-8053-B4C04F4E3132\n");
   root.WriteFile("/sys/class/dmi/id/sys_vendor", "Example Inc.\n");
   const auto info = HostCtl::Host::GetHardwareInfo();
-  EXPECT_EQ(info.biosUuid + "|" + info.vendor + "|" + info.product, "4C4C4544-0042-3510-8053-B4C04F4E3132|Example Inc.|");
+  EXPECT_EQ(info.biosUuid + "|" + info.vendor + "|" + info.product,
+            "4C4C4544-0042-3510-8053-B4C04F4E3132|Example Inc.|");
 }
 
 TEST(HostFactsTest, KernelReleaseSplitsIntoBuildVersionPatchAndUpdate) {
@@ -47,7 +48,8 @@ TEST(HostFactsTest, FactsFileGivesQuickBootAndSwitchesAndMissingOrMalformedMeans
   TempRoot root;
   EXPECT_FALSE(HostCtl::System::LoadHox::IsSupported());
   EXPECT_FALSE(FeatureState_IsEnabled("Qmkapps_BlockSshFileEdits"));
-  root.WriteFile(kFacts, R"({"quickBootSupported": true, "features": {"Qmkapps_BlockSshFileEdits": true, "x": "yes"}})");
+  root.WriteFile(kFacts,
+                 R"({"quickBootSupported": true, "features": {"Qmkapps_BlockSshFileEdits": true, "x": "yes"}})");
   FeatureState_InitDeltaMode();
   EXPECT_TRUE(HostCtl::System::LoadHox::IsSupported());
   EXPECT_FALSE(HostCtl::System::LoadHox::IsSTMSupported());
