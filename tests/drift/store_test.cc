@@ -2,64 +2,40 @@
 // configuration is extracted by the walk itself, items only on the host are
 // compared with their default configuration, and malformed documents leave
 // the store as it was.
-#include <fstream>
-#include <iterator>
 #include <string>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 #include <hoxcm/config_store.h>
-#include <hoxcm/documents.h>
-#include <hoxcm/drift.h>
 #include <hoxcm/operations.h>
 
-#include "support/temp_root.h"
+#include "drift/drift_fixture.h"
 
 namespace {
 
 using HoxConfigManager::Document;
-
-std::string ReadSource(const std::string& relative) {
-  std::ifstream in(hoxcm_test::SourcePath(relative));
-  return std::string(std::istreambuf_iterator<char>(in), {});
-}
-
-Document Parse(const std::string& text) {
-  Document doc;
-  HoxConfigManager::ParseDocument(text, doc);
-  return doc;
-}
+using hoxcm_test::Parse;
 
 class DriftStoreTest : public ::testing::Test {
  protected:
   DriftStoreTest() {
     root_.InstallSampleSchemas();
     HoxConfigStore::GetDBStore(0, true);
-    HoxConfigStore::ImportConfiguration(HoxConfigStore::ConfigKind::Default,
-                                        Parse(ReadSource("data/sample-host/default-config.json")));
-    HoxConfigStore::ImportConfiguration(HoxConfigStore::ConfigKind::User,
-                                        Parse(ReadSource("data/sample-host/user-config.json")));
-  }
-
-  static std::string StoreText() {
-    std::string out;
-    for (const auto& row : HoxConfigStore::GetUserConfigContents(HoxConfigStore::GetDBStore())) {
-      for (const auto& [column, value] : *row) out += column + "=" + value + ";";
-      out += "\n";
+    for (const auto& [kind, file] : {std::pair{HoxConfigStore::ConfigKind::Default, "default-config.json"},
+                                     std::pair{HoxConfigStore::ConfigKind::User, "user-config.json"}}) {
+      HoxConfigStore::ImportConfiguration(kind, Parse(hoxcm_test::ReadSource(std::string("data/sample-host/") + file)));
     }
-    return out;
   }
 
   hoxcm_test::TempRoot root_;
 };
 
 TEST_F(DriftStoreTest, TheHostsOwnConfigurationIsCompliantAndNeedsNoTasks) {
-  // Given the configuration as extraction presents it, wrapped or bare.
   Document desired = HoxConfigManager::ExtractUserConfiguration(true);
   HoxConfigManager::ComplianceResult result;
   HoxConfigManager::CheckCompliance(desired, result);
-  EXPECT_TRUE(result.compliant) << HoxConfigManager::JsonToString(result.document);
+  EXPECT_TRUE(result.compliant);
   EXPECT_EQ(HoxConfigManager::JsonToString(result.document), R"({"ADDS":[],"DELETES":[],"SETS":[]})");
   EXPECT_TRUE(HoxConfigManager::GenerateApplyTasks(desired).empty());
 }
@@ -82,20 +58,27 @@ TEST_F(DriftStoreTest, ItemsMissingFromTheDesiredDocumentRevertToTheirDefault) {
 }
 
 TEST_F(DriftStoreTest, MalformedDocumentsThrowAndLeaveTheStoreUntouched) {
-  const std::string before = StoreText();
-  const std::vector<std::string> documents = {
-      R"([1])",
-      R"({"network":{"dns":{"config":"x"}}})",
-      R"({"network":{"dns":{"config":{"servers":["1.1.1.1"]}}},"storage":{"nfs":{"mounts":[{"server":"s"}]}}})",
-      R"({"profile":{"network":{"nope":{"x":{}}}}})",
-      R"({"network":{"interfaces":{"vnic":[{"name":["vnic0"]}]}}})",
+  const auto storeText = [] {
+    std::string out;
+    for (const auto& row : HoxConfigStore::GetUserConfigContents(HoxConfigStore::GetDBStore())) {
+      for (const auto& [column, value] : *row) out += column + "=" + value + ";";
+      out += "\n";
+    }
+    return out;
   };
-  for (const std::string& text : documents) {
+  const std::string before = storeText();
+  for (const char* text : {
+           R"([1])",
+           R"({"network":{"dns":{"config":"x"}}})",
+           R"({"network":{"dns":{"config":{"servers":["1.1.1.1"]}}},"storage":{"nfs":{"mounts":[{"server":"s"}]}}})",
+           R"({"profile":{"network":{"nope":{"x":{}}}}})",
+           R"({"network":{"interfaces":{"vnic":[{"name":["vnic0"]}]}}})",
+       }) {
     Document desired = Parse(text);
     HoxConfigManager::ComplianceResult result;
     EXPECT_THROW(HoxConfigManager::CheckCompliance(desired, result), HoxConfigStore::ConfigStoreException) << text;
     EXPECT_THROW(HoxConfigManager::GenerateApplyTasks(desired), HoxConfigStore::ConfigStoreException) << text;
-    EXPECT_EQ(StoreText(), before) << text;
+    EXPECT_EQ(storeText(), before) << text;
   }
 }
 

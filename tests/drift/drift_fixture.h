@@ -1,13 +1,37 @@
-// A drift handler for tests that records every call as one line of text.
+// Helpers of the drift tests: parsing, sample files, and a drift handler that
+// records every call as one line of text.
 #pragma once
 
+#include <fstream>
+#include <iterator>
 #include <string>
 #include <vector>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/drift.h>
 
+#include "support/temp_root.h"
+
 namespace hoxcm_test {
+
+using Calls = std::vector<std::string>;
+
+inline HoxConfigManager::Document Parse(const std::string& text) {
+  HoxConfigManager::Document doc;
+  HoxConfigManager::ParseDocument(text, doc);
+  return doc;
+}
+
+inline HoxConfigManager::Document Copy(const HoxConfigManager::Value& value) {
+  HoxConfigManager::Document out;
+  out.CopyFrom(value, out.GetAllocator());
+  return out;
+}
+
+inline std::string ReadSource(const std::string& relative) {
+  std::ifstream in(SourcePath(relative));
+  return std::string(std::istreambuf_iterator<char>(in), {});
+}
 
 class RecordingHandler final : public HoxConfigManager::DriftHandler {
  public:
@@ -35,8 +59,8 @@ class RecordingHandler final : public HoxConfigManager::DriftHandler {
                     Text(desired) + " " + Text(current));
   }
 
-  std::vector<std::string> calls;
-  std::vector<std::string> records;
+  Calls calls;
+  Calls records;
 
  private:
   static std::string Id(const HoxConfigStore::ConfigStoreObjectId& id) {
