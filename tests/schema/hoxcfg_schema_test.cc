@@ -41,8 +41,11 @@ TEST(HoxcfgSchemaTest, HostDocumentsAreCheckedAgainstTheInstalledSchemas) {
   TempRoot root;
   root.InstallSampleSchemas();
   const std::string hostCheck = "--compact --root " + root.path() + " schema-check --host ";
-  HoxcfgOutcome o = RunHoxcfg(root, hostCheck + SourcePath("data/sample-host/user-config.json"));
-  EXPECT_EQ(o.exitCode, 0) << o.err << o.out;
+  HoxcfgOutcome o;
+  for (const char* sample : {"data/sample-host/user-config.json", "data/sample-host/default-config.json"}) {
+    o = RunHoxcfg(root, hostCheck + SourcePath(sample));
+    EXPECT_EQ(o.exitCode, 0) << sample << ": " << o.err << o.out;
+  }
   root.WriteFile("/doc.json", R"({"profile": {"network": {"dns": {"config": {}, "cache": {}}}}})");
   o = RunHoxcfg(root, hostCheck + root.Path("/doc.json"));
   EXPECT_EQ(o.exitCode, 1);

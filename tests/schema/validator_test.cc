@@ -159,20 +159,6 @@ TEST(ValidatorTest, HostDocumentReportsEveryFaultyItemWithoutSensitiveValues) {
   EXPECT_EQ(Serialize(result).find("tiny-secret"), std::string::npos);
 }
 
-TEST(ValidatorTest, SampleConfigurationsMatchTheirSchemas) {
-  hoxcm_test::TempRoot root;
-  root.InstallSampleSchemas();
-  for (const char* file : {"data/sample-host/user-config.json", "data/sample-host/default-config.json"}) {
-    SCOPED_TRACE(file);
-    Document doc;
-    HoxConfigManager::CreateDocumentFromFile(hoxcm_test::SourcePath(file).c_str(), doc);
-    Document schema;
-    ASSERT_TRUE(HoxConfigManager::GenerateHostDocumentSchema(doc, schema));
-    Document result;
-    EXPECT_EQ(JsonValidator::ValidateCMDocument(schema, doc, result, {}, ""), 0) << Serialize(result);
-  }
-}
-
 TEST(ValidatorTest, ErrorCodesMapToMessageIds) {
   EXPECT_EQ(JsonValidator::ConvertErrorCodeToMsgId(9), "com.tarvik.hox.settings.validation.required");
   EXPECT_EQ(JsonValidator::ConvertErrorCodeToMsgId(32), "com.tarvik.hox.settings.validation.union.tag");
@@ -190,9 +176,5 @@ TEST(ValidatorTest, LongStringsNeverReachThePatternMatcher) {
       "cert": {"type": "string", "maxLength": 300000},
       "tags": {"type": "object", "patternProperties": {"^[a-z]+$": {"type": "string"}}}}})");
   const Document doc = Parse(R"({"name":")" + huge + R"(","cert":")" + huge + R"(","tags":{")" + huge + R"(":"x"}})");
-  const Findings found = Check(schema, doc);
-  ASSERT_EQ(found.size(), 2u);
-  EXPECT_EQ(found[0], (std::pair<std::string, int>("/name", 8)));
-  EXPECT_EQ(found[1].second, 8);
-  EXPECT_EQ(found[1].first.size(), std::string("/tags/").size() + huge.size());
+  EXPECT_EQ(Check(schema, doc), (Findings{{"/name", 8}, {"/tags/" + huge, 8}}));
 }
