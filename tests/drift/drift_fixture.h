@@ -1,5 +1,5 @@
 // Helpers of the drift tests: parsing, sample files, and a drift handler that
-// records every call as one line of text.
+// records every call as one line of text (drift records aside).
 #pragma once
 
 #include <fstream>
@@ -44,9 +44,8 @@ class RecordingHandler final : public HoxConfigManager::DriftHandler {
   }
   void Set(const HoxConfigManager::Value& desired, const HoxConfigManager::Value& current,
            const HoxConfigStore::ConfigStoreObjectId& id, const std::shared_ptr<HoxSchemaStore::SchemaObject>&,
-           const std::string& path, const HoxConfigManager::Value& drift) override {
+           const std::string& path, const HoxConfigManager::Value&) override {
     calls.push_back("Set " + path + Id(id) + " " + Text(desired) + " " + Text(current));
-    records.push_back(Text(drift));
   }
   void Delete(const HoxConfigManager::Value& current, const HoxConfigStore::ConfigStoreObjectId& id,
               const std::shared_ptr<HoxSchemaStore::SchemaObject>&, const std::string& path) override {
@@ -60,7 +59,6 @@ class RecordingHandler final : public HoxConfigManager::DriftHandler {
   }
 
   Calls calls;
-  Calls records;
 
  private:
   static std::string Id(const HoxConfigStore::ConfigStoreObjectId& id) {

@@ -89,16 +89,20 @@ TEST_F(DriftHandlersTest, ComplianceReportLayout) {
 
 TEST_F(DriftHandlersTest, ApplyTasksCarryObjectActionAndDrift) {
   // Given a changed, an added and a removed instance, the tasks are SET (with
-  // its drift record), ADD, then DELETE carrying the host value.
-  Document d = Parse(R"({"storage":{"nfs":{"mounts":[{"name":"a","server":"new"},{"name":"b"}]}}})");
+  // a drift record marking each changed member, nested ones included), ADD,
+  // then DELETE carrying the host value.
+  const std::string vnic0New = R"({"name":"vnic0","mtu":9000,"ipv4":{"address":"10.0.0.6","netmask":"m"}})";
+  const std::string vnic1 = R"({"name":"vnic1","mtu":9000})";
+  Document d = Parse(R"({"network":{"interfaces":{"vnic":[)" + vnic0New + R"(,{"name":"vnic2"}]}}})");
   HoxConfigManager::ApplyTaskGenerator generator;
-  HoxConfigManager::ComputeDrift(d, d.GetAllocator(), generator,
-                                 Parse(R"({"storage":{"nfs":{"mounts":[{"name":"c"},{"name":"a","server":"old"}]}}})"));
-  const std::string key = "comp storage grp nfs key mounts id ";
+  HoxConfigManager::ComputeDrift(d, d.GetAllocator(), generator, Parse(R"({"network":{"interfaces":{"vnic":[)" +
+      vnic1 + R"(,{"name":"vnic0","mtu":1500,"ipv4":{"address":"10.0.0.5","netmask":"m"}}]}}})"));
+  const std::string key = "comp network grp interfaces key vnic id ";
+  const std::string set = R"("DRIFTOBJ":{"INSTANCEID":"vnic0","DRIFTOP":"SET"})";
   EXPECT_EQ(Describe(generator.getTasks()),
-            (Calls{"SET " + key + R"(a {"name":"a","server":"new"} {"DRIFTOBJ":{"INSTANCEID":"a","DRIFTOP":"SET"},)"
-                       R"("server":{"DRIFTOBJ":{"INSTANCEID":"a","DRIFTOP":"SET"}}})",
-                   "ADD " + key + R"(b {"name":"b"})", "DELETE " + key + R"(c {"name":"c"})"}));
+            (Calls{"SET " + key + "vnic0 " + vnic0New + " {" + set + R"(,"mtu":{)" + set + R"(},"ipv4":{)" + set +
+                       R"(,"address":{)" + set + "}}}",
+                   "ADD " + key + R"(vnic2 {"name":"vnic2"})", "DELETE " + key + "vnic1 " + vnic1}));
 }
 
 TEST_F(DriftHandlersTest, BootTimeTasksListEveryItemWithoutComparing) {

@@ -2,6 +2,7 @@
 // configuration is extracted by the walk itself, items only on the host are
 // compared with their default configuration, and malformed documents leave
 // the store as it was.
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -57,28 +58,50 @@ TEST_F(DriftStoreTest, ItemsMissingFromTheDesiredDocumentRevertToTheirDefault) {
   EXPECT_EQ(seen[2].rfind("DELETE comp storage grp nfs key mounts id ", 0), 0u);
 }
 
-TEST_F(DriftStoreTest, MalformedDocumentsThrowAndLeaveTheStoreUntouched) {
+TEST_F(DriftStoreTest, MalformedDocumentsThrowBeforeAnyReportAndLeaveTheStoreUntouched) {
+  struct Case {
+    const char* what;
+    const char* desired;
+    std::string failure = "2000 Invalid JSON";
+  };
+  const std::vector<Case> cases = {
+      {"document is an array", "[1]"},
+      {"component is a string", R"({"network":"x"})"},
+      {"group is an array", R"({"network":{"dns":[]}})"},
+      {"singleton is an array", R"({"network":{"dns":{"config":[]}}})"},
+      {"instances are an object", R"({"storage":{"nfs":{"mounts":{}}}})"},
+      {"instance is a string", R"({"storage":{"nfs":{"mounts":["a"]}}})"},
+      {"instance without identity after a valid one", R"({"storage":{"nfs":{"mounts":[{"name":"a"},{"server":"s"}]}}})"},
+      {"identity is not a string", R"({"network":{"interfaces":{"vnic":[{"name":["vnic0"]}]}}})"},
+      {"key without schema", R"({"no":{"such":{"key":{}}}})", "2021 Schema object not found: /no/such/key"},
+      {"key without schema in a profile", R"({"profile":{"network":{"nope":{"x":{}}}}})",
+       "2021 Schema object not found: /network/nope/x"},
+  };
+  const auto failure = [](const std::function<void()>& f) -> std::string {
+    try {
+      f();
+    } catch (const HoxConfigStore::ConfigStoreException& e) {
+      return std::to_string(e.GetErrorCode()) + " " + e.what();
+    }
+    return "no exception";
+  };
   const auto storeText = [] {
     std::string out;
     for (const auto& row : HoxConfigStore::GetUserConfigContents(HoxConfigStore::GetDBStore())) {
-      for (const auto& [column, value] : *row) out += column + "=" + value + ";";
-      out += "\n";
+      for (const auto& [column, value] : *row) out += column + "=" + value + ";\n";
     }
     return out;
   };
   const std::string before = storeText();
-  for (const char* text : {
-           R"([1])",
-           R"({"network":{"dns":{"config":"x"}}})",
-           R"({"network":{"dns":{"config":{"servers":["1.1.1.1"]}}},"storage":{"nfs":{"mounts":[{"server":"s"}]}}})",
-           R"({"profile":{"network":{"nope":{"x":{}}}}})",
-           R"({"network":{"interfaces":{"vnic":[{"name":["vnic0"]}]}}})",
-       }) {
-    Document desired = Parse(text);
+  for (const Case& c : cases) {
+    Document desired = Parse(c.desired);
+    hoxcm_test::RecordingHandler handler;
+    EXPECT_EQ(failure([&] { ComputeDrift(desired, desired.GetAllocator(), handler, Parse("{}")); }), c.failure) << c.what;
+    EXPECT_EQ(handler.calls, hoxcm_test::Calls{}) << c.what;
     HoxConfigManager::ComplianceResult result;
-    EXPECT_THROW(HoxConfigManager::CheckCompliance(desired, result), HoxConfigStore::ConfigStoreException) << text;
-    EXPECT_THROW(HoxConfigManager::GenerateApplyTasks(desired), HoxConfigStore::ConfigStoreException) << text;
-    EXPECT_EQ(storeText(), before) << text;
+    EXPECT_EQ(failure([&] { HoxConfigManager::CheckCompliance(desired, result); }), c.failure) << c.what;
+    EXPECT_EQ(failure([&] { HoxConfigManager::GenerateApplyTasks(desired); }), c.failure) << c.what;
+    EXPECT_EQ(storeText(), before) << c.what;
   }
 }
 
