@@ -1,4 +1,4 @@
-// Document building and reshaping: host sections, items, clean-up,
+// Document building and reshaping: host sections, clean-up,
 // normalisation, auto-configuration patches, parsing and instance ids.
 #include <regex>
 #include <set>
@@ -74,24 +74,6 @@ TEST(ConfigStoreDocumentTest, SplitDocumentMovesHostSpecificKeysAndIsUndoneByDoc
   EXPECT_EQ(Compact(merged), "{\"profile\":" + Compact(whole) + "}");
 }
 
-TEST(ConfigStoreDocumentTest, AddObjectPlacesSingletonsAndAppendsInstancesUnderTheProfile) {
-  rapidjson::Document doc;
-  ConfigStoreDocument::AddProfile(doc);
-  auto add = [&doc](const char* key, const char* id, const char* text) {
-    rapidjson::Value value(Json(text), doc.GetAllocator());
-    ConfigStoreDocument::AddObject(doc, "storage", "nfs", key, id, value, doc.GetAllocator());
-  };
-  add("server", "", R"({"host":"h"})");
-  add("mounts", "a", R"({"name":"a"})");
-  add("mounts", "b", R"({"name":"b"})");
-  EXPECT_EQ(Compact(doc), R"({"profile":{"storage":{"nfs":{"server":{"host":"h"},)"
-                          R"("mounts":[{"name":"a"},{"name":"b"}]}}}})");
-  // A singleton stored where instances already are is malformed input.
-  add("mounts", "", "{}");
-  EXPECT_TRUE(doc["profile"]["storage"]["nfs"]["mounts"].IsObject());
-  EXPECT_THROW(add("mounts", "c", "{}"), ConfigStoreException);
-}
-
 TEST(ConfigStoreDocumentTest, CleanupActionsDropWhatEachPromises) {
   const rapidjson::Document schema = Json(R"({"type": "object",
     "properties": {
@@ -146,14 +128,14 @@ TEST(ConfigStoreDocumentTest, NormalizeValueSortsMembersAtEveryDepthAndKeepsArra
 TEST(ConfigStoreDocumentTest, PatchesFillFromAutoConfigurationValues) {
   const rapidjson::Document autoConf =
       Json(R"({"protocol":"udp","port":514,"tls":{"caFile":"/ca","verify":true},"servers":["a","b","c","d"]})");
+  // A plain missing member is patched in the host document tests; here the
+  // field paths, members already present and what may stand in the way.
   const std::vector<std::tuple<bool, const char*, const char*, const char*>> cases = {  // union tag?
-      {false, R"({"remoteHost":"h"})", "/port", R"({"remoteHost":"h","port":514})"},
       {false, R"({"remoteHost":"h"})", "port", R"({"remoteHost":"h","port":514})"},
-      {false, R"({"port":1})", "/port", R"({"port":1})"},              // present: kept
+      {false, R"({"port":1})", "/port", R"({"port":1})"},
       {false, R"({"remoteHost":"h"})", "/missing", R"({"remoteHost":"h"})"},  // nothing to patch from
       {false, R"({"tls":{"caFile":"/mine"}})", "/tls", R"({"tls":{"caFile":"/mine","verify":true}})"},
       {true, R"({"protocol":"carrier-pigeon"})", "/protocol", R"({"protocol":"udp"})"},
-      {true, R"({"remoteHost":"h"})", "/protocol", R"({"remoteHost":"h","protocol":"udp"})"},
       // Only members of objects that exist are patched: nothing in the way
       // is turned into an object, and no array is padded.
       {false, R"({"tls":"off"})", "/tls/caFile", R"({"tls":"off"})"},
@@ -169,12 +151,10 @@ TEST(ConfigStoreDocumentTest, PatchesFillFromAutoConfigurationValues) {
   }
 }
 
+// The parser's refusals are the shared parser's; here only their mapping.
 TEST(ConfigStoreDocumentTest, CreateDocumentParsesOrThrowsJsonParseFailed) {
   EXPECT_EQ(Compact(ConfigStoreDocument::CreateDocument(R"( {"a": [1, "\u00e9"]} )")), "{\"a\":[1,\"\xc3\xa9\"]}");
-  for (const std::string& bad : {std::string(), std::string("{"), std::string("{\"a\":1} x"),
-                                 std::string("\"\xff\""), std::string(600, '[')}) {
-    EXPECT_EQ(ThrownBy([&] { ConfigStoreDocument::CreateDocument(bad); }).code, 2080) << bad;
-  }
+  EXPECT_EQ(ThrownBy([] { ConfigStoreDocument::CreateDocument("{\"a\":1} x"); }).code, 2080);
 }
 
 TEST(ConfigStoreDocumentTest, GeneratedInstanceIdsAreDistinctVersion4Uuids) {
