@@ -16,17 +16,11 @@ using HoxConfigManager::Document;
 using HoxConfigStore::ConfigStoreDocument;
 using hoxcm_test::Parse;
 
-const char* kUserSchema = R"({
-  "type": "object",
-  "properties": {
-    "name": {"type": "string"},
-    "shell": {"type": "string", "default": "/bin/sh"},
-    "uid": {"type": "integer"},
+const char* kUserSchema = R"({"type": "object", "properties": {
+    "name": {"type": "string"}, "shell": {"type": "string", "default": "/bin/sh"}, "uid": {"type": "integer"},
     "groups": {"type": "array", "items": {"type": "string"}},
     "keys": {"type": "array", "items": {"type": "object", "properties": {"key": {"type": "string"}}}},
-    "home": {"type": "object", "properties": {"path": {"type": "string"}, "quota": {"type": "integer"}}}
-  }
-})";
+    "home": {"type": "object", "properties": {"path": {"type": "string"}, "quota": {"type": "integer"}}}}})";
 
 // A JSON array of `count` elements made by `element(i)`.
 std::string Array(int count, const std::function<std::string(int)>& element) {
@@ -100,22 +94,15 @@ TEST(IsEqualValueTest, FollowsTheDocumentedRules) {
 }
 
 TEST(RedactAndSerializeValueTest, MasksSensitivePropertiesAtAnyDepth) {
-  const Document schema = Parse(R"({
-    "type": "array",
-    "items": {
-      "type": "object",
-      "properties": {
-        "name": {"type": "string"},
-        "password": {"type": "string", "sensitive": true},
-        "tokens": {"type": "array", "items": {"type": "object",
-                   "properties": {"secret": {"type": "string", "sensitive": true}, "id": {"type": "string"}}}},
-        "nested": {"type": "object", "properties": {"pin": {"type": "integer", "sensitive": true}}},
-        "extra": {"type": "object", "additionalProperties": {"type": "string", "sensitive": true}},
-        "variant": {"oneOf": [{"properties": {"key": {"type": "string"}}},
-                              {"properties": {"key": {"type": "string", "sensitive": true}}}]}
-      }
-    }
-  })");
+  const Document schema = Parse(R"({"type": "array", "items": {"type": "object", "properties": {
+    "name": {"type": "string"},
+    "password": {"type": "string", "sensitive": true},
+    "tokens": {"type": "array", "items": {"type": "object",
+               "properties": {"secret": {"type": "string", "sensitive": true}, "id": {"type": "string"}}}},
+    "nested": {"type": "object", "properties": {"pin": {"type": "integer", "sensitive": true}}},
+    "extra": {"type": "object", "additionalProperties": {"type": "string", "sensitive": true}},
+    "variant": {"oneOf": [{"properties": {"key": {"type": "string"}}},
+                          {"properties": {"key": {"type": "string", "sensitive": true}}}]}}}})");
   const char* instance = R"({"name":"root","password":"hunter2","tokens":[{"id":"t","secret":"s1"}],)"
                          R"("nested":{"pin":1234},"extra":{"a":"x"},"variant":{"key":"k"}})";
   const std::string masked = R"({"name":"root","password":"******","tokens":[{"id":"t","secret":"******"}],)"

@@ -34,25 +34,25 @@ inline std::string ReadSource(const std::string& relative) {
 }
 
 class RecordingHandler final : public HoxConfigManager::DriftHandler {
+  using Id = HoxConfigStore::ConfigStoreObjectId;
+  using Schema = std::shared_ptr<HoxSchemaStore::SchemaObject>;
+  using Value = HoxConfigManager::Value;
+
  public:
   RecordingHandler(bool consolidated = true, bool driftRecords = true, bool perProperty = false)
       : DriftHandler(consolidated, driftRecords, perProperty) {}
 
-  void Add(const HoxConfigManager::Value& desired, const HoxConfigStore::ConfigStoreObjectId& id,
-           const std::shared_ptr<HoxSchemaStore::SchemaObject>&, const std::string& path) override {
-    calls.push_back("Add " + path + Id(id) + " " + Text(desired));
+  void Add(const Value& desired, const Id& id, const Schema&, const std::string& path) override {
+    calls.push_back("Add " + path + Text(id) + " " + Text(desired));
   }
-  void Set(const HoxConfigManager::Value& desired, const HoxConfigManager::Value& current,
-           const HoxConfigStore::ConfigStoreObjectId& id, const std::shared_ptr<HoxSchemaStore::SchemaObject>&,
-           const std::string& path, const HoxConfigManager::Value&) override {
-    calls.push_back("Set " + path + Id(id) + " " + Text(desired) + " " + Text(current));
+  void Set(const Value& desired, const Value& current, const Id& id, const Schema&, const std::string& path,
+           const Value&) override {
+    calls.push_back("Set " + path + Text(id) + " " + Text(desired) + " " + Text(current));
   }
-  void Delete(const HoxConfigManager::Value& current, const HoxConfigStore::ConfigStoreObjectId& id,
-              const std::shared_ptr<HoxSchemaStore::SchemaObject>&, const std::string& path) override {
-    calls.push_back("Delete " + path + Id(id) + " " + Text(current));
+  void Delete(const Value& current, const Id& id, const Schema&, const std::string& path) override {
+    calls.push_back("Delete " + path + Text(id) + " " + Text(current));
   }
-  void PropertyDrift(const HoxConfigManager::Value& desired, const HoxConfigManager::Value& current,
-                     const HoxConfigManager::Value&, const std::string& path,
+  void PropertyDrift(const Value& desired, const Value& current, const Value&, const std::string& path,
                      HoxConfigManager::ACTION action) override {
     calls.push_back(std::string("Property ") + HoxConfigManager::ActionName(action) + " " + path + " " +
                     Text(desired) + " " + Text(current));
@@ -61,10 +61,8 @@ class RecordingHandler final : public HoxConfigManager::DriftHandler {
   Calls calls;
 
  private:
-  static std::string Id(const HoxConfigStore::ConfigStoreObjectId& id) {
-    return id.instanceId.empty() ? "" : " [" + id.instanceId + "]";
-  }
-  static std::string Text(const HoxConfigManager::Value& v) { return HoxConfigManager::JsonToString(v); }
+  static std::string Text(const Id& id) { return id.instanceId.empty() ? "" : " [" + id.instanceId + "]"; }
+  static std::string Text(const Value& v) { return HoxConfigManager::JsonToString(v); }
 };
 
 }  // namespace hoxcm_test

@@ -1,5 +1,6 @@
 // The handlers built on the drift walk: the compliance report, the apply
 // tasks and the boot-time tasks, on hand-written and generated documents.
+#include <regex>
 #include <set>
 #include <string>
 #include <vector>
@@ -120,19 +121,12 @@ TEST_F(DriftHandlersTest, BootTimeTasksListEveryItemWithoutComparing) {
                HoxConfigStore::ConfigStoreException);
 }
 
-// Object-level path of a report entry: the item, or the instance below it.
+// Object-level path of a report entry: the key, and the position of the
+// instance below it.
 std::string ObjectPath(const std::string& path) {
-  size_t slashes = 0, i = 0;
-  for (; i < path.size(); ++i) {
-    if (path[i] == '/' && ++slashes == 5) break;
-  }
-  std::string head = path.substr(0, i);
-  // Singletons stop at the key; instances carry a numeric fifth segment.
-  const size_t last = head.rfind('/');
-  if (slashes >= 4 && head.find_first_not_of("0123456789", last + 1) != std::string::npos) {
-    head = head.substr(0, last);
-  }
-  return head;
+  std::smatch match;
+  std::regex_search(path, match, std::regex("^/[^/]+/[^/]+/[^/]+(/[0-9]+(?=/|$))?"));
+  return match.str(0);
 }
 
 TEST(GeneratedDocumentsTest, SelfDriftIsEmptyProfileChangesNothingAndHandlersAgree) {
