@@ -25,6 +25,7 @@ using HoxConfigStore::detail::IsContainer;
 using HoxConfigStore::detail::IsGeneratedId;
 using HoxConfigStore::detail::MemberIndex;
 using HoxConfigStore::detail::NameOf;
+using HoxConfigStore::detail::SameBytes;
 using HoxConfigStore::detail::SameScalar;
 using HoxSchemaStore::SchemaObject;
 using rapidjson::SizeType;
@@ -239,14 +240,22 @@ class DriftWalk {
       desiredIds.reserve(d.Size());
       hostIds.reserve(h.Size());
     }
-    const Value identityName(rapidjson::StringRef(identity.data(), static_cast<SizeType>(identity.size())));
     for (auto [side, ids] : {std::pair{&d, &desiredIds}, std::pair{&h, &hostIds}}) {
-      for (const Value& instance : side->GetArray()) {
+      const SizeType n = side->Size();
+      for (SizeType i = 0; i < n; ++i) {
+        const Value& instance = (*side)[i];
         RAPIDJSON_ASSERT(instance.IsObject());
         if (generated) continue;
-        auto member = instance.FindMember(identityName);
-        RAPIDJSON_ASSERT(member != instance.MemberEnd() && member->value.IsString());
-        ids->push_back(&member->value);
+        // This loop is the first to read each instance's members: fetch
+        // those of a later instance while this one is searched.
+        constexpr SizeType kAhead = 6;
+        if (i + kAhead < n) {
+          const Value& later = (*side)[i + kAhead];
+          if (later.IsObject() && later.MemberCount() > 0) __builtin_prefetch(&*later.MemberBegin());
+        }
+        const Value* member = HoxConfigStore::detail::FindByName(instance, identity);
+        RAPIDJSON_ASSERT(member != nullptr && member->IsString());
+        ids->push_back(member);
       }
     }
     const Value& node = schema->GetInstanceSchema();
@@ -284,7 +293,7 @@ class DriftWalk {
         const Value& name = *desiredIds[i];
         const std::string_view key = NameOf(name);
         const SizeType j =
-            matcher.Take([&](SizeType p) { return NameOf(*hostIds[p]) == key; }, [&] { return key; });
+            matcher.Take([&](SizeType p) { return SameBytes(NameOf(*hostIds[p]), key); }, [&] { return key; });
         id.instanceId.assign(name.GetString(), name.GetStringLength());
         const PathSegment segment(path_, i);
         if (j == kNone) {
@@ -332,8 +341,7 @@ class DriftWalk {
 
 const Value* FindIn(const Value* object, const Value& name) {
   if (object == nullptr || !object->IsObject()) return nullptr;
-  auto it = object->FindMember(name);
-  return it == object->MemberEnd() ? nullptr : &it->value;
+  return HoxConfigStore::detail::FindByName(*object, NameOf(name));
 }
 
 // Lookups in the other document: wide levels (many components, groups or

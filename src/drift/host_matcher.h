@@ -81,15 +81,17 @@ class PositionIndex {
     SizeType head = kNone;
     SizeType tail = kNone;
   };
-  static std::uint64_t HashOf(std::string_view key) { return std::hash<std::string_view>()(key); }
+  static std::uint64_t HashOf(std::string_view key) { return HoxConfigStore::detail::HashBytes(key); }
   static std::uint64_t HashOf(std::uint64_t key) { return HoxConfigStore::detail::Mix(key); }
+  static bool SameKey(std::string_view a, std::string_view b) { return HoxConfigStore::detail::SameBytes(a, b); }
+  static bool SameKey(std::uint64_t a, std::uint64_t b) { return a == b; }
 
   // The slot holding `key`, or the empty slot where it belongs. A group
   // whose positions are all matched keeps its slot, so probing stays valid.
   Slot& Probe(const Key& key, std::uint64_t hash) {
     for (std::size_t i = hash & mask_;; i = (i + 1) & mask_) {
       Slot& slot = slots_[i];
-      if (slot.tail == kNone || (slot.hash == hash && slot.key == key)) return slot;
+      if (slot.tail == kNone || (slot.hash == hash && SameKey(slot.key, key))) return slot;
     }
   }
 

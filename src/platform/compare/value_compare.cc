@@ -52,7 +52,7 @@ std::uint64_t NumberHash(const Value& v) {
   return Mix(std::bit_cast<std::uint64_t>(d));
 }
 
-std::uint64_t StringHash(const Value& v) { return std::hash<std::string_view>()(NameOf(v)); }
+std::uint64_t StringHash(const Value& v) { return HashBytes(NameOf(v)); }
 
 // Hash of an element of a scalar array, agreeing with SameScalar.
 std::uint64_t ScalarHash(const Value& v) {
@@ -63,19 +63,18 @@ std::uint64_t ScalarHash(const Value& v) {
 
 }  // namespace
 
-MemberIndex::MemberIndex(const Value& object) : object_(object) {
-  if (object.MemberCount() <= kWideObject) return;
-  index_.reserve(object.MemberCount());
+void MemberIndex::BuildIndex() {
+  index_.reserve(count_);
   SizeType i = 0;
-  for (auto it = object.MemberBegin(); it != object.MemberEnd(); ++it, ++i) index_.emplace(NameOf(it->name), i);
+  for (auto it = object_.MemberBegin(); it != object_.MemberEnd(); ++it, ++i) index_.emplace(NameOf(it->name), i);
 }
 
-const Value* MemberIndex::Find(std::string_view name) {
+const Value* MemberIndex::FindSlow(std::string_view name) {
   if (!index_.empty()) {
     auto it = index_.find(name);
     return it == index_.end() ? nullptr : &(object_.MemberBegin() + it->second)->value;
   }
-  const SizeType n = object_.MemberCount();
+  const SizeType n = count_;
   auto members = object_.MemberBegin();
   for (SizeType k = 0; k < n; ++k) {
     SizeType i = next_ + k;
@@ -106,11 +105,11 @@ const Value& SchemaForValue(const Value& value) {
 
 std::string_view SchemaType(const Value& schema) {
   if (!schema.IsObject()) return {};
-  auto it = schema.FindMember("type");
-  if (it == schema.MemberEnd()) return {};
-  if (it->value.IsString()) return NameOf(it->value);
-  if (it->value.IsArray()) {
-    for (const Value& t : it->value.GetArray()) {
+  const Value* type = FindByName(schema, "type");
+  if (type == nullptr) return {};
+  if (type->IsString()) return NameOf(*type);
+  if (type->IsArray()) {
+    for (const Value& t : type->GetArray()) {
       if (t.IsString() && NameOf(t) != "null") return NameOf(t);
     }
   }
@@ -123,19 +122,24 @@ const ValueComparer::SchemaInfo& ValueComparer::Info(const Value& schema) {
   info = SchemaInfo{};
   info.schema = &schema;
   if (!schema.IsObject()) return info;
-  auto props = schema.FindMember("properties");
-  if (props != schema.MemberEnd() && props->value.IsObject()) {
-    info.properties = &props->value;
-    if (props->value.MemberCount() > kWideObject) {
-      auto& index = wideIndexes_[&props->value];
-      if (!index) index = std::make_unique<MemberIndex>(props->value);
+  // One pass over the node's members instead of one search per keyword.
+  const Value* props = nullptr;
+  const Value* extra = nullptr;
+  for (auto it = schema.MemberBegin(); it != schema.MemberEnd(); ++it) {
+    const std::string_view name = NameOf(it->name);
+    if (props == nullptr && name == "properties") props = &it->value;
+    else if (extra == nullptr && name == "additionalProperties") extra = &it->value;
+    else if (info.defaultValue == nullptr && name == "default") info.defaultValue = &it->value;
+  }
+  if (props != nullptr && props->IsObject()) {
+    info.properties = props;
+    if (props->MemberCount() > kWideObject) {
+      auto& index = wideIndexes_[props];
+      if (!index) index = std::make_unique<MemberIndex>(*props);
       info.wide = index.get();
     }
   }
-  auto extra = schema.FindMember("additionalProperties");
-  if (extra != schema.MemberEnd() && extra->value.IsObject()) info.additional = &extra->value;
-  auto def = schema.FindMember("default");
-  if (def != schema.MemberEnd()) info.defaultValue = &def->value;
+  if (extra != nullptr && extra->IsObject()) info.additional = extra;
   return info;
 }
 
@@ -168,16 +172,16 @@ const Value& ValueComparer::Children::Of(std::string_view name, const Value& val
 
 const Value& ValueComparer::Items(const Value& schema, const Value& element) {
   if (schema.IsObject()) {
-    auto items = schema.FindMember("items");
-    if (items != schema.MemberEnd() && items->value.IsObject()) return items->value;
+    const Value* items = FindByName(schema, "items");
+    if (items != nullptr && items->IsObject()) return *items;
   }
   return SchemaForValue(element);
 }
 
 bool ValueComparer::HoldsObjects(const Value& schema, const Value& a, const Value& b) {
   if (schema.IsObject()) {
-    auto items = schema.FindMember("items");
-    if (items != schema.MemberEnd() && SchemaType(items->value) == "object") return true;
+    const Value* items = FindByName(schema, "items");
+    if (items != nullptr && SchemaType(*items) == "object") return true;
   }
   for (const Value* array : {&a, &b}) {
     for (const Value& e : array->GetArray()) {

@@ -46,6 +46,48 @@ inline bool SameBytes(std::string_view a, std::string_view b) {
 }
 inline bool IsGeneratedId(const rapidjson::Value& name) { return NameOf(name) == kGeneratedIdMember; }
 
+inline std::uint64_t Mix(std::uint64_t x) {
+  x += 0x9e3779b97f4a7c15ULL;
+  x = (x ^ (x >> 30)) * 0xbf58476d1ce4e5b9ULL;
+  x = (x ^ (x >> 27)) * 0x94d049bb133111ebULL;
+  return x ^ (x >> 31);
+}
+
+// A hash of bytes, eight at a time: names and identities are short, and the
+// library's general-purpose string hash costs several times more on them.
+inline std::uint64_t HashBytes(std::string_view s) {
+  const char* p = s.data();
+  std::size_t n = s.size();
+  std::uint64_t h = n * 0x9e3779b97f4a7c15ULL;
+  for (; n >= 8; p += 8, n -= 8) {
+    std::uint64_t word;
+    std::memcpy(&word, p, 8);
+    h = (h ^ word) * 0xbf58476d1ce4e5b9ULL;
+    h ^= h >> 29;
+  }
+  if (n > 0) {
+    std::uint64_t word = 0;
+    std::memcpy(&word, p, n);
+    h = (h ^ word) * 0x94d049bb133111ebULL;
+  }
+  return Mix(h);
+}
+struct BytesHash {
+  std::size_t operator()(std::string_view s) const { return HashBytes(s); }
+};
+struct SameBytesEqual {
+  bool operator()(std::string_view a, std::string_view b) const { return SameBytes(a, b); }
+};
+
+// The first member of `object` named `name`, or null; FindMember without
+// building a name value or calling memcmp for short names.
+inline const rapidjson::Value* FindByName(const rapidjson::Value& object, std::string_view name) {
+  for (auto it = object.MemberBegin(); it != object.MemberEnd(); ++it) {
+    if (SameBytes(NameOf(it->name), name)) return &it->value;
+  }
+  return nullptr;
+}
+
 // Name → member lookup of one object, indexed when the object is wide. With
 // duplicate names (malformed input) any one of them may be found. Narrow objects
 // are searched from just after the previous hit, so that looking up the
@@ -53,13 +95,29 @@ inline bool IsGeneratedId(const rapidjson::Value& name) { return NameOf(name) ==
 // comparison each.
 class MemberIndex {
  public:
-  explicit MemberIndex(const rapidjson::Value& object);
-  const rapidjson::Value* Find(std::string_view name);
+  explicit MemberIndex(const rapidjson::Value& object) : object_(object), count_(object.MemberCount()) {
+    if (count_ > kWideObject) BuildIndex();
+  }
+  const rapidjson::Value* Find(std::string_view name) {
+    // The member after the previous hit, tried first without a call.
+    if (index_.empty() && next_ < count_) {
+      const auto& member = object_.MemberBegin()[next_];
+      if (SameBytes(NameOf(member.name), name)) {
+        ++next_;
+        return &member.value;
+      }
+    }
+    return FindSlow(name);
+  }
 
  private:
+  void BuildIndex();
+  const rapidjson::Value* FindSlow(std::string_view name);
+
   const rapidjson::Value& object_;
+  const rapidjson::SizeType count_;
   rapidjson::SizeType next_ = 0;
-  std::unordered_map<std::string_view, rapidjson::SizeType> index_;
+  std::unordered_map<std::string_view, rapidjson::SizeType, BytesHash, SameBytesEqual> index_;
 };
 
 // A schema to use for a value the schema does not describe: {"type": T} with
@@ -138,12 +196,5 @@ inline bool IsContainer(const rapidjson::Value& v) { return v.IsObject() || v.Is
 // Order-insensitive equality of two arrays of scalars: each element of `b`
 // matches at most one element of `a`, by JSON type, then value.
 bool EqualPrimitiveArrays(const rapidjson::Value& a, const rapidjson::Value& b);
-
-inline std::uint64_t Mix(std::uint64_t x) {
-  x += 0x9e3779b97f4a7c15ULL;
-  x = (x ^ (x >> 30)) * 0xbf58476d1ce4e5b9ULL;
-  x = (x ^ (x >> 27)) * 0x94d049bb133111ebULL;
-  return x ^ (x >> 31);
-}
 
 }  // namespace HoxConfigStore::detail

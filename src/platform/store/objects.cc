@@ -1,6 +1,7 @@
 // Store object values, namespace stores and transactions.
 #include <unistd.h>
 
+#include <algorithm>
 #include <random>
 
 #include <hoxcm/config_store.h>
@@ -85,10 +86,54 @@ const std::map<std::string, std::string>& StoreObject::GetValues() const { retur
 ConfigStoreObject::ConfigStoreObject(ConfigStoreObjectId id)
     : StoreObject(std::move(id)), data_(std::make_shared<rapidjson::Document>()) {}
 
-ConfigStoreObject::ConfigStoreObject(ConfigStoreObjectId id, const rapidjson::Value& data)
-    : ConfigStoreObject(std::move(id)) {
-  data_->CopyFrom(data, data_->GetAllocator());
+namespace {
+
+// Bytes a copy of `value` takes in a memory pool: member and element arrays
+// and the strings too long to be stored inside their value, each aligned.
+std::size_t PoolBytes(const rapidjson::Value& value) {
+  constexpr std::size_t kInlineString = sizeof(rapidjson::Value) - 3;
+  auto string = [](const rapidjson::Value& s) {
+    return s.GetStringLength() < kInlineString ? 0 : RAPIDJSON_ALIGN(s.GetStringLength() + 1);
+  };
+  switch (value.GetType()) {
+    case rapidjson::kObjectType: {
+      std::size_t bytes = RAPIDJSON_ALIGN(value.MemberCount() * sizeof(rapidjson::Value::Member));
+      for (auto it = value.MemberBegin(); it != value.MemberEnd(); ++it) {
+        bytes += string(it->name) + PoolBytes(it->value);
+      }
+      return bytes;
+    }
+    case rapidjson::kArrayType: {
+      std::size_t bytes = RAPIDJSON_ALIGN(value.Size() * sizeof(rapidjson::Value));
+      for (const rapidjson::Value& element : value.GetArray()) bytes += PoolBytes(element);
+      return bytes;
+    }
+    case rapidjson::kStringType: return string(value);
+    default: return 0;
+  }
 }
+
+// A copy of a value in a document whose pool is sized to it. An apply run
+// holds one per changed object, and a document's own pool would start with
+// a 64 KB chunk, mostly empty.
+struct SizedCopy {
+  explicit SizedCopy(const rapidjson::Value& value)
+      : pool(std::max<std::size_t>(PoolBytes(value), 64)), document(&pool) {
+    document.CopyFrom(value, pool);
+  }
+  rapidjson::MemoryPoolAllocator<> pool;
+  rapidjson::Document document;  // declared after its pool, destroyed before it
+};
+
+std::shared_ptr<rapidjson::Document> CopyOf(const rapidjson::Value& value) {
+  auto copy = std::make_shared<SizedCopy>(value);
+  return std::shared_ptr<rapidjson::Document>(copy, &copy->document);
+}
+
+}  // namespace
+
+ConfigStoreObject::ConfigStoreObject(ConfigStoreObjectId id, const rapidjson::Value& data)
+    : StoreObject(std::move(id)), data_(CopyOf(data)) {}
 
 const rapidjson::Value& ConfigStoreObject::GetData() const { return *data_; }
 
@@ -99,9 +144,7 @@ std::string ConfigStoreObject::Serialize() const {
 }
 
 DriftObject::DriftObject(ConfigStoreObjectId id, std::string action, const rapidjson::Value& drift)
-    : StoreObject(std::move(id)), action_(std::move(action)), drift_(std::make_shared<rapidjson::Document>()) {
-  drift_->CopyFrom(drift, drift_->GetAllocator());
-}
+    : StoreObject(std::move(id)), action_(std::move(action)), drift_(CopyOf(drift)) {}
 
 const std::string& DriftObject::GetAction() const { return action_; }
 const rapidjson::Value& DriftObject::GetDrift() const { return *drift_; }
