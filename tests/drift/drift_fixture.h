@@ -65,4 +65,11 @@ class RecordingHandler final : public HoxConfigManager::DriftHandler {
   static std::string Text(const Value& v) { return HoxConfigManager::JsonToString(v); }
 };
 
+// The calls of the walk of `desired` against a copy of `current`.
+inline Calls Walk(HoxConfigManager::Document& desired, const HoxConfigManager::Value& current,
+                  RecordingHandler handler = {}) {
+  HoxConfigManager::ComputeDrift(desired, desired.GetAllocator(), handler, Copy(current));
+  return handler.calls;
+}
+
 }  // namespace hoxcm_test
