@@ -42,7 +42,8 @@ TEST(IsEqualValueTest, FollowsTheDocumentedRules) {
   const auto key = [](int k) { return R"({"key":")" + std::to_string(k) + R"("})"; };
   const std::string keys = "{\"keys\":" + Array(100, [&](int i) { return key(i % 7); }) + "}";
   const std::string keysReversed = "{\"keys\":" + Array(100, [&](int i) { return key((99 - i) % 7); }) + "}";
-  const std::string keysChanged = "{\"keys\":" + Array(100, [&](int i) { return key(i == 3 ? 8 : (99 - i) % 7); }) + "}";
+  const std::string keysChanged =
+      "{\"keys\":" + Array(100, [&](int i) { return key(i == 3 ? 8 : (99 - i) % 7); }) + "}";
   const std::string counts = Array(40, [](int i) { return std::to_string(i % 3); });
   const std::string otherCounts = Array(40, [](int i) { return std::to_string((i + 1) % 3); });
   const std::vector<Case> cases = {
@@ -72,7 +73,8 @@ TEST(IsEqualValueTest, FollowsTheDocumentedRules) {
       {"object against array", R"({"home":{"path":"/h"}})", R"({"home":["/h"]})", false},
       {"long object arrays ignore order", keys, keysReversed, true},
       {"long object arrays compare elements", keys, keysChanged, false},
-      {"long scalar arrays are multisets", "{\"groups\":" + Array(100, [](int i) { return std::to_string(i % 5); }) + "}",
+      {"long scalar arrays are multisets",
+       "{\"groups\":" + Array(100, [](int i) { return std::to_string(i % 5); }) + "}",
        "{\"groups\":" + Array(100, [](int i) { return std::to_string(i * 3 % 5); }) + "}", true},
       {"long scalar arrays count duplicates", "{\"groups\":" + counts + "}", "{\"groups\":" + otherCounts + "}", false},
   };

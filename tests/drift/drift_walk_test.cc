@@ -70,7 +70,8 @@ TEST_F(DriftWalkTest, ReportsEachDifferenceWithItsActionInWalkOrder) {
        R"({"quorlet":{"system":{"quorlet_daemon":{"enabled":true}}},"storage":{"iscsi":{"targets":[{"iqn":"i"}]}}})",
        kObjects,
        {"Add " + m + "/0 [b] {\"name\":\"b\"}", "Set " + k + " {\"iommu\":true} null",
-        "Delete /quorlet/system/quorlet_daemon {\"enabled\":true}", "Delete /storage/iscsi/targets/0 [i] {\"iqn\":\"i\"}"}},
+        "Delete /quorlet/system/quorlet_daemon {\"enabled\":true}",
+        "Delete /storage/iscsi/targets/0 [i] {\"iqn\":\"i\"}"}},
   };
   for (const Case& c : cases) EXPECT_EQ(Walk(c.desired, c.current, c.handler), c.calls) << c.what;
 }
@@ -98,7 +99,8 @@ Calls Reference(const std::vector<std::string>& desired, const std::vector<std::
   size_t next = desired.size();
   for (size_t j = 0; j < host.size(); ++j) {
     if (!matched[j]) {
-      calls.push_back("Delete " + p + std::to_string(next++) + " [" + (named ? host[j] : "h" + std::to_string(j)) + "]");
+      const std::string id = named ? host[j] : "h" + std::to_string(j);
+      calls.push_back("Delete " + p + std::to_string(next++) + " [" + id + "]");
     }
   }
   return calls;

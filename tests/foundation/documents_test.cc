@@ -64,7 +64,8 @@ TEST(DocumentsTest, InstanceIdComesFromTheSchemasIdentityMember) {
   schema->identity = "name";
   EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"name":"vnic0"})"), schema), "vnic0");
   EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"other":"x"})"), schema), "");
-  EXPECT_EQ(Failure([&] { GetInstanceIdFromValue(Parse(R"({"name":5})"), schema); }), "2084 Invalid value for key name");
+  EXPECT_EQ(Failure([&] { GetInstanceIdFromValue(Parse(R"({"name":5})"), schema); }),
+            "2084 Invalid value for key name");
   schema->identity.clear();
   EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"name":"vnic0"})"), schema), "");
 }
