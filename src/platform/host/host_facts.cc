@@ -17,6 +17,7 @@
 #include <hoxcm/json.h>
 
 #include "foundation/json_parse.h"
+#include "platform/file_descriptor.h"
 #include "platform/host/host_internal.h"
 
 namespace HoxPlatform::detail {
@@ -31,20 +32,6 @@ constexpr const char* kProductPath = "/sys/class/dmi/id/product_name";
 // rather than loaded whole.
 constexpr std::size_t kMaxHostFileSize = 16u << 20;
 
-// Closes its descriptor when it goes out of scope.
-class FileDescriptor {
- public:
-  explicit FileDescriptor(int fd) : fd_(fd) {}
-  ~FileDescriptor() {
-    if (fd_ >= 0) ::close(fd_);
-  }
-  FileDescriptor(const FileDescriptor&) = delete;
-  FileDescriptor& operator=(const FileDescriptor&) = delete;
-  int get() const { return fd_; }
-
- private:
-  const int fd_;
-};
 
 std::string Trim(std::string text) {
   const auto notSpace = [](unsigned char c) { return !std::isspace(c); };

@@ -16,6 +16,8 @@
 #include <stdexcept>
 #include <system_error>
 
+#include "platform/file_descriptor.h"
+
 namespace HoxPlatform {
 namespace {
 
@@ -23,27 +25,6 @@ namespace {
   throw std::system_error(error, std::generic_category(), what);
 }
 
-// Owns a descriptor; closes it once.
-class FileDescriptor {
- public:
-  explicit FileDescriptor(int fd) : fd_(fd) {}
-  ~FileDescriptor() {
-    if (fd_ >= 0) ::close(fd_);
-  }
-  FileDescriptor(const FileDescriptor&) = delete;
-  FileDescriptor& operator=(const FileDescriptor&) = delete;
-  int get() const { return fd_; }
-  // Closes now and reports the result: a failing close may be the first
-  // sign of a lost write.
-  int Close() {
-    const int rc = ::close(fd_);
-    fd_ = -1;
-    return rc;
-  }
-
- private:
-  int fd_;
-};
 
 struct SpawnActions {
   posix_spawn_file_actions_t actions;
