@@ -29,10 +29,15 @@ void Fail(const char* format, ...) {
   throw ConfigManagerException(kPluginFailureCode, text.get());
 }
 
-void CheckModule(const std::string& type, const std::string& module) {
+// What every launcher does once its request is built: refuse a "cpp" plugin
+// without a module before anything is written, then say what it launches.
+void CheckAndAnnounce(const std::string& id, const std::string& operation, int version, const std::string& type,
+                      const std::string& module) {
   if (type == "cpp" && module.empty()) {
     throw ConfigManagerException(kPluginFailureCode, "Cpp plugin must specify the shared object name.");
   }
+  CSLogger::Log(CSLogger::kInfo, "Plugin Launcher created for id=%s, operation=%s, version=%d, type=%s", id.c_str(),
+                operation.c_str(), version, type.c_str());
 }
 
 std::string RunLockPath() { return HoxPlatform::HostPath("/var/tarvik/lifecycle/cm-plugin.lock"); }
@@ -81,9 +86,7 @@ PluginLauncher::PluginLauncher(const std::string& id, int version, const std::st
       version(version),
       start_(std::chrono::steady_clock::now()) {
   result.SetObject();
-  CheckModule(type, module);
-  CSLogger::Log(CSLogger::kInfo, "Plugin Launcher created for id=%s, operation=%s, version=%d, type=%s", id.c_str(),
-                operation.c_str(), version, type.c_str());
+  CheckAndAnnounce(id, operation, version, type, module);
 }
 
 PluginLauncher::PluginLauncher(const std::string& id, int version,
@@ -97,9 +100,7 @@ PluginLauncher::PluginLauncher(const std::string& id, int version,
       version(version),
       start_(std::chrono::steady_clock::now()) {
   result.SetObject();
-  CheckModule(type, module);
-  CSLogger::Log(CSLogger::kInfo, "Plugin Launcher created for id=%s, operation=%s, version=%d, type=%s", id.c_str(),
-                operation.c_str(), version, type.c_str());
+  CheckAndAnnounce(id, operation, version, type, module);
 }
 
 PluginLauncher::~PluginLauncher() {
