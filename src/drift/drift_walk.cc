@@ -241,18 +241,9 @@ class DriftWalk {
       hostIds.reserve(h.Size());
     }
     for (auto [side, ids] : {std::pair{&d, &desiredIds}, std::pair{&h, &hostIds}}) {
-      const SizeType n = side->Size();
-      for (SizeType i = 0; i < n; ++i) {
-        const Value& instance = (*side)[i];
+      for (const Value& instance : side->GetArray()) {
         RAPIDJSON_ASSERT(instance.IsObject());
         if (generated) continue;
-        // This loop is the first to read each instance's members: fetch
-        // those of a later instance while this one is searched.
-        constexpr SizeType kAhead = 6;
-        if (i + kAhead < n) {
-          const Value& later = (*side)[i + kAhead];
-          if (later.IsObject() && later.MemberCount() > 0) __builtin_prefetch(&*later.MemberBegin());
-        }
         const Value* member = HoxConfigStore::detail::FindByName(instance, identity);
         RAPIDJSON_ASSERT(member != nullptr && member->IsString());
         ids->push_back(member);
