@@ -17,6 +17,15 @@ const Value& TypeOf(const Value& schemaNode) {
   return type->value;
 }
 
+// Adds `name` with the redacted text of `value` to a report entry, unless the
+// value is null.
+void AddRedacted(Document& report, Value& entry, const char* name, const Value& schemaNode, const Value& value) {
+  if (value.IsNull()) return;
+  Allocator& alloc = report.GetAllocator();
+  const std::string text = HoxConfigStore::ConfigStoreDocument::RedactAndSerializeValue(schemaNode, value);
+  entry.AddMember(rapidjson::StringRef(name), Value(text, alloc), alloc);
+}
+
 }  // namespace
 
 // Property drift is reported entry by entry, so no consolidated Set is asked
@@ -46,13 +55,9 @@ void CheckComplianceHandler::Add(const Value& desired, const HoxConfigStore::Con
                                  const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema,
                                  const std::string& path) {
   result_->compliant = false;
-  Allocator& alloc = result_->document.GetAllocator();
   Value entry(rapidjson::kObjectType);
   populateResult(result_->document, path, entry);
-  if (!desired.IsNull()) {
-    const std::string text = HoxConfigStore::ConfigStoreDocument::RedactAndSerializeValue(schema->GetJsonSchema(), desired);
-    entry.AddMember("desiredValue", Value(text, alloc), alloc);
-  }
+  AddRedacted(result_->document, entry, "desiredValue", schema->GetJsonSchema(), desired);
   Append("ADDS", entry);
 }
 
@@ -61,18 +66,11 @@ void CheckComplianceHandler::Set(const Value& desired, const Value& current,
                                  const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema,
                                  const std::string& path, const Value&) {
   result_->compliant = false;
-  Allocator& alloc = result_->document.GetAllocator();
   Value entry(rapidjson::kObjectType);
   populateResult(result_->document, path, entry);
   const Value& keySchema = schema->GetJsonSchema();
-  if (!current.IsNull()) {
-    const std::string text = HoxConfigStore::ConfigStoreDocument::RedactAndSerializeValue(keySchema, current);
-    entry.AddMember("hostValue", Value(text, alloc), alloc);
-  }
-  if (!desired.IsNull()) {
-    const std::string text = HoxConfigStore::ConfigStoreDocument::RedactAndSerializeValue(keySchema, desired);
-    entry.AddMember("desiredValue", Value(text, alloc), alloc);
-  }
+  AddRedacted(result_->document, entry, "hostValue", keySchema, current);
+  AddRedacted(result_->document, entry, "desiredValue", keySchema, desired);
   Append("ADDS", entry);
 }
 
@@ -80,13 +78,9 @@ void CheckComplianceHandler::Delete(const Value& current, const HoxConfigStore::
                                     const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema,
                                     const std::string& path) {
   result_->compliant = false;
-  Allocator& alloc = result_->document.GetAllocator();
   Value entry(rapidjson::kObjectType);
   populateResult(result_->document, path, entry);
-  if (!current.IsNull()) {
-    const std::string text = HoxConfigStore::ConfigStoreDocument::RedactAndSerializeValue(schema->GetJsonSchema(), current);
-    entry.AddMember("hostValue", Value(text, alloc), alloc);
-  }
+  AddRedacted(result_->document, entry, "hostValue", schema->GetJsonSchema(), current);
   Append("DELETES", entry);
 }
 
@@ -102,17 +96,10 @@ void CheckComplianceHandler::PropertyDrift(const Value& desired, const Value& cu
   }
   // Scalars and arrays of scalars are always reported as changes.
   if (std::string_view(kind->GetString(), kind->GetStringLength()) != "object") action = SET;
-  Allocator& alloc = result_->document.GetAllocator();
   Value entry(rapidjson::kObjectType);
   populateResult(result_->document, path, entry);
-  if (!desired.IsNull()) {
-    const std::string text = HoxConfigStore::ConfigStoreDocument::RedactAndSerializeValue(schemaNode, desired);
-    entry.AddMember("desiredValue", Value(text, alloc), alloc);
-  }
-  if (!current.IsNull()) {
-    const std::string text = HoxConfigStore::ConfigStoreDocument::RedactAndSerializeValue(schemaNode, current);
-    entry.AddMember("hostValue", Value(text, alloc), alloc);
-  }
+  AddRedacted(result_->document, entry, "desiredValue", schemaNode, desired);
+  AddRedacted(result_->document, entry, "hostValue", schemaNode, current);
   Append(action == ADD ? "ADDS" : action == DELETE ? "DELETES" : "SETS", entry);
 }
 
