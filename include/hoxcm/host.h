@@ -26,9 +26,9 @@ HOXCM_API std::string StripHostRoot(std::string_view path);
 class HOXCM_API CSLogger {
  public:
   enum log_priority : int { kError = 0, kWarning = 1, kInfo = 2, kDetail = 3 };
-  // printf-style. Lines at or above the threshold (HOX_LOG_LEVEL: 0 to 3 or
-  // error|warning|info|detail, default info) go to stderr and, when
-  // HOX_LOG_SYSLOG=1, to syslog.
+  // printf-style. Lines at or above the threshold (HOX_LOG_LEVEL: -1 for
+  // none, 0 to 3 or error|warning|info|detail, default info) go to stderr;
+  // HOX_LOG_SYSLOG=1 sends them to syslog instead, 2 to both.
   static void Log(int priority, const char* format, ...) __attribute__((format(printf, 2, 3)));
   static bool IsEnabled(int priority);
 };

@@ -42,9 +42,13 @@ int SyslogPriority(int priority) {
   }
 }
 
-bool SyslogEnabled() {
+// HOX_LOG_SYSLOG: unset or 0 stderr only, 1 syslog only, 2 both.
+int SyslogMode() {
   const char* s = std::getenv("HOX_LOG_SYSLOG");
-  return s != nullptr && std::strcmp(s, "1") == 0;
+  if (s == nullptr) return 0;
+  if (std::strcmp(s, "1") == 0) return 1;
+  if (std::strcmp(s, "2") == 0) return 2;
+  return 0;
 }
 
 }  // namespace
@@ -67,9 +71,9 @@ void CSLogger::Log(int priority, const char* format, ...) {
   line += ": ";
   line += text;
   line += '\n';
-  if (SyslogEnabled()) {
-    ::syslog(LOG_USER | SyslogPriority(priority), "%s", text);
-  } else {
+  const int mode = SyslogMode();
+  if (mode != 0) ::syslog(LOG_USER | SyslogPriority(priority), "%s", text);
+  if (mode != 1) {
     const ssize_t written = ::write(STDERR_FILENO, line.data(), line.size());
     (void)written;
   }
