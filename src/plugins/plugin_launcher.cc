@@ -58,7 +58,15 @@ constexpr RunIds kValidateIds = {"com.tarvik.hox.settings.validation.plugin.abor
 
 ErrorInfo RunError(const RunIds& ids, const std::string& pluginId, PluginMonitor& monitor,
                    const std::string& what) {
-  return ErrorInfo(monitor.IsAborted() ? ids.aborted : ids.unexpected, {pluginId}, what);
+  // Runs report failures as results: a monitor that cannot answer here
+  // must not turn this one into an exception.
+  bool aborted = false;
+  try {
+    aborted = monitor.IsAborted();
+  } catch (const std::exception& e) {
+    CSLogger::Log(CSLogger::kError, "Plugin monitor failed: %s", e.what());
+  }
+  return ErrorInfo(aborted ? ids.aborted : ids.unexpected, {pluginId}, what);
 }
 
 // Everything a run does with the fixed files, under the host-wide lock so

@@ -107,6 +107,14 @@ TEST_F(PluginRunTest, RunnerFailuresBecomeUnexpectedErrors) {
     EXPECT_EQ(error.args, std::vector<std::string>{"t"}) << body;
     EXPECT_NE(error.message.find(message), std::string::npos) << body << ": " << error.message;
   }
+  // A monitor that cannot answer fails the run; it does not escape as an exception.
+  Runner(kSuccess);
+  ErrorInfo unanswered;
+  EXPECT_NO_THROW(unanswered = Apply(std::make_shared<Monitor>([]() -> bool {
+                    throw std::runtime_error("task store gone");
+                  })));
+  EXPECT_EQ(unanswered.id, kApplyUnexpected);
+
   std::filesystem::remove(root.Path("/usr/lib/tarvik/configmanager/bin/py_plugin_runner"));
   EXPECT_EQ(Apply().message, "Failed to fork plugin runner. No such file or directory");
 
