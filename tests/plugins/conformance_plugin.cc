@@ -39,8 +39,9 @@ char* Run(Kind kind, const char* text, const char* root) {
     if (i == 0 && config.IsObject() && config.HasMember("behaviour")) behaviour = config["behaviour"].GetString();
     const std::string c = data[i]["component"].GetString(), g = data[i]["group"].GetString(),
                       k = data[i]["key"].GetString();
-    const int impact = config.HasMember("impact") ? config["impact"].GetInt() : 0;
-    impacts += std::string(impacts.empty() ? "" : ",") + "{\"impact\":" + std::to_string(impact) +
+    // The verdict is passed on as given, well-formed or not.
+    const std::string impact = config.HasMember("impact") ? HoxConfigManager::JsonToString(config["impact"]) : "0";
+    impacts += std::string(impacts.empty() ? "" : ",") + "{\"impact\":" + impact +
                ",\"component\":\"" + c + "\",\"group\":\"" + g + "\",\"key\":\"" + k + "\",\"reason\":\"r\"}";
     if (!config.HasMember("bad")) continue;
     errors += std::string(errors.empty() ? "" : ",") + "{\"field\":\"/" + c + "/" + g + "/" + k +

@@ -102,6 +102,13 @@ TEST_P(RunnerConformanceTest, ImpactAndValidationResults) {
   ASSERT_EQ(impact.impacts.size(), 1u);
   EXPECT_EQ(impact.impacts[0].impact, 2);
   EXPECT_EQ(impact.impacts[0].key, "config");
+  // A verdict that is not one of the three numbers is refused by the runner.
+  for (const char* verdict : {"true", "1.0", "3"}) {
+    const auto refused =
+        plugin_->Impact(Dns(std::string(R"({"impact":)") + verdict + "}"), "", PluginMonitor::Dummy());
+    EXPECT_EQ(refused.error.id, "com.tarvik.hox.settings.impact.plugin.unexpected.error");
+    EXPECT_NE(refused.error.message.find("status=Bad message"), std::string::npos) << verdict << refused.error.message;
+  }
 
   const auto validation =
       plugin_->Validate({Object(kDns, R"({"bad":true})"), Object(kDns, "{}")}, {}, "", PluginMonitor::Dummy());
