@@ -12,7 +12,7 @@ def _items(request, host):
     if items and isinstance(items[0]["config"], dict):
         behaviour = items[0]["config"].get("behaviour", "ok")
     if behaviour == "throw":
-        raise RuntimeError("thrown on purpose")
+        raise RuntimeError("thrown on purpose with %s" % items[0]["config"])
     return items, behaviour
 
 

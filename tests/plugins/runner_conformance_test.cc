@@ -84,6 +84,13 @@ TEST_P(RunnerConformanceTest, FailuresComeBackAsReportedOrAsTheRunnersErrorNumbe
     all.push_back({"libnodescribe.so", "{}", "status=Function not implemented"});
   }
   all.push_back({"-", "{}", "status=Can not access a needed shared library"});
+  // What a crashing plugin had in hand stays out of the runner's messages.
+  testing::internal::CaptureStderr();
+  EXPECT_EQ(Apply(Dns(R"({"behaviour":"throw","secret":"hunter2-xyz"})")).id, kApplyUnexpected);
+  const std::string stderrText = testing::internal::GetCapturedStderr();
+  EXPECT_EQ(stderrText.find("hunter2-xyz"), std::string::npos) << stderrText;
+  EXPECT_NE(stderrText.find("plugin"), std::string::npos) << stderrText;
+
   for (const Case& c : all) {
     if (c.library == "-") std::filesystem::remove(moduleFile_);
     if (c.library.size() > 1) {
