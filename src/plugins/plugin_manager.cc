@@ -41,7 +41,10 @@ void PluginManager::Load(PluginType type) {
     // Symbolic links to directories are not followed (the iterator's
     // default), so a link loop cannot trap the walk.
     for (fs::recursive_directory_iterator it(directory), end; it != end; ++it) {
-      if (it->path().extension() == ".json") ProcessJson(it->path().c_str(), type);
+      // A directory that happens to end in ".json" is walked, not read.
+      if (it->path().extension() == ".json" && !fs::is_directory(it->path(), ec)) {
+        ProcessJson(it->path().c_str(), type);
+      }
     }
   }
   if (type != APPLY && type != APPLY_BOOT) return;

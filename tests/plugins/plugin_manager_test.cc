@@ -30,6 +30,7 @@ TEST_F(PluginManagerTest, OperationsRunInsideTheirGroupAfterWhatTheyDependOn) {
   // Files that only look like manifests are not read at all.
   Manifest("a/plugin.JSON", "{");
   Manifest("a/plugin.json.bak", "{");
+  std::filesystem::create_directories(root.Path(kModules + "d.json/e"));  // a directory, not a manifest
   EXPECT_TRUE(PluginManager(APPLY).GetPlugins().empty());
   EXPECT_EQ(PluginManager(APPLY).GetDependencies(),
             (std::vector<std::string>{"system-early", "network", "storage", "system"}));
