@@ -9,6 +9,7 @@
 #include <hoxcm/config_store.h>
 
 #include "drift/drift_fixture.h"
+#include "platform/compare/value_compare.h"
 
 namespace {
 
@@ -117,6 +118,26 @@ TEST(RedactAndSerializeValueTest, MasksSensitivePropertiesAtAnyDepth) {
   EXPECT_EQ(ConfigStoreDocument::RedactAndSerializeValue(schema["items"]["properties"]["password"], Parse("\"pw\"")),
             "\"******\"");
   EXPECT_EQ(ConfigStoreDocument::RedactAndSerializeValue(Parse("{}"), Parse(R"({"a":[1,"b"]})")), R"({"a":[1,"b"]})");
+}
+
+// Members described only by "patternProperties": the redaction and the schema
+// node the drift walk hands to a handler both see a sensitive pattern, even
+// over a listed property, and a sensitive pattern that cannot be compiled.
+TEST(RedactAndSerializeValueTest, MasksMembersMatchedBySensitivePatterns) {
+  const Document schema = Parse(R"({"type": "object", "properties": {"secretA": {"type": "string"}},
+    "patternProperties": {"^secret": {"type": "string", "sensitive": true}, "^opt": {"type": "string"},
+                          "(": {"type": "string", "sensitive": true}}, "additionalProperties": false})");
+  EXPECT_EQ(ConfigStoreDocument::RedactAndSerializeValue(schema, Parse(R"({"secretA":"a","secretB":"b","optX":"x"})")),
+            R"({"secretA":"******","secretB":"******","optX":"******"})");
+  const Document plain = Parse(R"({"type": "object", "patternProperties": {"^secret": {"type": "string",
+    "sensitive": true}, "^opt": {"type": "integer"}}})");
+  EXPECT_EQ(ConfigStoreDocument::RedactAndSerializeValue(plain, Parse(R"({"secretB":"b","optX":1,"z":2})")),
+            R"({"secretB":"******","optX":1,"z":2})");
+  HoxConfigStore::detail::ValueComparer comparer;
+  const Document value = Parse(R"("v")");
+  EXPECT_TRUE(comparer.Child(plain, "secretB", value).HasMember("sensitive"));
+  EXPECT_EQ(comparer.Child(plain, "optX", value), plain["patternProperties"]["^opt"]);
+  EXPECT_TRUE(comparer.Child(schema, "secretA", value).HasMember("sensitive"));
 }
 
 }  // namespace

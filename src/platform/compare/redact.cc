@@ -57,6 +57,9 @@ const Value& ChildSchema(const Value& schema, std::string_view name) {
       if (child == nullptr) child = candidate;
     }
   }
+  if (const Value* pattern = detail::PatternPropertySchema(schema, name)) {
+    if (IsSensitive(*pattern) || child == nullptr) return *pattern;
+  }
   if (child != nullptr) return *child;
   const Value* extra = Member(schema, "additionalProperties");
   if (extra != nullptr && extra->IsObject()) return *extra;

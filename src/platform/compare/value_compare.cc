@@ -2,6 +2,8 @@
 
 #include <bit>
 #include <functional>
+#include <regex>
+#include <string>
 #include <vector>
 
 #include <hoxcm/config_store.h>
@@ -87,6 +89,37 @@ const Value* MemberIndex::FindSlow(std::string_view name) {
   return nullptr;
 }
 
+namespace {
+
+bool IsTrueMember(const Value& object, std::string_view name) {
+  const Value* member = FindByName(object, name);
+  return member != nullptr && member->IsTrue();
+}
+
+}  // namespace
+
+const Value* PatternPropertySchema(const Value& schema, std::string_view name) {
+  if (!schema.IsObject()) return nullptr;
+  const Value* patterns = FindByName(schema, "patternProperties");
+  if (patterns == nullptr || !patterns->IsObject()) return nullptr;
+  const Value* found = nullptr;
+  const std::string subject(name);
+  for (auto it = patterns->MemberBegin(); it != patterns->MemberEnd(); ++it) {
+    if (!it->value.IsObject()) continue;
+    const bool sensitive = IsTrueMember(it->value, "sensitive");
+    if (!sensitive && found != nullptr) continue;
+    bool matches = sensitive;
+    try {
+      matches = std::regex_search(subject, std::regex(it->name.GetString(), it->name.GetStringLength()));
+    } catch (const std::regex_error&) {
+    }
+    if (!matches) continue;
+    if (sensitive) return &it->value;
+    found = &it->value;
+  }
+  return found;
+}
+
 const Value& SchemaForValue(const Value& value) {
   const FallbackSchemas& f = Fallbacks();
   switch (value.GetType()) {
@@ -130,6 +163,7 @@ const ValueComparer::SchemaInfo& ValueComparer::Info(const Value& schema) {
     if (props == nullptr && name == "properties") props = &it->value;
     else if (extra == nullptr && name == "additionalProperties") extra = &it->value;
     else if (info.defaultValue == nullptr && name == "default") info.defaultValue = &it->value;
+    else if (name == "patternProperties") info.patterns = it->value.IsObject();
   }
   if (props != nullptr && props->IsObject()) {
     info.properties = props;
@@ -151,6 +185,7 @@ const Value& ValueComparer::Child(const Value& schema, std::string_view name, co
 ValueComparer::Children::Children(ValueComparer& comparer, const Value& schema) {
   const SchemaInfo& info = comparer.Info(schema);
   extra_ = info.additional;
+  if (info.patterns) patterns_ = &schema;
   if (info.wide != nullptr) {
     wide_ = info.wide;
   } else if (info.properties != nullptr) {
@@ -165,7 +200,13 @@ const Value& ValueComparer::Children::Of(std::string_view name, const Value& val
   } else if (wide_ != nullptr) {
     child = wide_->Find(name);
   }
-  if (child != nullptr && child->IsObject()) return *child;
+  if (child != nullptr && !child->IsObject()) child = nullptr;
+  // A matching sensitive pattern marks even a listed property sensitive.
+  if (patterns_ != nullptr) {
+    const Value* pattern = PatternPropertySchema(*patterns_, name);
+    if (pattern != nullptr && (child == nullptr || IsTrueMember(*pattern, "sensitive"))) return *pattern;
+  }
+  if (child != nullptr) return *child;
   if (extra_ != nullptr) return *extra_;
   return SchemaForValue(value);
 }

@@ -120,6 +120,12 @@ class MemberIndex {
   std::unordered_map<std::string_view, rapidjson::SizeType, BytesHash, SameBytesEqual> index_;
 };
 
+// The schema that a "patternProperties" entry of `schema` gives member
+// `name`, or null. A sensitive entry wins over others, and a sensitive entry
+// whose pattern cannot be compiled is taken to match, so that a secret is
+// never shown for want of a usable pattern.
+const rapidjson::Value* PatternPropertySchema(const rapidjson::Value& schema, std::string_view name);
+
 // A schema to use for a value the schema does not describe: {"type": T} with
 // T the value's JSON type ("array" schemas describe their first element).
 const rapidjson::Value& SchemaForValue(const rapidjson::Value& value);
@@ -150,6 +156,7 @@ class ValueComparer {
 
    private:
     const rapidjson::Value* extra_ = nullptr;
+    const rapidjson::Value* patterns_ = nullptr;  // the schema, when it has "patternProperties"
     std::optional<MemberIndex> narrow_;
     MemberIndex* wide_ = nullptr;
   };
@@ -167,6 +174,7 @@ class ValueComparer {
     const rapidjson::Value* schema = nullptr;
     const rapidjson::Value* properties = nullptr;
     const rapidjson::Value* additional = nullptr;
+    bool patterns = false;  // the node has "patternProperties"
     const rapidjson::Value* defaultValue = nullptr;
     MemberIndex* wide = nullptr;  // of "properties", when wide
   };
