@@ -8,6 +8,8 @@
 
 #include <hoxcm/config_store.h>
 
+#include "platform/schema/pattern_guard.h"
+
 namespace HoxConfigStore::detail {
 
 namespace {
@@ -108,10 +110,16 @@ const Value* PatternPropertySchema(const Value& schema, std::string_view name) {
     if (!it->value.IsObject()) continue;
     const bool sensitive = IsTrueMember(it->value, "sensitive");
     if (!sensitive && found != nullptr) continue;
+    // The matcher recurses with the length of the subject and the compiler
+    // with that of the pattern: past the limits that are safe on any stack,
+    // a sensitive pattern is taken to match and any other not to.
     bool matches = sensitive;
-    try {
-      matches = std::regex_search(subject, std::regex(it->name.GetString(), it->name.GetStringLength()));
-    } catch (const std::regex_error&) {
+    if (subject.size() <= JsonValidator::detail::kSmallSubject &&
+        it->name.GetStringLength() <= JsonValidator::detail::kMaxPatternLength) {
+      try {
+        matches = std::regex_search(subject, std::regex(it->name.GetString(), it->name.GetStringLength()));
+      } catch (const std::regex_error&) {
+      }
     }
     if (!matches) continue;
     if (sensitive) return &it->value;

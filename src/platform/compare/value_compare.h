@@ -122,8 +122,9 @@ class MemberIndex {
 
 // The schema that a "patternProperties" entry of `schema` gives member
 // `name`, or null. A sensitive entry wins over others, and a sensitive entry
-// whose pattern cannot be compiled is taken to match, so that a secret is
-// never shown for want of a usable pattern.
+// whose pattern cannot be compiled, or that would be applied to a name too
+// long to match safely, is taken to match, so that a secret is never shown
+// for want of a usable pattern.
 const rapidjson::Value* PatternPropertySchema(const rapidjson::Value& schema, std::string_view name);
 
 // A schema to use for a value the schema does not describe: {"type": T} with
