@@ -1,6 +1,7 @@
 // hoxcfg init, export, show and maintenance, run as real processes against a
 // temporary root.
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <hoxcm/documents.h>
 
@@ -50,6 +51,13 @@ TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExportsToAPrivateFile) {
   ASSERT_EQ(::stat(file.c_str(), &st), 0);
   EXPECT_EQ(st.st_mode & 0777, 0600u);
   // The export is applicable elsewhere, so it carries the secrets.
+  EXPECT_NE(root_.ReadFile("/tmp/host.json").find("s3cr3t-chap-01"), std::string::npos);
+  // A link planted where the temporary file goes is replaced, not written through.
+  const std::string victim = root_.Path("/tmp/victim");
+  root_.WriteFile("/tmp/victim", "untouched");
+  ASSERT_EQ(::symlink(victim.c_str(), (file + ".tmp").c_str()), 0);
+  ASSERT_EQ(Run("export --output " + file).exitCode, 0);
+  EXPECT_EQ(root_.ReadFile("/tmp/victim"), "untouched");
   EXPECT_NE(root_.ReadFile("/tmp/host.json").find("s3cr3t-chap-01"), std::string::npos);
 }
 

@@ -198,9 +198,12 @@ void WritePrivateOutput(const std::string& text, const std::string& path) {
     return;
   }
   const std::string tmp = path + ".tmp";
-  const int fd = ::open(tmp.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
+  // The temporary file is always a new one: a leftover file or a link planted
+  // there (in a directory others may write) is removed, not written through.
+  constexpr int kFlags = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
+  int fd = ::open(tmp.c_str(), kFlags, 0600);
+  if (fd < 0 && errno == EEXIST && ::unlink(tmp.c_str()) == 0) fd = ::open(tmp.c_str(), kFlags, 0600);
   if (fd < 0) throw CommandError{kExitError, "cannot write " + path + ": " + std::strerror(errno)};
-  // A leftover temporary file of another owner keeps its mode: enforce it.
   bool ok = ::fchmod(fd, 0600) == 0;
   for (std::size_t done = 0; ok && done < text.size();) {
     const ssize_t n = ::write(fd, text.data() + done, text.size() - done);
