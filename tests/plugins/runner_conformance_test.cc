@@ -3,11 +3,15 @@
 // plugins end to end: the apply tasks of a changed document, grouped per
 // plugin and run in the registry's order, leave the host compliant with
 // that document and its files rewritten.
+#include <sys/wait.h>
+
+#include <cerrno>
 #include <unordered_map>
 
 #include <hoxcm/drift.h>
 #include <hoxcm/operations.h>
 
+#include "platform/process/process.h"
 #include "plugins/plugin_fixture.h"
 
 namespace hoxcm_test {
@@ -123,6 +127,25 @@ TEST_P(RunnerConformanceTest, ImpactAndValidationResults) {
   ASSERT_EQ(validation.errors.size(), 1u);
   EXPECT_EQ(validation.errors[0].field, "/network/dns/config/bad");
   EXPECT_EQ(validation.errors[0].errors.at(0), ErrorInfo("conformance.bad", {"x"}, "bad"));
+}
+
+TEST_P(RunnerConformanceTest, ABadRequestEndsTheRunnerWithInvalidArgument) {
+  const std::string runner = root.Path(std::string("/usr/lib/tarvik/configmanager/bin/") +
+                                       (GetParam() == "c++" ? "cpp_plugin_runner" : "py_plugin_runner"));
+  const std::string module = R"(,"module":"libconformance.so")";
+  for (const std::string& request :
+       {std::string("-"), std::string("[]"), std::string("{\"type\":\"APPLY\""),
+        R"({"type":["APPLY"],"key":"conformance")" + module + "}",
+        R"({"type":"APPLY","key":"conformance/../../..")" + module + "}",
+        R"({"type":"APPLY","key":7)" + module + "}"}) {
+    std::filesystem::remove(root.Path("/var/tarvik/lifecycle/cm-plugin-input.json"));
+    if (request != "-") root.WriteFile("/var/tarvik/lifecycle/cm-plugin-input.json", request);
+    int error = 0, status = 0;
+    const pid_t pid = HoxPlatform::SpawnClean(runner, {runner}, &error);
+    ASSERT_GT(pid, 0) << error;
+    ASSERT_EQ(HoxPlatform::WaitForExit(pid, &status), 0);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == EINVAL) << request << " status " << status;
+  }
 }
 
 INSTANTIATE_TEST_SUITE_P(BothRunners, RunnerConformanceTest, ::testing::Values("c++", "python"),
