@@ -100,7 +100,7 @@ bool IsTrueMember(const Value& object, std::string_view name) {
 
 }  // namespace
 
-const Value* PatternPropertySchema(const Value& schema, std::string_view name) {
+const Value* PatternPropertySchema(const Value& schema, std::string_view name, PatternCache* cache) {
   if (!schema.IsObject()) return nullptr;
   const Value* patterns = FindByName(schema, "patternProperties");
   if (patterns == nullptr || !patterns->IsObject()) return nullptr;
@@ -116,8 +116,22 @@ const Value* PatternPropertySchema(const Value& schema, std::string_view name) {
     bool matches = sensitive;
     if (subject.size() <= JsonValidator::detail::kSmallSubject &&
         it->name.GetStringLength() <= JsonValidator::detail::kMaxPatternLength) {
+      std::optional<std::regex> local;
+      std::optional<std::regex>* compiled = &local;
+      bool fresh = true;
+      if (cache != nullptr) {
+        auto [slot, inserted] = cache->try_emplace(&it->name);
+        compiled = &slot->second;
+        fresh = inserted;
+      }
+      if (fresh) {
+        try {
+          compiled->emplace(it->name.GetString(), it->name.GetStringLength());
+        } catch (const std::regex_error&) {
+        }
+      }
       try {
-        matches = std::regex_search(subject, std::regex(it->name.GetString(), it->name.GetStringLength()));
+        if (compiled->has_value()) matches = std::regex_search(subject, **compiled);
       } catch (const std::regex_error&) {
       }
     }
@@ -193,7 +207,10 @@ const Value& ValueComparer::Child(const Value& schema, std::string_view name, co
 ValueComparer::Children::Children(ValueComparer& comparer, const Value& schema) {
   const SchemaInfo& info = comparer.Info(schema);
   extra_ = info.additional;
-  if (info.patterns) patterns_ = &schema;
+  if (info.patterns) {
+    patterns_ = &schema;
+    compiled_ = &comparer.patterns_;
+  }
   if (info.wide != nullptr) {
     wide_ = info.wide;
   } else if (info.properties != nullptr) {
@@ -211,7 +228,7 @@ const Value& ValueComparer::Children::Of(std::string_view name, const Value& val
   if (child != nullptr && !child->IsObject()) child = nullptr;
   // A matching sensitive pattern marks even a listed property sensitive.
   if (patterns_ != nullptr) {
-    const Value* pattern = PatternPropertySchema(*patterns_, name);
+    const Value* pattern = PatternPropertySchema(*patterns_, name, compiled_);
     if (pattern != nullptr && (child == nullptr || IsTrueMember(*pattern, "sensitive"))) return *pattern;
   }
   if (child != nullptr) return *child;

@@ -19,6 +19,7 @@
 #include <cstring>
 #include <memory>
 #include <optional>
+#include <regex>
 #include <string_view>
 #include <unordered_map>
 
@@ -125,7 +126,11 @@ class MemberIndex {
 // whose pattern cannot be compiled, or that would be applied to a name too
 // long to match safely, is taken to match, so that a secret is never shown
 // for want of a usable pattern.
-const rapidjson::Value* PatternPropertySchema(const rapidjson::Value& schema, std::string_view name);
+// `cache`, when given, keeps the compiled patterns (keyed by the pattern's
+// name value, so it must not outlive the schema).
+using PatternCache = std::unordered_map<const rapidjson::Value*, std::optional<std::regex>>;
+const rapidjson::Value* PatternPropertySchema(const rapidjson::Value& schema, std::string_view name,
+                                              PatternCache* cache = nullptr);
 
 // A schema to use for a value the schema does not describe: {"type": T} with
 // T the value's JSON type ("array" schemas describe their first element).
@@ -158,6 +163,7 @@ class ValueComparer {
    private:
     const rapidjson::Value* extra_ = nullptr;
     const rapidjson::Value* patterns_ = nullptr;  // the schema, when it has "patternProperties"
+    PatternCache* compiled_ = nullptr;
     std::optional<MemberIndex> narrow_;
     MemberIndex* wide_ = nullptr;
   };
@@ -188,6 +194,7 @@ class ValueComparer {
   SchemaInfo info_[kInfoSlots];
   // Name indexes of wide "properties", kept for the comparer's lifetime.
   std::unordered_map<const rapidjson::Value*, std::unique_ptr<MemberIndex>> wideIndexes_;
+  PatternCache patterns_;
 };
 
 // Equality of two scalars: numbers by value, anything else by JSON type and
