@@ -19,8 +19,6 @@ namespace {
 
 constexpr const char* kGroupArgument = "++group=host/qim/tarvisor/configManagerPlugin,stats";
 constexpr auto kPollInterval = std::chrono::seconds(1);
-// How long a runner has to end after SIGTERM before it is killed outright.
-constexpr auto kKillGrace = std::chrono::seconds(3);
 
 [[noreturn]] void Fail(const char* format, ...) __attribute__((format(printf, 1, 2)));
 void Fail(const char* format, ...) {
@@ -161,16 +159,6 @@ void PluginLauncher::ForkPlugin(std::shared_ptr<PluginMonitor> monitor) {
       if (const int error = HoxPlatform::SendSignal(pid, SIGTERM)) {
         CSLogger::Log(CSLogger::kError, "Unable to terminate plugin process: %d -- %s", static_cast<int>(pid),
                       HoxPlatform::ErrorText(error).c_str());
-      } else {
-        // A runner that ignores or blocks SIGTERM would otherwise hold the
-        // run, and the host-wide lock, for as long as it likes.
-        lock.lock();
-        const bool ended = reaped.wait_for(lock, kKillGrace, [&done] { return done; });
-        lock.unlock();
-        if (!ended) {
-          CSLogger::Log(CSLogger::kWarning, "Plugin process %d ignored SIGTERM, killing it", static_cast<int>(pid));
-          HoxPlatform::SendSignal(pid, SIGKILL);
-        }
       }
     }
     CSLogger::Log(CSLogger::kInfo, "Stopping plugin monitor thread");
