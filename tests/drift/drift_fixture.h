@@ -12,15 +12,11 @@
 
 #include "support/temp_root.h"
 
+#include "support/json.h"
+
 namespace hoxcm_test {
 
 using Calls = std::vector<std::string>;
-
-inline HoxConfigManager::Document Parse(const std::string& text) {
-  HoxConfigManager::Document doc;
-  HoxConfigManager::ParseDocument(text, doc);
-  return doc;
-}
 
 inline HoxConfigManager::Document Copy(const HoxConfigManager::Value& value) {
   HoxConfigManager::Document out;

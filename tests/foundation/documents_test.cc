@@ -7,17 +7,15 @@
 #include <hoxcm/documents.h>
 
 #include "support/fake_schema.h"
+#include "support/json.h"
 #include "support/temp_root.h"
 
 using namespace HoxConfigManager;
 
+using hoxcm_test::Parse;
+
 namespace {
 
-Document Parse(const std::string& text) {
-  Document doc;
-  ParseDocument(text, doc);
-  return doc;
-}
 
 // "code message" of the library exception `f` throws.
 std::string Failure(const std::function<void()>& f) {

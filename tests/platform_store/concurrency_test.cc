@@ -24,7 +24,7 @@ rapidjson::Document Generation(int generation) {
     text += (i == 0 ? "" : ",") + std::string(R"({"name":"m)") + std::to_string(i) + R"(","server":"gen)" +
             std::to_string(generation) + R"(","export":"/e"})";
   }
-  return Json(text + "]}}}");
+  return Parse(text + "]}}}");
 }
 
 // The generation the stored user configuration shows, or -1 when its rows
@@ -34,7 +34,7 @@ int StoredGeneration() {
   if (rows.size() != static_cast<std::size_t>(kInstances)) return -1;
   std::string server;
   for (const auto& row : rows) {
-    const std::string s = Json(row->at("Value"))["server"].GetString();
+    const std::string s = Parse(row->at("Value"))["server"].GetString();
     if (server.empty()) server = s;
     if (s != server) return -1;
   }

@@ -53,7 +53,7 @@ TEST_F(StoreTest, ImportedDocumentIsReadBackInKeyThenDocumentOrderAndRebuildsExa
 }
 
 TEST_F(StoreTest, KindsAreSeparateAndEachIsReplacedWhole) {
-  ImportConfiguration(ConfigKind::User, Json(R"({"network":{"routes":{"static":[
+  ImportConfiguration(ConfigKind::User, Parse(R"({"network":{"routes":{"static":[
       {"cs_generated_id":"r-1","destination":"10.0.0.0/8","gateway":"10.0.0.1"},
       {"destination":"10.1.0.0/16","gateway":"10.0.0.1"}]}}})"));
   // A generated identity is kept, or created and written into the value.
@@ -61,32 +61,32 @@ TEST_F(StoreTest, KindsAreSeparateAndEachIsReplacedWhole) {
   ASSERT_EQ(user.size(), 2u);
   EXPECT_EQ(std::get<3>(user[0]), "r-1");
   EXPECT_EQ(std::get<3>(user[1]).size(), 36u);
-  EXPECT_EQ(Json(std::get<4>(user[1]))["cs_generated_id"].GetString(), std::get<3>(user[1]));
+  EXPECT_EQ(Parse(std::get<4>(user[1]))["cs_generated_id"].GetString(), std::get<3>(user[1]));
 
-  rapidjson::Document desired = Json(R"({"profile":{"system":{"identity":{"hostname":{"hostname":"a"}}},
+  rapidjson::Document desired = Parse(R"({"profile":{"system":{"identity":{"hostname":{"hostname":"a"}}},
       "storage":{"nfs":{"mounts":[{"name":"m1","server":"s","export":"/e"}]}}}})");
   SetDesiredUserConfig(desired);
   EXPECT_EQ(Rows(ConfigKind::Desired).size(), 2u);
-  desired = Json(R"({"system":{"identity":{"hostname":{"hostname":"b"}}}})");
+  desired = Parse(R"({"system":{"identity":{"hostname":{"hostname":"b"}}}})");
   SetDesiredUserConfig(desired);
   // A staged object replaces its own row; a new instance gets an identity.
   auto schemas = HoxSchemaStore::SchemaStore::GetStore();
   ProcessDesiredObject(desired.GetAllocator(), GetDBStore(), "system", "identity", "hostname",
                        HoxSchemaStore::GetSchema("system", "identity", "hostname", schemas),
-                       Json(R"({"hostname":"c"})"));
+                       Parse(R"({"hostname":"c"})"));
   ProcessDesiredObject(desired.GetAllocator(), GetDBStore(), "network", "routes", "static",
-                       HoxSchemaStore::GetSchema("network", "routes", "static", schemas), Json(R"({"gateway":"g"})"));
+                       HoxSchemaStore::GetSchema("network", "routes", "static", schemas), Parse(R"({"gateway":"g"})"));
   const auto staged = Rows(ConfigKind::Desired);
   ASSERT_EQ(staged.size(), 2u);
   EXPECT_EQ(std::get<3>(staged[0]).size(), 36u);
   EXPECT_EQ(staged[1], (RowTuple{"system", "identity", "hostname", "", R"({"hostname":"c"})"}));
-  rapidjson::Document nic = Json(R"({"nic":{"port":{"speed":{"gbps":25}}}})");
+  rapidjson::Document nic = Parse(R"({"nic":{"port":{"speed":{"gbps":25}}}})");
   SetDesiredSmartnicConfiguration(nic);
   EXPECT_EQ(GetDesiredSmartnicConfiguration(GetDBStore()).size(), 1u);
   EXPECT_TRUE(GetSmartnicConfiguration(GetDBStore()).empty());
 
   // Defaults are read per key, per instance, and as instances of a singleton.
-  ImportConfiguration(ConfigKind::Default, Json(R"({"network":{"dns":{"config":{"servers":["1.1.1.1"]}}},
+  ImportConfiguration(ConfigKind::Default, Parse(R"({"network":{"dns":{"config":{"servers":["1.1.1.1"]}}},
       "security":{"accounts":{"users":[{"name":"root","shell":"/bin/sh"},{"name":"localconsole","shell":"/bin/sh"}]}}})"));
   auto db = GetDBStore();
   EXPECT_TRUE(GetDefaultUserConfigInternal(db, "network", "dns", "config").IsObject());
@@ -100,7 +100,7 @@ TEST_F(StoreTest, KindsAreSeparateAndEachIsReplacedWhole) {
 }
 
 TEST_F(StoreTest, UserConfigChangesUpsertKeepingPositionAndDeleteById) {
-  ImportConfiguration(ConfigKind::User, Json(R"({"storage":{"nfs":{"mounts":[
+  ImportConfiguration(ConfigKind::User, Parse(R"({"storage":{"nfs":{"mounts":[
       {"name":"a","server":"s","export":"/a"},{"name":"b","server":"s","export":"/b"}]}}})"));
   ApplyUserConfigChanges({
       {"SET", {"storage", "nfs", "mounts", "a"}, R"({"name":"a","server":"t","export":"/a"})"},

@@ -127,7 +127,7 @@ TEST_F(StoreTest, FailedWritersLeaveTheStoreAsItWas) {
            {R"({"storage":{"nfs":{"mounts":[{"name":"a","export":"/a"},{"name":"a","export":"/b"}]}}})", 2084},
            {R"({"storage":{"nfs":{"mounts":[{"server":"s"}]}}})", 2084},
            {R"({"system":{"identity":{"hostname":[]}}})", 2000}}) {
-    EXPECT_EQ(ThrownBy([&] { ImportConfiguration(ConfigKind::User, Json(text)); }).code, code) << text;
+    EXPECT_EQ(ThrownBy([&] { ImportConfiguration(ConfigKind::User, Parse(text)); }).code, code) << text;
   }
   EXPECT_EQ(Rows(ConfigKind::User), before);
 
@@ -135,7 +135,7 @@ TEST_F(StoreTest, FailedWritersLeaveTheStoreAsItWas) {
   // UTF-8, a NaN) are refused instead of stored where they would break
   // every later reader.
   for (const bool nan : {false, true}) {
-    rapidjson::Document doc = Json(R"({"system":{"identity":{"hostname":{"hostname":"x"}}}})");
+    rapidjson::Document doc = Parse(R"({"system":{"identity":{"hostname":{"hostname":"x"}}}})");
     rapidjson::Value& object = doc["system"]["identity"]["hostname"];
     if (nan) {
       object["hostname"].SetDouble(std::numeric_limits<double>::quiet_NaN());

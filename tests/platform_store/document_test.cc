@@ -24,7 +24,7 @@ TEST(ConfigStoreDocumentTest, HostIdsNormaliseToLowerCaseHyphenatedForm) {
 }
 
 TEST(ConfigStoreDocumentTest, DocumentForHostKeepsOnlyThatHostsSectionMergedOverTheSharedItems) {
-  const rapidjson::Document source = Json(R"({
+  const rapidjson::Document source = Parse(R"({
     "profile": {"system": {"identity": {"hostname": {"hostname": "shared"}}},
                 "network": {"dns": {"config": {"servers": []}}}},
     "hostSpecific": {
@@ -45,15 +45,15 @@ TEST(ConfigStoreDocumentTest, DocumentForHostKeepsOnlyThatHostsSectionMergedOver
             R"("network":{"dns":{"config":{"servers":[]}}}},"metadata":{"note":"kept"}})");
 
   rapidjson::Document out;
-  EXPECT_THROW(ConfigStoreDocument::GetDocumentForHost(Json(R"({"hostSpecific": []})"), out, "x"),
+  EXPECT_THROW(ConfigStoreDocument::GetDocumentForHost(Parse(R"({"hostSpecific": []})"), out, "x"),
                ConfigStoreException);
 }
 
 TEST(ConfigStoreDocumentTest, SplitDocumentMovesHostSpecificKeysAndIsUndoneByDocumentForHost) {
-  const rapidjson::Document profile = Json(R"({
+  const rapidjson::Document profile = Parse(R"({
     "system": {"identity": {"hostname": {"hostname": "h1"}}, "kernel": {"boot_options": {"iommu": true}}},
     "network": {"interfaces": {"vnic": [{"name": "vnic0"}]}}})");
-  const rapidjson::Document schemaDocument = Json(R"({"type": "object", "properties": {
+  const rapidjson::Document schemaDocument = Parse(R"({"type": "object", "properties": {
     "system": {"type": "object", "properties": {
       "identity": {"type": "object", "properties": {"hostname": {"type": "object", "hostSpecific": true}}},
       "kernel": {"type": "object", "properties": {"boot_options": {"type": "object"}}}}},
@@ -67,7 +67,7 @@ TEST(ConfigStoreDocumentTest, SplitDocumentMovesHostSpecificKeysAndIsUndoneByDoc
             R"("network":{"interfaces":{"vnic":[{"name":"vnic0"}]}}}}})");
 
   // Merged back for that host, the profile is whole again.
-  rapidjson::Document merged, whole = Json(Compact(profile));
+  rapidjson::Document merged, whole = Parse(Compact(profile));
   ConfigStoreDocument::GetDocumentForHost(split, merged, "4c4c4544-0042-3510-8053-b4c04f4e3132");
   ConfigStoreDocument::NormalizeValue(merged, merged.GetAllocator());
   ConfigStoreDocument::NormalizeValue(whole, whole.GetAllocator());
@@ -75,7 +75,7 @@ TEST(ConfigStoreDocumentTest, SplitDocumentMovesHostSpecificKeysAndIsUndoneByDoc
 }
 
 TEST(ConfigStoreDocumentTest, CleanupActionsDropWhatEachPromises) {
-  const rapidjson::Document schema = Json(R"({"type": "object",
+  const rapidjson::Document schema = Parse(R"({"type": "object",
     "properties": {
       "name": {"type": "string", "default": "x"},
       "mtu": {"type": "integer", "default": 1500},
@@ -108,26 +108,26 @@ TEST(ConfigStoreDocumentTest, CleanupActionsDropWhatEachPromises) {
        R"({"name":"x","tags":[{"k":1}],"options":{"Port":"22"}})"},
   };
   for (const auto& [actions, expected] : cases) {
-    rapidjson::Document value = Json(input);
+    rapidjson::Document value = Parse(input);
     ConfigStoreDocument::CleanupObject(value, schema, actions, value.GetAllocator());
     EXPECT_EQ(Compact(value), expected);
   }
   // A multi-instance key's array schema cleans its instances by "items".
-  const rapidjson::Document arraySchema = Json(R"({"type":"array","items":)" + Compact(schema) + "}");
-  rapidjson::Document instance = Json(R"({"name":"a","extra":1})");
+  const rapidjson::Document arraySchema = Parse(R"({"type":"array","items":)" + Compact(schema) + "}");
+  rapidjson::Document instance = Parse(R"({"name":"a","extra":1})");
   ConfigStoreDocument::CleanupObject(instance, arraySchema, {CLEANUP_REMOVE_UNKNOWN}, instance.GetAllocator());
   EXPECT_EQ(Compact(instance), R"({"name":"a"})");
 }
 
 TEST(ConfigStoreDocumentTest, NormalizeValueSortsMembersAtEveryDepthAndKeepsArrayOrder) {
-  rapidjson::Document value = Json(R"({"b":{"z":1,"a":[{"y":1,"x":2},3]},"a":null,"B":true})");
+  rapidjson::Document value = Parse(R"({"b":{"z":1,"a":[{"y":1,"x":2},3]},"a":null,"B":true})");
   ConfigStoreDocument::NormalizeValue(value, value.GetAllocator());
   EXPECT_EQ(Compact(value), R"({"B":true,"a":null,"b":{"a":[{"x":2,"y":1},3],"z":1}})");
 }
 
 TEST(ConfigStoreDocumentTest, PatchesFillFromAutoConfigurationValues) {
   const rapidjson::Document autoConf =
-      Json(R"({"protocol":"udp","port":514,"tls":{"caFile":"/ca","verify":true},"servers":["a","b","c","d"]})");
+      Parse(R"({"protocol":"udp","port":514,"tls":{"caFile":"/ca","verify":true},"servers":["a","b","c","d"]})");
   // A plain missing member is patched in the host document tests; here the
   // field paths, members already present and what may stand in the way.
   const std::vector<std::tuple<bool, const char*, const char*, const char*>> cases = {  // union tag?
@@ -144,7 +144,7 @@ TEST(ConfigStoreDocumentTest, PatchesFillFromAutoConfigurationValues) {
       {false, R"({"servers":["a"]})", "/servers/3", R"({"servers":["a"]})"},
   };
   for (const auto& [unionTag, text, field, expected] : cases) {
-    rapidjson::Document value = Json(text);
+    rapidjson::Document value = Parse(text);
     (unionTag ? ConfigStoreDocument::PatchUnionTagProperty : ConfigStoreDocument::PatchRequiredProperty)(
         value, field, autoConf, value.GetAllocator());
     EXPECT_EQ(Compact(value), expected) << text << " " << field;

@@ -17,6 +17,8 @@
 #include "support/temp_root.h"
 #include "support/thrown.h"
 
+#include "support/json.h"
+
 namespace hoxcm_test {
 
 inline constexpr const char* kStoreHostPath = "/var/lib/tarvik/configstore/configstore.db";
@@ -35,12 +37,6 @@ inline std::vector<RowTuple> Rows(const HoxConfigStore::ConfigMapList& rows) {
 
 inline std::vector<RowTuple> Rows(HoxConfigStore::ConfigKind kind) {
   return Rows(HoxConfigStore::GetConfigContents(HoxConfigStore::GetDBStore(), kind));
-}
-
-inline rapidjson::Document Json(const std::string& text) {
-  rapidjson::Document doc;
-  HoxConfigManager::ParseDocument(text, doc);
-  return doc;
 }
 
 inline std::string Compact(const rapidjson::Value& value) {

@@ -10,17 +10,15 @@
 #include <hoxcm/documents.h>
 #include <hoxcm/schema_store.h>
 
+#include "support/json.h"
 #include "support/temp_root.h"
 
 using HoxConfigManager::Document;
 
+using hoxcm_test::Parse;
+
 namespace {
 
-Document Parse(const std::string& text) {
-  Document doc;
-  HoxConfigManager::ParseDocument(text, doc);
-  return doc;
-}
 
 using Findings = std::vector<std::pair<std::string, int>>;
 
