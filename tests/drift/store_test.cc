@@ -2,7 +2,6 @@
 // configuration is extracted by the walk itself, items only on the host are
 // compared with their default configuration, and malformed documents leave
 // the store as it was.
-#include <functional>
 #include <string>
 #include <vector>
 
@@ -12,6 +11,7 @@
 #include <hoxcm/operations.h>
 
 #include "drift/drift_fixture.h"
+#include "support/thrown.h"
 
 namespace {
 
@@ -75,14 +75,6 @@ TEST_F(DriftStoreTest, MalformedDocumentsThrowBeforeAnyReportAndLeaveTheStoreUnt
       {"key without schema in a profile", R"({"profile":{"network":{"nope":{"x":{}}}}})",
        "2021 Schema object not found: /network/nope/x"},
   };
-  const auto failure = [](const std::function<void()>& f) -> std::string {
-    try {
-      f();
-    } catch (const HoxConfigStore::ConfigStoreException& e) {
-      return std::to_string(e.GetErrorCode()) + " " + e.what();
-    }
-    return "no exception";
-  };
   const auto storeText = [] {
     std::string out;
     for (const auto& row : HoxConfigStore::GetUserConfigContents(HoxConfigStore::GetDBStore())) {
@@ -95,11 +87,11 @@ TEST_F(DriftStoreTest, MalformedDocumentsThrowBeforeAnyReportAndLeaveTheStoreUnt
     Document desired = Parse(c.desired);
     hoxcm_test::RecordingHandler handler;
     const auto walk = [&] { ComputeDrift(desired, desired.GetAllocator(), handler, Parse("{}")); };
-    EXPECT_EQ(failure(walk), c.failure) << c.what;
+    EXPECT_EQ(hoxcm_test::Failure(walk), c.failure) << c.what;
     EXPECT_EQ(handler.calls, hoxcm_test::Calls{}) << c.what;
     HoxConfigManager::ComplianceResult result;
-    EXPECT_EQ(failure([&] { HoxConfigManager::CheckCompliance(desired, result); }), c.failure) << c.what;
-    EXPECT_EQ(failure([&] { HoxConfigManager::GenerateApplyTasks(desired); }), c.failure) << c.what;
+    EXPECT_EQ(hoxcm_test::Failure([&] { HoxConfigManager::CheckCompliance(desired, result); }), c.failure) << c.what;
+    EXPECT_EQ(hoxcm_test::Failure([&] { HoxConfigManager::GenerateApplyTasks(desired); }), c.failure) << c.what;
     EXPECT_EQ(storeText(), before) << c.what;
   }
 }

@@ -1,33 +1,18 @@
 #include <gtest/gtest.h>
 
-#include <filesystem>
-#include <functional>
 #include <string>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/schema_store.h>
 
-#include "support/fake_schema.h"
 #include "support/json.h"
 #include "support/temp_root.h"
+#include "support/thrown.h"
 
 using namespace HoxConfigManager;
 
+using hoxcm_test::Failure;
 using hoxcm_test::Parse;
-
-namespace {
-
-
-// "code message" of the library exception `f` throws.
-std::string Failure(const std::function<void()>& f) {
-  try {
-    f();
-  } catch (const HoxConfigStore::ConfigStoreException& e) {
-    return std::to_string(e.GetErrorCode()) + " " + e.what();
-  }
-  return "no exception";
-}
-
-}  // namespace
 
 TEST(DocumentsTest, IsEqualArrayMatchesEachElementOnce) {
   struct Case {
@@ -47,25 +32,16 @@ TEST(DocumentsTest, IsEqualArrayMatchesEachElementOnce) {
   EXPECT_EQ(Failure([] { IsEqualArray(Parse("{}"), Parse("[]")); }), "2000 Invalid JSON");
 }
 
-TEST(DocumentsTest, FileExistsOnlyForRegularFiles) {
-  hoxcm_test::TempRoot root;
-  root.WriteFile("/etc/file", "x");
-  EXPECT_TRUE(fileExists(root.Path("/etc/file")));
-  EXPECT_FALSE(fileExists(root.Path("/etc")));
-  EXPECT_FALSE(fileExists(root.Path("/etc/missing")));
-  EXPECT_FALSE(fileExists(root.Path("/etc/file/below-a-file")));
-}
-
 TEST(DocumentsTest, InstanceIdComesFromTheSchemasIdentityMember) {
-  auto schema = std::make_shared<hoxcm_test::FakeSchemaObject>();
-  schema->multiInstance = true;
-  schema->identity = "name";
-  EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"name":"vnic0"})"), schema), "vnic0");
-  EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"other":"x"})"), schema), "");
-  EXPECT_EQ(Failure([&] { GetInstanceIdFromValue(Parse(R"({"name":5})"), schema); }),
-            "2084 Invalid value for key name");
-  schema->identity.clear();
-  EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"name":"vnic0"})"), schema), "");
+  hoxcm_test::TempRoot root;
+  root.InstallSampleSchemas();
+  const auto store = HoxSchemaStore::SchemaStore::GetStore();
+  const auto vnic = store->Find("network", "interfaces", "vnic");
+  EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"name":"vnic0"})"), vnic), "vnic0");
+  EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"other":"x"})"), vnic), "");
+  EXPECT_EQ(Failure([&] { GetInstanceIdFromValue(Parse(R"({"name":5})"), vnic); }), "2084 Invalid value for key name");
+  // A singleton has no identity member.
+  EXPECT_EQ(GetInstanceIdFromValue(Parse(R"({"name":"vnic0"})"), store->Find("network", "dns", "config")), "");
 }
 
 TEST(DocumentsTest, ParsersRefuseMalformedInputOfEveryKindWithoutCrashing) {
@@ -115,22 +91,19 @@ TEST(DocumentsTest, ParsersRefuseMalformedInputOfEveryKindWithoutCrashing) {
   EXPECT_EQ(doc["v"].GetStringLength(), unterminated.size() - 1);
 }
 
-TEST(DocumentsTest, WritersAreCompactAndRoundTrip) {
-  Document doc = Parse(R"({ "b" : [ 1, 2.5, "x\"y" ], "a" : { "n" : null } })");
-  std::string text;
-  SerializeValue(doc, text);
-  EXPECT_EQ(text, R"({"b":[1,2.5,"x\"y"],"a":{"n":null}})");
-  EXPECT_EQ(JsonToString(doc["b"]), R"([1,2.5,"x\"y"])");
-
+TEST(DocumentsTest, FilesAreWrittenWholeAndReadBack) {
+  const Document doc = Parse(R"({"b":[1,2.5,"x\"y"],"a":{"n":null}})");
   hoxcm_test::TempRoot root;
   const std::string path = root.Path("/out.json");
   CreateFileFromDocument(path.c_str(), doc);
-  EXPECT_EQ(root.ReadFile("/out.json"), text);
+  EXPECT_EQ(root.ReadFile("/out.json"), JsonToString(doc));
   Document back;
   CreateDocumentFromFile(path.c_str(), back);
   EXPECT_TRUE(back == doc);
-  EXPECT_FALSE(std::filesystem::exists(path + ".tmp"));
-
+  EXPECT_TRUE(fileExists(path));
+  EXPECT_FALSE(fileExists(path + ".tmp"));
+  EXPECT_FALSE(fileExists(root.Path("/")));
+  EXPECT_FALSE(fileExists(path + "/below-a-file"));
   const std::string unwritable = root.Path("/no/such/dir/out.json");
   EXPECT_THROW(CreateFileFromDocument(unwritable.c_str(), doc), std::exception);
 }

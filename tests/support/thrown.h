@@ -26,4 +26,10 @@ inline Thrown ThrownBy(const std::function<void()>& f) {
   return {};
 }
 
+// The same as one text, "code message" ("0 " when nothing was thrown).
+inline std::string Failure(const std::function<void()>& f) {
+  const Thrown thrown = ThrownBy(f);
+  return std::to_string(thrown.code) + " " + thrown.message;
+}
+
 }  // namespace hoxcm_test
