@@ -13,8 +13,6 @@ namespace {
 
 using namespace HoxConfigManager;
 
-constexpr const char* kStore = "/var/lib/tarvik/configstore/configstore.db";
-
 class HoxcfgStoreTest : public ::testing::Test {
  protected:
   HoxcfgOutcome Run(const std::string& args) { return RunHoxcfg(root_, args); }
@@ -29,7 +27,7 @@ TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExportsToAPrivateFile) {
   const HoxcfgOutcome init = Run("init --root " + root_.path() + " --sample");
   ASSERT_EQ(init.exitCode, 0) << init.err;
   EXPECT_NE(init.out.find("installed schemas"), std::string::npos) << init.out;
-  EXPECT_TRUE(fileExists(root_.Path(kStore)));
+  EXPECT_TRUE(fileExists(root_.Path(kStoreHostPath)));
   EXPECT_TRUE(fileExists(root_.Path("/etc/tarvik/host-facts.json")));
 
   const HoxcfgOutcome exported = Run("export");
@@ -88,10 +86,10 @@ TEST_F(HoxcfgStoreTest, ErrorsPrintTheCodeAndNothingOnStdout) {
   };
   // Reading commands need an initialised root, and create nothing.
   for (const char* command : {"export", "show", "maintenance status"}) expectError(command, "2001");
-  EXPECT_FALSE(fileExists(root_.Path(kStore)));
+  EXPECT_FALSE(fileExists(root_.Path(kStoreHostPath)));
   // A store row that is not JSON.
   InitSample();
-  ExecStoreSql("UPDATE config_item SET value = '{oops' WHERE name = 'hostname'");
+  StoreSql("UPDATE config_item SET value = '{oops' WHERE name = 'hostname'");
   for (const char* command : {"export", "show current"}) expectError(command, "2080");
   const HoxcfgOutcome refused = Run("init --root /");
   EXPECT_EQ(refused.exitCode, 2);

@@ -19,8 +19,8 @@ TEST_F(StoreTest, MissingStoreIsCreatedPrivatelyInWalModeUnlessCreationIsRefused
   EXPECT_FALSE(std::filesystem::exists(StorePath()));
 
   EXPECT_EQ(GetDBStore()->GetPath(), StorePath());
-  EXPECT_EQ(RawSql(StorePath(), "SELECT version FROM schema_version"), "1");
-  EXPECT_EQ(RawSql(StorePath(), "PRAGMA journal_mode"), "wal");
+  EXPECT_EQ(StoreSql("SELECT version FROM schema_version; PRAGMA journal_mode"),
+            (std::vector<std::string>{"1|", "wal|"}));
   // The store holds sensitive values in clear: nobody else may read it.
   SetBootMode(BOOTMODE_NORMAL);
   for (const char* suffix : {"", "-wal"}) {
@@ -49,7 +49,6 @@ TEST_F(StoreTest, CorruptForeignOrNewerStoresAreRefusedAndLeftUntouched) {
   for (const auto& [contents, sql, reason] : cases) {
     SCOPED_TRACE(reason + (" " + sql));
     TempRoot root;
-    const std::string path = root.Path(kStoreHostPath);
     if (contents.empty()) {
       // A valid store made by another process, then changed behind its back.
       const pid_t child = fork();
@@ -58,7 +57,7 @@ TEST_F(StoreTest, CorruptForeignOrNewerStoresAreRefusedAndLeftUntouched) {
         _exit(0);
       }
       ExitCodeOf(child);
-      RawSql(path, "PRAGMA journal_mode = DELETE; " + sql);
+      StoreSql("PRAGMA journal_mode = DELETE; " + sql);
     } else {
       root.WriteFile(kStoreHostPath, contents);
     }
@@ -153,7 +152,7 @@ TEST_F(StoreTest, FailedWritersLeaveTheStoreAsItWas) {
 
   // SQLite itself fails in the middle of a batch (a trigger stands in for a
   // full disk): the statements already run are undone.
-  RawSql(StorePath(), "CREATE TRIGGER boom BEFORE INSERT ON config_item WHEN NEW.name = 'boom' "
+  StoreSql("CREATE TRIGGER boom BEFORE INSERT ON config_item WHEN NEW.name = 'boom' "
                       "BEGIN SELECT RAISE(ABORT, 'disk full'); END");
   const std::vector<UserConfigChange> failing = {{"DELETE", {"system", "identity", "hostname"}, ""},
                                                  {"SET", {"x", "y", "boom"}, "{}"}};

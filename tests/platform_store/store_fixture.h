@@ -3,7 +3,6 @@
 // way a reader outside the library would.
 #pragma once
 
-#include <sqlite3.h>
 #include <sys/wait.h>
 
 #include <string>
@@ -14,14 +13,13 @@
 #include <hoxcm/config_store.h>
 #include <hoxcm/documents.h>
 
+#include "support/store_sql.h"
 #include "support/temp_root.h"
 #include "support/thrown.h"
 
 #include "support/json.h"
 
 namespace hoxcm_test {
-
-inline constexpr const char* kStoreHostPath = "/var/lib/tarvik/configstore/configstore.db";
 
 // (component, group, key, identifier, value) of a contents row.
 using RowTuple = std::tuple<std::string, std::string, std::string, std::string, std::string>;
@@ -43,24 +41,6 @@ inline std::string Compact(const rapidjson::Value& value) {
   std::string out;
   HoxConfigStore::ConfigStoreDocument::SerializeValue(value, out);
   return out;
-}
-
-// Runs SQL on the store file through a connection of its own; returns the
-// first column of the first row it yields ("" when none).
-inline std::string RawSql(const std::string& path, const std::string& sql) {
-  sqlite3* db = nullptr;
-  EXPECT_EQ(sqlite3_open(path.c_str(), &db), SQLITE_OK);
-  std::string first;
-  auto keepFirst = [](void* out, int, char** values, char**) {
-    auto* s = static_cast<std::string*>(out);
-    if (s->empty() && values[0] != nullptr) *s = values[0];
-    return 0;
-  };
-  char* error = nullptr;
-  EXPECT_EQ(sqlite3_exec(db, sql.c_str(), keepFirst, &first, &error), SQLITE_OK) << (error ? error : "");
-  sqlite3_free(error);
-  sqlite3_close(db);
-  return first;
 }
 
 // Waits for a child process: its exit code, or -1 when it did not exit.
