@@ -1,7 +1,5 @@
 // The handlers built on the drift walk: the compliance report, the apply
 // tasks and the boot-time tasks, on hand-written and generated documents.
-#include <regex>
-#include <set>
 #include <string>
 #include <vector>
 
@@ -119,19 +117,10 @@ TEST_F(DriftHandlersTest, BootTimeTasksListEveryItemWithoutComparing) {
                HoxConfigStore::ConfigStoreException);
 }
 
-// Object-level path of a report entry: the key, and the position of the
-// instance below it.
-std::string ObjectPath(const std::string& path) {
-  std::smatch match;
-  std::regex_search(path, match, std::regex("^/[^/]+/[^/]+/[^/]+(/[0-9]+(?=/|$))?"));
-  return match.str(0);
-}
-
-TEST(GeneratedDocumentsTest, SelfDriftIsEmptyProfileChangesNothingAndHandlersAgree) {
+TEST(GeneratedDocumentsTest, SelfDriftIsEmptyAndTheProfileWrapperChangesNothing) {
   // Given generated documents, a document against itself (host instance
   // order shuffled) reports nothing; with about 5% drift, the walk of the
-  // wrapped document equals that of the bare one, and the apply tasks touch
-  // exactly the objects the compliance report names.
+  // wrapped document equals that of the bare one.
   hoxcm_test::TempRoot root;
   hoxcm_bench::InstallReplicatedSchemas(3);
   for (std::uint64_t seed : {7, 8, 9}) {
@@ -151,34 +140,6 @@ TEST(GeneratedDocumentsTest, SelfDriftIsEmptyProfileChangesNothingAndHandlersAgr
     wrapped.SetObject().AddMember("profile", HoxConfigManager::Value(desired, wrapped.GetAllocator()),
                                   wrapped.GetAllocator());
     EXPECT_EQ(Walk(wrapped, host), bare) << "seed " << seed;
-
-    // Objects named by the report (installer drift aside) ...
-    const ComplianceResult result = Check(desired, host);
-    std::set<std::string> reported;
-    for (const char* list : {"ADDS", "DELETES", "SETS"}) {
-      for (const auto& entry : result.document[list].GetArray()) reported.insert(ObjectPath(entry["path"].GetString()));
-    }
-    // ... against the objects of the object-level calls, which the tasks
-    // mirror one for one.
-    std::set<std::string> touched;
-    Calls actions;
-    for (const std::string& call : bare) {
-      if (call.rfind("Property", 0) == 0) continue;
-      const size_t start = call.find(' ') + 1;
-      const std::string path = call.substr(start, call.find(' ', start) - start);
-      // Changes of the installer's settings never count against compliance.
-      const bool installerChange = call.rfind("Set", 0) == 0 && call.size() > 5 &&
-                                   call.compare(call.size() - 5, 5, " null") != 0;
-      if (!installerChange || path.find("/hox/system/installer") == std::string::npos) touched.insert(path);
-      const std::string action = call.substr(0, start - 1);
-      actions.push_back(action == "Set" ? "SET" : action == "Add" ? "ADD" : "DELETE");
-    }
-    EXPECT_EQ(reported, touched) << "seed " << seed;
-    HoxConfigManager::ApplyTaskGenerator generator;
-    HoxConfigManager::ComputeDrift(desired, desired.GetAllocator(), generator, Copy(host));
-    Calls taskActions;
-    for (const auto& task : generator.getTasks()) taskActions.push_back(task.action);
-    EXPECT_EQ(taskActions, actions) << "seed " << seed;
   }
 }
 
