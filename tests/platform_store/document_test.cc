@@ -23,33 +23,7 @@ TEST(ConfigStoreDocumentTest, HostIdsNormaliseToLowerCaseHyphenatedForm) {
   }
 }
 
-TEST(ConfigStoreDocumentTest, DocumentForHostKeepsOnlyThatHostsSectionMergedOverTheSharedItems) {
-  const rapidjson::Document source = Parse(R"({
-    "profile": {"system": {"identity": {"hostname": {"hostname": "shared"}}},
-                "network": {"dns": {"config": {"servers": []}}}},
-    "hostSpecific": {
-      "4C4C4544-0042-3510-8053-B4C04F4E3132": {"system": {"identity": {"hostname": {"hostname": "mine"}},
-                                                            "kernel": {"boot_options": {"iommu": true}}}},
-      "00000000-0000-0000-0000-000000000001": {"system": {"identity": {"hostname": {"hostname": "other"}}}}
-    },
-    "metadata": {"note": "kept"}})");
-  rapidjson::Document mine;
-  ConfigStoreDocument::GetDocumentForHost(source, mine, "4c4c4544-0042-3510-8053-b4c04f4e3132");
-  EXPECT_EQ(Compact(mine),
-            R"({"profile":{"system":{"identity":{"hostname":{"hostname":"mine"}},"kernel":{"boot_options":)"
-            R"({"iommu":true}}},"network":{"dns":{"config":{"servers":[]}}}},"metadata":{"note":"kept"}})");
-  rapidjson::Document stranger;
-  ConfigStoreDocument::GetDocumentForHost(source, stranger, "ffffffff-0000-0000-0000-000000000000");
-  EXPECT_EQ(Compact(stranger),
-            R"({"profile":{"system":{"identity":{"hostname":{"hostname":"shared"}}},)"
-            R"("network":{"dns":{"config":{"servers":[]}}}},"metadata":{"note":"kept"}})");
-
-  rapidjson::Document out;
-  EXPECT_THROW(ConfigStoreDocument::GetDocumentForHost(Parse(R"({"hostSpecific": []})"), out, "x"),
-               ConfigStoreException);
-}
-
-TEST(ConfigStoreDocumentTest, SplitDocumentMovesHostSpecificKeysAndIsUndoneByDocumentForHost) {
+TEST(ConfigStoreDocumentTest, SplitMovesHostSpecificKeysAndDocumentForHostMergesThemBack) {
   const rapidjson::Document profile = Parse(R"({
     "system": {"identity": {"hostname": {"hostname": "h1"}}, "kernel": {"boot_options": {"iommu": true}}},
     "network": {"interfaces": {"vnic": [{"name": "vnic0"}]}}})");
@@ -61,17 +35,25 @@ TEST(ConfigStoreDocumentTest, SplitDocumentMovesHostSpecificKeysAndIsUndoneByDoc
       "interfaces": {"type": "object", "properties": {"vnic": {"type": "array", "hostSpecific": true}}}}}}})");
   rapidjson::Document split;
   ConfigStoreDocument::SplitDocument(profile, schemaDocument, "4C4C4544-0042-3510-8053-B4C04F4E3132", split);
+  const std::string shared = R"({"system":{"kernel":{"boot_options":{"iommu":true}}}})";
   EXPECT_EQ(Compact(split),
-            R"({"profile":{"system":{"kernel":{"boot_options":{"iommu":true}}}},"hostSpecific":)"
+            R"({"profile":)" + shared + R"(,"hostSpecific":)"
             R"({"4c4c4544-0042-3510-8053-b4c04f4e3132":{"system":{"identity":{"hostname":{"hostname":"h1"}}},)"
             R"("network":{"interfaces":{"vnic":[{"name":"vnic0"}]}}}}})");
 
-  // Merged back for that host, the profile is whole again.
-  rapidjson::Document merged, whole = Parse(Compact(profile));
-  ConfigStoreDocument::GetDocumentForHost(split, merged, "4c4c4544-0042-3510-8053-b4c04f4e3132");
+  // Merged back for that host (named in any form), the profile is whole
+  // again; any other host gets the shared items; other members stay.
+  const std::string text = Compact(split);
+  const rapidjson::Document source = Parse(text.substr(0, text.size() - 1) + R"(,"metadata":{"note":"kept"}})");
+  rapidjson::Document merged, whole = Parse(R"({"metadata":{"note":"kept"},"profile":)" + Compact(profile) + "}");
+  ConfigStoreDocument::GetDocumentForHost(source, merged, "{4c4c4544-0042-3510-8053-b4c04f4e3132}");
   ConfigStoreDocument::NormalizeValue(merged, merged.GetAllocator());
   ConfigStoreDocument::NormalizeValue(whole, whole.GetAllocator());
-  EXPECT_EQ(Compact(merged), "{\"profile\":" + Compact(whole) + "}");
+  EXPECT_EQ(Compact(merged), Compact(whole));
+  ConfigStoreDocument::GetDocumentForHost(source, merged, "ffffffff-0000-0000-0000-000000000000");
+  EXPECT_EQ(Compact(merged), R"({"profile":)" + shared + R"(,"metadata":{"note":"kept"}})");
+  EXPECT_THROW(ConfigStoreDocument::GetDocumentForHost(Parse(R"({"hostSpecific": []})"), merged, "x"),
+               ConfigStoreException);
 }
 
 TEST(ConfigStoreDocumentTest, CleanupActionsDropWhatEachPromises) {
