@@ -36,11 +36,12 @@ TEST_F(PluginManagerTest, OperationsRunInsideTheirGroupAfterWhatTheyDependOn) {
             (std::vector<std::string>{"system-early", "network", "storage", "system"}));
   EXPECT_TRUE(PluginManager(IMPACT).GetDependencies().empty());
 
+  // Versions 3 and 1 (version 2 in the sample plugins below).
   Manifest("b/plugin.json", V3Manifest("python", {"network:dns:config"}, "network", "B", {"C"}));
   Manifest("c/plugin.json", V3Manifest("python", {"network:routes:static"}, "network", "C", {}));
   Manifest("services/time/ntp/p.json",
-           R"({"version":2,"type":"python","apply":{"boot":false,"apply_group":"system",
-               "operations":{"SET":{"provides":"SET:ntp","depends":["B"]}}}})");
+           R"({"type":"python","boot":false,"apply_group":"system",
+               "operations":{"SET":{"provides":"SET:ntp","depends":["B"]}}})");
   const auto order = PluginManager(APPLY).GetDependencies();
   EXPECT_EQ(order.size(), 7u);
   ExpectChain(order, {"system-early", "C", "B", "network", "storage", "SET:ntp", "system"});
