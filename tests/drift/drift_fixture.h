@@ -1,18 +1,15 @@
-// Helpers of the drift tests: parsing, sample files, and a drift handler that
+// Helpers of the drift tests: a copy of a value, and a drift handler that
 // records every call as one line of text (drift records aside).
 #pragma once
 
-#include <fstream>
-#include <iterator>
 #include <string>
 #include <vector>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/drift.h>
 
-#include "support/temp_root.h"
-
 #include "support/json.h"
+#include "support/temp_root.h"
 
 namespace hoxcm_test {
 
@@ -22,11 +19,6 @@ inline HoxConfigManager::Document Copy(const HoxConfigManager::Value& value) {
   HoxConfigManager::Document out;
   out.CopyFrom(value, out.GetAllocator());
   return out;
-}
-
-inline std::string ReadSource(const std::string& relative) {
-  std::ifstream in(SourcePath(relative));
-  return std::string(std::istreambuf_iterator<char>(in), {});
 }
 
 class RecordingHandler final : public HoxConfigManager::DriftHandler {

@@ -25,7 +25,7 @@ class DriftStoreTest : public ::testing::Test {
     HoxConfigStore::GetDBStore(0, true);
     for (const auto& [kind, file] : {std::pair{HoxConfigStore::ConfigKind::Default, "default-config.json"},
                                      std::pair{HoxConfigStore::ConfigKind::User, "user-config.json"}}) {
-      HoxConfigStore::ImportConfiguration(kind, Parse(hoxcm_test::ReadSource(std::string("data/sample-host/") + file)));
+      HoxConfigStore::ImportConfiguration(kind, hoxcm_test::SampleDocument(file));
     }
   }
 

@@ -11,6 +11,7 @@
 #include <hoxcm/config_store.h>
 #include <hoxcm/documents.h>
 
+#include "support/json.h"
 #include "support/store_sql.h"
 #include "support/temp_root.h"
 #include "support/thrown.h"
@@ -26,12 +27,6 @@ class SampleHostTest : public ::testing::Test {
     HoxConfigStore::ImportConfiguration(HoxConfigStore::ConfigKind::User, SampleDocument("user-config.json"));
   }
 
-  // A sample file parsed ("user-config.json", ...).
-  static rapidjson::Document SampleDocument(const std::string& name) {
-    rapidjson::Document doc;
-    HoxConfigManager::CreateDocumentFromFile(SourcePath("data/sample-host/" + name).c_str(), doc);
-    return doc;
-  }
   // Sets the feature switches of the host facts file.
   void SetFeatures(const std::string& featuresJson) const {
     root_.WriteFile("/etc/tarvik/host-facts.json", "{\"features\": " + featuresJson + "}");

@@ -37,11 +37,7 @@ inline std::vector<RowTuple> Rows(HoxConfigStore::ConfigKind kind) {
   return Rows(HoxConfigStore::GetConfigContents(HoxConfigStore::GetDBStore(), kind));
 }
 
-inline std::string Compact(const rapidjson::Value& value) {
-  std::string out;
-  HoxConfigStore::ConfigStoreDocument::SerializeValue(value, out);
-  return out;
-}
+inline std::string Compact(const rapidjson::Value& value) { return HoxConfigManager::JsonToString(value); }
 
 // Waits for a child process: its exit code, or -1 when it did not exit.
 inline int ExitCodeOf(pid_t child) {

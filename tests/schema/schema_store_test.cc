@@ -9,6 +9,7 @@
 #include <hoxcm/documents.h>
 #include <hoxcm/schema_store.h>
 
+#include "support/json.h"
 #include "support/temp_root.h"
 #include "support/thrown.h"
 
@@ -195,8 +196,7 @@ TEST(SchemaStoreTest, HostDocumentSchemaCoversKnownKeysAndNamesOrRefusesTheRest)
 
   // Keys without schema are named (the "profile" wrapper is looked through
   // by the hoxcfg test).
-  HoxConfigManager::Document user;
-  HoxConfigManager::CreateDocumentFromFile(hoxcm_test::SourcePath("data/sample-host/user-config.json").c_str(), user);
+  HoxConfigManager::Document user = hoxcm_test::SampleDocument("user-config.json");
   user["network"]["dns"].AddMember("resolver", HoxConfigManager::Value(rapidjson::kObjectType), user.GetAllocator());
   user["storage"].AddMember("fc", HoxConfigManager::Value(rapidjson::kObjectType), user.GetAllocator());
   user["storage"]["fc"].AddMember("ports", HoxConfigManager::Value(rapidjson::kArrayType), user.GetAllocator());

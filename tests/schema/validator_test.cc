@@ -124,8 +124,7 @@ TEST(ValidatorTest, HostDocumentReportsEveryFaultyItemWithoutSensitiveValues) {
   // every one of them should be reported, and no sensitive value shown.
   hoxcm_test::TempRoot root;
   root.InstallSampleSchemas();
-  Document doc;
-  HoxConfigManager::CreateDocumentFromFile(hoxcm_test::SourcePath("data/sample-host/user-config.json").c_str(), doc);
+  Document doc = hoxcm_test::SampleDocument("user-config.json");
   auto& a = doc.GetAllocator();
   doc["network"]["interfaces"]["vnic"][1]["mtu"] = 9600;
   doc["network"]["interfaces"]["vnic"][2].RemoveMember("name");

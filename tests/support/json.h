@@ -1,16 +1,25 @@
-// Parsing JSON text in tests: the library's own parser, so a malformed
-// literal in a test fails the way the library fails.
+// Parsing JSON in tests: the library's own parser, so a malformed literal in
+// a test fails the way the library fails.
 #pragma once
 
 #include <string>
 
 #include <hoxcm/documents.h>
 
+#include "support/temp_root.h"
+
 namespace hoxcm_test {
 
 inline HoxConfigManager::Document Parse(const std::string& text) {
   HoxConfigManager::Document doc;
   HoxConfigManager::ParseDocument(text, doc);
+  return doc;
+}
+
+// A file of the sample host ("user-config.json", ...), parsed.
+inline HoxConfigManager::Document SampleDocument(const std::string& name) {
+  HoxConfigManager::Document doc;
+  HoxConfigManager::CreateDocumentFromFile(SourcePath("data/sample-host/" + name).c_str(), doc);
   return doc;
 }
 
