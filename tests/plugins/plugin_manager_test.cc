@@ -105,22 +105,5 @@ TEST_F(PluginManagerTest, SamplePluginsChainEveryApplyKey) {
   ExpectChain(order, {"REMEDIATE:services:syslog", "REMEDIATE:quorlet"});
 }
 
-TEST_F(PluginManagerTest, AThousandPluginsLoadAndOrder) {
-  // Given 1,000 plugins in one group, each depending on the one before.
-  std::vector<std::string> chain;
-  for (int i = 0; i < 1000; ++i) {
-    chain.push_back("P" + std::to_string(i));
-    Manifest("p" + std::to_string(i) + "/plugin.json",
-             V3Manifest("python", {"storage:nfs:mounts"}, "storage", chain.back(),
-                        i ? std::vector<std::string>{chain[i - 1]} : std::vector<std::string>{}));
-  }
-  PluginManager manager(APPLY);
-  EXPECT_EQ(manager.Find(ConfigStoreObjectId("storage", "nfs", "mounts")).size(), 1000u);
-  const auto order = manager.GetDependencies();
-  ASSERT_EQ(order.size(), 1004u);
-  chain.push_back("storage");
-  ExpectChain(order, chain);
-}
-
 }  // namespace
 }  // namespace hoxcm_test
