@@ -133,12 +133,6 @@ TEST(ConfigStoreDocumentTest, PatchesFillFromAutoConfigurationValues) {
   }
 }
 
-// The parser's refusals are the shared parser's; here only their mapping.
-TEST(ConfigStoreDocumentTest, CreateDocumentParsesOrThrowsJsonParseFailed) {
-  EXPECT_EQ(Compact(ConfigStoreDocument::CreateDocument(R"( {"a": [1, "\u00e9"]} )")), "{\"a\":[1,\"\xc3\xa9\"]}");
-  EXPECT_EQ(ThrownBy([] { ConfigStoreDocument::CreateDocument("{\"a\":1} x"); }).code, 2080);
-}
-
 TEST(ConfigStoreDocumentTest, GeneratedInstanceIdsAreDistinctVersion4Uuids) {
   const std::regex uuid("[0-9a-f]{8}-[0-9a-f]{4}-4[0-9a-f]{3}-[89ab][0-9a-f]{3}-[0-9a-f]{12}");
   std::set<std::string> ids;
