@@ -45,8 +45,9 @@ TEST_F(StoreTest, KindsAreSeparateAndEachIsReplacedWhole) {
   // Defaults are read per key and per instance.
   ImportConfiguration(ConfigKind::Default,
                       Parse(R"({"security":{"accounts":{"users":[{"name":"root"},{"name":"localconsole"}]}}})"));
-  EXPECT_EQ(GetDefaultUserConfigInternal(GetDBStore(), "security", "accounts", "users").Size(), 2u);
-  const auto localconsole = GetDefaultUserConfigMapList({"security", "accounts", "users", "localconsole"}, GetDBStore());
+  auto db = GetDBStore();
+  EXPECT_EQ(GetDefaultUserConfigInternal(db, "security", "accounts", "users").Size(), 2u);
+  const auto localconsole = GetDefaultUserConfigMapList({"security", "accounts", "users", "localconsole"}, db);
   ASSERT_EQ(localconsole.size(), 1u);
   EXPECT_EQ(localconsole[0]->at("Identifier"), "localconsole");
   EXPECT_EQ(Rows(ConfigKind::User), user);
