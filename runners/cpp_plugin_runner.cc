@@ -15,11 +15,11 @@
 #include <string>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/files.h>
 #include <hoxcm/host.h>
 #include <hoxcm/plugin_sdk.h>
 #include <hoxcm/plugins.h>
 
-#include "platform/process/process.h"
 #include "runner_support.h"
 
 namespace {
@@ -113,7 +113,8 @@ int RunRequest(const std::string& root) {
   std::unique_ptr<char, void (*)(char*)> result(raw, table->free_result);
 
   const std::string resultPath = HoxConfigManager::PluginResultPath();
-  HoxPlatform::WriteFilePrivately(resultPath, result.get(), /*durable=*/false);
+  // The result lives for one run: atomic, but not worth a flush to disk.
+  HoxPlatform::WriteFileAtomically(resultPath, result.get(), 0600, HoxPlatform::Durability::kAtomic);
   CheckResult(operation, resultPath);
 
   if (operation == "APPLY" && HoxConfigManager::ErrorInfo::Load(resultPath).id.empty()) {

@@ -3,10 +3,12 @@
 #include <stdexcept>
 #include <vector>
 
+#include <hoxcm/host.h>
+
 namespace hoxcm_runner {
 
 std::string RootFromProgramPath(const std::string& programPath) {
-  static const std::string kRunnerDirectory = "/usr/lib/tarvik/configmanager/bin/";
+  static const std::string kRunnerDirectory = std::string(HoxPlatform::HostPaths::kRunnerDirectory) + "/";
   const std::size_t slash = programPath.rfind('/');
   if (slash == std::string::npos) return "/";
   const std::string directory = programPath.substr(0, slash + 1);

@@ -2,9 +2,8 @@
 # formats and the store; the script runner is installed as it is.
 add_executable(cpp_plugin_runner
   ${CMAKE_CURRENT_LIST_DIR}/cpp_plugin_runner.cc
-  ${CMAKE_CURRENT_LIST_DIR}/runner_support.cc
-  ${CMAKE_SOURCE_DIR}/src/platform/process/process.cc)
-target_include_directories(cpp_plugin_runner PRIVATE ${CMAKE_SOURCE_DIR}/src ${CMAKE_CURRENT_LIST_DIR})
+  ${CMAKE_CURRENT_LIST_DIR}/runner_support.cc)
+target_include_directories(cpp_plugin_runner PRIVATE ${CMAKE_CURRENT_LIST_DIR})
 target_link_libraries(cpp_plugin_runner PRIVATE hoxcm ${CMAKE_DL_LIBS})
 # Installed runners live beside the plugins' lib directory; the library is
 # found through the usual search path of the installation.

@@ -151,7 +151,8 @@ struct HOXCM_API ErrorInfo {
 
   // JSON form, see docs/plugin-protocol.md. Serialize never fails;
   // Deserialize and Load throw ConfigStoreException(2000, "Invalid JSON")
-  // on malformed text and std::runtime_error when the file cannot be read.
+  // on malformed text; Load throws HoxPlatform::FileError (a
+  // HostCtlException) when the file cannot be read.
   std::string Serialize() const;
   void Deserialize(const std::string& text);
   static ErrorInfo Load(const std::string& path);

@@ -21,6 +21,65 @@ HOXCM_API std::string HostPath(std::string_view path);
 // unchanged when it is not below the root).
 HOXCM_API std::string StripHostRoot(std::string_view path);
 
+// The host's fixed paths, the one table of them: the library, hoxcfg, both
+// runners and the tests take their paths from here (the script runner keeps a
+// copy, which a test compares with this table). Each is a path on the host,
+// resolved under the root with HostPath(). Directories have no trailing "/".
+namespace HostPaths {
+inline constexpr std::string_view kSchemaDirectory = "/usr/lib/tarvik/configmanager/schemas";
+inline constexpr std::string_view kManifestDirectory = "/usr/lib/tarvik/configmanager/apply_modules";
+inline constexpr std::string_view kManifestSchemaDirectory = "/usr/lib/tarvik/configmanager/plugin_schemas";
+inline constexpr std::string_view kRunnerDirectory = "/usr/lib/tarvik/configmanager/bin";
+inline constexpr std::string_view kPythonRunner = "/usr/lib/tarvik/configmanager/bin/py_plugin_runner";
+inline constexpr std::string_view kCppRunner = "/usr/lib/tarvik/configmanager/bin/cpp_plugin_runner";
+inline constexpr std::string_view kLifecycleDirectory = "/var/tarvik/lifecycle";
+inline constexpr std::string_view kRequestFile = "/var/tarvik/lifecycle/cm-plugin-input.json";
+inline constexpr std::string_view kResultFile = "/var/tarvik/lifecycle/cm-plugin-output.json";
+inline constexpr std::string_view kRunLock = "/var/tarvik/lifecycle/cm-plugin.lock";
+inline constexpr std::string_view kStoreDirectory = "/var/lib/tarvik/configstore";
+inline constexpr std::string_view kStore = "/var/lib/tarvik/configstore/configstore.db";
+inline constexpr std::string_view kHostFacts = "/etc/tarvik/host-facts.json";
+inline constexpr std::string_view kProductUuid = "/sys/class/dmi/id/product_uuid";
+inline constexpr std::string_view kSystemVendor = "/sys/class/dmi/id/sys_vendor";
+inline constexpr std::string_view kProductName = "/sys/class/dmi/id/product_name";
+inline constexpr std::string_view kMachineId = "/etc/machine-id";
+inline constexpr std::string_view kSshClientConfig = "/etc/ssh/ssh_config";
+inline constexpr std::string_view kSshServerConfig = "/etc/ssh/sshd_config";
+inline constexpr std::string_view kSshAuthorizedKeys = "/root/.ssh/authorized_keys";
+inline constexpr std::string_view kAutodeployWaiterNotify = "/etc/tarvik/autodeploy/waiterNotify.json";
+inline constexpr std::string_view kAutodeployFirewall = "/etc/tarvik/firewall/autodeploy.xml";
+
+// Every entry by a name of its own (the names of the script runner's copy).
+struct Entry {
+  std::string_view name;
+  std::string_view path;
+};
+inline constexpr Entry kTable[] = {
+    {"schema_directory", kSchemaDirectory},
+    {"manifest_directory", kManifestDirectory},
+    {"manifest_schema_directory", kManifestSchemaDirectory},
+    {"runner_directory", kRunnerDirectory},
+    {"python_runner", kPythonRunner},
+    {"cpp_runner", kCppRunner},
+    {"lifecycle_directory", kLifecycleDirectory},
+    {"request_file", kRequestFile},
+    {"result_file", kResultFile},
+    {"run_lock", kRunLock},
+    {"store_directory", kStoreDirectory},
+    {"store", kStore},
+    {"host_facts", kHostFacts},
+    {"product_uuid", kProductUuid},
+    {"system_vendor", kSystemVendor},
+    {"product_name", kProductName},
+    {"machine_id", kMachineId},
+    {"ssh_client_config", kSshClientConfig},
+    {"ssh_server_config", kSshServerConfig},
+    {"ssh_authorized_keys", kSshAuthorizedKeys},
+    {"autodeploy_waiter_notify", kAutodeployWaiterNotify},
+    {"autodeploy_firewall", kAutodeployFirewall},
+};
+}  // namespace HostPaths
+
 }  // namespace HoxPlatform
 
 class HOXCM_API CSLogger {

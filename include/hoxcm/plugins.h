@@ -120,7 +120,6 @@ class HOXCM_API Plugin {
   std::string type;
   std::string module;
   std::string id;
-  std::string schemaInfo;
   Document manifest;
   std::vector<HoxConfigStore::ConfigStoreObjectId> csoIds;
   std::string path_;

@@ -1,11 +1,5 @@
 #include <hoxcm/documents.h>
 
-#include <cerrno>
-#include <cstring>
-#include <fstream>
-#include <iterator>
-#include <sstream>
-#include <sys/stat.h>
 #include <vector>
 
 #include <hoxcm/host.h>
@@ -14,19 +8,6 @@
 #include "foundation/json_parse.h"
 
 namespace HoxConfigManager {
-
-bool fileExists(const std::string& path) {
-  struct stat st;
-  if (::stat(path.c_str(), &st) != 0) {
-    // Every failure is logged, a missing file included: callers that probe
-    // for optional files see the reason in the log.
-    const int err = errno;
-    CSLogger::Log(CSLogger::kError, "Failed to query the status of \"%s\", error code: %d, error message: \"%s\"",
-                  path.c_str(), err, std::strerror(err));
-    return false;
-  }
-  return S_ISREG(st.st_mode);
-}
 
 std::shared_ptr<Document> CreateDocument() { return std::make_shared<Document>(); }
 
@@ -80,29 +61,6 @@ std::string JsonToString(const Value& value) {
   return out;
 }
 
-void CreateFileFromDocument(const char* path, const Document& doc) {
-  RAPIDJSON_ASSERT(path != nullptr);
-  std::string text;
-  SerializeValue(doc, text);
-  // Written beside the target and renamed over it, so a reader never sees
-  // half a document.
-  const std::string tmp = std::string(path) + ".tmp";
-  {
-    std::ofstream out(tmp, std::ios::binary | std::ios::trunc);
-    out.write(text.data(), static_cast<std::streamsize>(text.size()));
-    out.flush();
-    if (!out) {
-      std::remove(tmp.c_str());
-      throw std::runtime_error("Failed to write " + std::string(path));
-    }
-  }
-  if (std::rename(tmp.c_str(), path) != 0) {
-    const int err = errno;
-    std::remove(tmp.c_str());
-    throw std::runtime_error("Failed to write " + std::string(path) + ": " + std::strerror(err));
-  }
-}
-
 void ParseDocument(const std::string& text, Document& doc) {
   if (!detail::ParseJson(text.data(), text.size(), doc)) {
     ThrowException<InvalidArgumentException>(JsonParseFailed);
@@ -113,27 +71,6 @@ std::shared_ptr<Document> CreateDocumentFromString(const std::string& text) {
   auto doc = CreateDocument();
   ParseDocument(text, *doc);
   return doc;
-}
-
-void CreateDocumentFromFile(const char* path, Document& doc) {
-  std::string text;
-  bool readable = false;
-  if (path != nullptr) {
-    // Reading a directory makes the stream throw; any read failure is the
-    // same "unparsable" answer.
-    try {
-      std::ifstream in(path, std::ios::binary);
-      if (in) {
-        text.assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-        readable = !in.bad();
-      }
-    } catch (const std::exception&) {
-      readable = false;
-    }
-  }
-  if (!readable || !detail::ParseJson(text.data(), text.size(), doc)) {
-    ThrowException<ConfigManagerException>(JsonParseFailed);
-  }
 }
 
 }  // namespace HoxConfigManager

@@ -73,6 +73,7 @@ bool IsAscii(const char* text, std::size_t size) {
 bool ParseJson(const char* text, std::size_t size, Document& doc, std::string* error) {
   bool ok = false;
   bool tooDeep = false;
+  bool trailingNul = false;
   rapidjson::ParseResult result;
   auto generator = [&](Document& target) {
     DepthLimitedBuilder builder(target);
@@ -82,12 +83,20 @@ bool ParseJson(const char* text, std::size_t size, Document& doc, std::string* e
                                  : reader.Parse<kParseFlags>(stream, builder);
     tooDeep = builder.TooDeep();
     ok = !result.IsError();
+    // The reader takes a NUL byte for the end of the text: a document
+    // followed by a NUL and anything else must not pass as that document.
+    if (ok && stream.Tell() != size) {
+      trailingNul = true;
+      result.Set(rapidjson::kParseErrorDocumentRootNotSingular, stream.Tell());
+      ok = false;
+    }
     return ok;
   };
   doc.Populate(generator);
   if (!ok && error != nullptr) {
-    *error = tooDeep ? "nesting deeper than " + std::to_string(kMaxJsonDepth) + " levels"
-                     : std::string(rapidjson::GetParseError_En(result.Code()));
+    *error = tooDeep       ? "nesting deeper than " + std::to_string(kMaxJsonDepth) + " levels"
+             : trailingNul ? std::string("a NUL byte after the document")
+                           : std::string(rapidjson::GetParseError_En(result.Code()));
     *error += " at offset " + std::to_string(result.Offset());
   }
   if (!ok) doc.SetNull();

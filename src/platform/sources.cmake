@@ -5,6 +5,7 @@ list(APPEND HOXCM_SOURCES
   src/platform/strings.cc
 )
 # Each area of the platform keeps its own list.
+include(${CMAKE_CURRENT_LIST_DIR}/files/sources.cmake OPTIONAL)
 include(${CMAKE_CURRENT_LIST_DIR}/store/sources.cmake OPTIONAL)
 include(${CMAKE_CURRENT_LIST_DIR}/host/sources.cmake OPTIONAL)
 include(${CMAKE_CURRENT_LIST_DIR}/schema/sources.cmake OPTIONAL)

@@ -1,11 +1,13 @@
 // Plugin: identity and capabilities of one installed plugin, read from its
-// manifest. Runs (Apply, Impact, Validate) live in plugin_run.cc.
+// manifest. Its runs (Apply, Impact, Validate) are in plugin_launcher.cc.
 #include <boost/algorithm/string.hpp>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
 #include <hoxcm/plugins.h>
 #include <hoxcm/schema_store.h>
+
+#include "platform/files/document_files.h"
 
 namespace HoxConfigManager {
 namespace {
@@ -62,7 +64,7 @@ Plugin::Plugin(const char* path) {
   }
   path_ = path;
   CSLogger::Log(CSLogger::kInfo, "Processing file %s", path);
-  CreateDocumentFromFile(path, manifest);
+  HoxPlatform::detail::ReadDocumentFile(path, HoxPlatform::FileKind::Manifest, manifest);
   version = GetPluginVersion(manifest);
   validateFile(path);
 
@@ -99,11 +101,14 @@ Plugin::Plugin(const char* path) {
     for (const Value& a : accepts.GetArray()) csoIds.push_back(IdFromTriple(StringOf(a)));
   }
 
+  // A plugin that owns objects is not loaded without the schema store, nor
+  // when its first object has no schema (the lookup throws); nothing keeps
+  // the lookup's text.
   if (!csoIds.empty()) {
     const auto store = HoxSchemaStore::SchemaStore::GetStore();
     if (!store) ThrowException<ConfigManagerException>(SchemaStoreAccessFailed);
     const auto& first = csoIds.front();
-    schemaInfo = store->GetSchemaInfo(first.component, first.group, first.key);
+    (void)store->GetSchemaInfo(first.component, first.group, first.key);
   }
 }
 

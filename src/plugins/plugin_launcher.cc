@@ -40,7 +40,7 @@ void CheckAndAnnounce(const std::string& id, const std::string& operation, int v
                 operation.c_str(), version, type.c_str());
 }
 
-std::string RunLockPath() { return HoxPlatform::HostPath("/var/tarvik/lifecycle/cm-plugin.lock"); }
+std::string RunLockPath() { return HoxPlatform::HostPath(HoxPlatform::HostPaths::kRunLock); }
 
 // Message ids of one kind of run.
 struct RunIds {
@@ -119,9 +119,8 @@ PluginLauncher::~PluginLauncher() {
 
 void PluginLauncher::ForkPlugin(std::shared_ptr<PluginMonitor> monitor) {
   CSLogger::Log(CSLogger::kInfo, "Forking plugin for id=%s", id.c_str());
-  const std::string runner = HoxPlatform::HostPath(type == "python"
-                                                       ? "/usr/lib/tarvik/configmanager/bin/py_plugin_runner"
-                                                       : "/usr/lib/tarvik/configmanager/bin/cpp_plugin_runner");
+  const std::string runner = HoxPlatform::HostPath(type == "python" ? HoxPlatform::HostPaths::kPythonRunner
+                                                                     : HoxPlatform::HostPaths::kCppRunner);
   int spawnError = 0;
   const pid_t pid = HoxPlatform::SpawnClean(runner, {runner, kGroupArgument}, &spawnError);
   if (pid < 0) {

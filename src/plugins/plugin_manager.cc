@@ -2,10 +2,10 @@
 // apply operations run.
 #include <stdexcept>
 
-#include <boost/filesystem.hpp>
 #include <boost/graph/adjacency_list.hpp>
 #include <boost/graph/topological_sort.hpp>
 
+#include <hoxcm/files.h>
 #include <hoxcm/host.h>
 #include <hoxcm/plugins.h>
 
@@ -34,18 +34,23 @@ std::string ObjectKey(const HoxConfigStore::ConfigStoreObjectId& id) {
 PluginManager::PluginManager(PluginType type) : directory(PluginDirectory()) { Load(type); }
 
 void PluginManager::Load(PluginType type) {
-  namespace fs = boost::filesystem;
-  boost::system::error_code ec;
   // A host without plugins has no directory: an empty registry.
-  if (fs::is_directory(directory, ec)) {
-    // Symbolic links to directories are not followed (the iterator's
-    // default), so a link loop cannot trap the walk.
-    for (fs::recursive_directory_iterator it(directory), end; it != end; ++it) {
-      // A directory that happens to end in ".json" is walked, not read.
-      if (it->path().extension() == ".json" && !fs::is_directory(it->path(), ec)) {
-        ProcessJson(it->path().c_str(), type);
-      }
+  if (HoxPlatform::IsDirectory(directory)) {
+    // Symbolic links to directories are not followed, so a link loop cannot
+    // trap the walk; a directory that happens to end in ".json" is walked,
+    // not read. Manifests load in path order, which fixes the order in
+    // which Find returns the owners of an object.
+    HoxPlatform::ListOptions options;
+    options.suffix = ".json";
+    const HoxPlatform::DirectoryListing listing = HoxPlatform::ListFiles(directory, options);
+    // An unreadable manifest fails the registry, as a malformed one does:
+    // a plugin missing from it would silently not run.
+    for (const auto& problem : listing.problems) {
+      const std::string text = "Plugin manifest " + problem.path + " cannot be read: " + problem.reason;
+      CSLogger::Log(CSLogger::kError, "%s", text.c_str());
+      throw ConfigManagerException(kPluginFailureCode, text.c_str());
     }
+    for (const std::string& file : listing.files) ProcessJson(file.c_str(), type);
   }
   if (type != APPLY && type != APPLY_BOOT) return;
   try {

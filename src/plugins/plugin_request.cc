@@ -1,12 +1,13 @@
 // PluginRequest: the request document of one plugin run, written by the
 // library and read back by the runners.
+#include <filesystem>
 #include <stdexcept>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/files.h>
 #include <hoxcm/plugins.h>
 
-#include "foundation/json_parse.h"
-#include "platform/process/process.h"
+#include "platform/files/document_files.h"
 
 namespace HoxConfigManager {
 namespace {
@@ -129,15 +130,16 @@ void PluginRequest::Dump(const std::string& path, const std::string& taskId, con
   Allocator& a = document_.GetAllocator();
   PopulateTaskId(taskId, a);
   PopulateClusterContext(clusterContext, a);
-  // The request lives for one run: after a crash the run is gone too, so
-  // it needs atomic replacement but no flush to disk.
-  HoxPlatform::WriteFilePrivately(path, JsonToString(document_), /*durable=*/false);
+  HoxPlatform::CreateDirectories(std::filesystem::path(path).parent_path().string());
+  // The request carries configuration values, passwords among them: only the
+  // owner may read it. It lives for one run: after a crash the run is gone
+  // too, so it needs atomic replacement but no flush to disk.
+  HoxPlatform::WriteFileAtomically(path, JsonToString(document_), 0600, HoxPlatform::Durability::kAtomic);
 }
 
 void PluginRequest::Load(const std::string& path) {
-  const std::string text = HoxPlatform::ReadWholeFile(path);
   Document doc;
-  if (!detail::ParseJson(text.data(), text.size(), doc)) ThrowException<ConfigManagerException>(JsonParseFailed);
+  HoxPlatform::detail::ReadDocumentFile(path, HoxPlatform::FileKind::PluginExchange, doc);
   document_.Swap(doc);
 }
 

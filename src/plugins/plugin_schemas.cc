@@ -1,15 +1,12 @@
 // Checking manifests against the manifest schema of their version, and the
 // fixed paths of the framework.
 #include <algorithm>
-#include <fstream>
 #include <map>
 #include <mutex>
 #include <set>
-#include <sstream>
-
-#include <boost/filesystem.hpp>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/files.h>
 #include <hoxcm/host.h>
 #include <hoxcm/plugins.h>
 #include <hoxcm/schema_store.h>
@@ -21,13 +18,16 @@ namespace {
 
 std::string Quoted(std::string_view s) { return "\"" + std::string(s) + "\""; }
 
-bool ReadFile(const std::string& path, std::string& text) {
-  std::ifstream in(path, std::ios::binary);
-  if (!in) return false;
-  std::stringstream ss;
-  ss << in.rdbuf();
-  text = ss.str();
-  return !in.bad();
+// The file's text; false when it cannot be read (the reason is logged: the
+// texts of the manifest checks name the file only).
+bool ReadFile(const std::string& path, HoxPlatform::FileKind kind, std::string& text) {
+  try {
+    text = HoxPlatform::ReadFile(path, kind);
+    return true;
+  } catch (const HoxPlatform::FileError& e) {
+    CSLogger::Log(CSLogger::kError, "%s", e.what());
+    return false;
+  }
 }
 
 // A schema set (or the reason it could not be built) for one directory.
@@ -58,16 +58,17 @@ const std::set<int>& NoIgnoredErrors() {
 
 }  // namespace
 
-std::string PluginDirectory() { return HoxPlatform::HostPath("/usr/lib/tarvik/configmanager/apply_modules/"); }
+std::string PluginDirectory() { return HoxPlatform::HostPath(HoxPlatform::HostPaths::kManifestDirectory) + "/"; }
 std::string PluginSchemaDirectory() {
-  return HoxPlatform::HostPath("/usr/lib/tarvik/configmanager/plugin_schemas/");
+  return HoxPlatform::HostPath(HoxPlatform::HostPaths::kManifestSchemaDirectory) + "/";
 }
-std::string PluginRequestPath() { return HoxPlatform::HostPath("/var/tarvik/lifecycle/cm-plugin-input.json"); }
-std::string PluginResultPath() { return HoxPlatform::HostPath("/var/tarvik/lifecycle/cm-plugin-output.json"); }
+std::string PluginRequestPath() { return HoxPlatform::HostPath(HoxPlatform::HostPaths::kRequestFile); }
+std::string PluginResultPath() { return HoxPlatform::HostPath(HoxPlatform::HostPaths::kResultFile); }
 
 long CreatePluginSchemaFromFile(const std::string& path, Document& schema, std::string& error) {
   std::string text;
-  if (!ReadFile(path, text)) {
+  if (!ReadFile(path, HoxPlatform::FileKind::ManifestSchema, text)) {
+    // The text is fixed by the manifest check's contract: the path, no reason.
     error = "Failed to open the schema file " + Quoted(path);
     return 0;
   }
@@ -173,21 +174,16 @@ void ValidateAllPlugins(std::string_view pluginDirectory, std::string_view schem
   if (!directory.empty() && directory.back() != '/') directory += '/';
   const auto schemas = CreatePluginSchemas(directory, schemaError);
 
-  namespace fs = boost::filesystem;
-  boost::system::error_code ec;
-  std::vector<std::string> files;
-  for (fs::recursive_directory_iterator it(std::string(pluginDirectory), ec), end; !ec && it != end;
-       it.increment(ec)) {
-    if (it->path().extension() == ".json" && fs::is_regular_file(it->path(), ec)) {
-      files.push_back(it->path().string());
-    }
+  HoxPlatform::ListOptions options;
+  options.suffix = ".json";
+  const HoxPlatform::DirectoryListing listing = HoxPlatform::ListFiles(std::string(pluginDirectory), options);
+  for (const auto& problem : listing.problems) {
+    record(problem.path, "Failed to read the plugin directory: " + problem.reason);
   }
-  if (ec) record(std::string(pluginDirectory), "Failed to read the plugin directory: " + ec.message());
-  std::sort(files.begin(), files.end());  // a stable report
 
-  for (const std::string& file : files) {
+  for (const std::string& file : listing.files) {
     std::string text;
-    if (!ReadFile(file, text)) {
+    if (!ReadFile(file, HoxPlatform::FileKind::Manifest, text)) {
       record(file, "Failed to open the plugin file " + Quoted(file));
       continue;
     }

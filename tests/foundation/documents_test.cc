@@ -60,6 +60,7 @@ TEST(DocumentsTest, ParsersRefuseMalformedInputOfEveryKindWithoutCrashing) {
       "{\"\xc3\x28\": 1}",             // invalid UTF-8 in a member name
       "\"\xed\xa0\x80\"",              // encoded surrogate
       std::string("\"a\0b\"", 5),      // NUL inside a string
+      std::string("{} \0 {}", 7),       // NUL and more after the document
   };
   for (const std::string& text : cases) {
     Document doc;
@@ -83,6 +84,7 @@ TEST(DocumentsTest, ParsersRefuseMalformedInputOfEveryKindWithoutCrashing) {
     } catch (const ConfigManagerException& e) {
       EXPECT_EQ(dynamic_cast<const InvalidArgumentException*>(&e), nullptr) << path;
       EXPECT_EQ(e.GetErrorCode(), 2080) << path;
+      EXPECT_NE(std::string(e.what()).find(path + ": "), std::string::npos) << "names the file: " << e.what();
     }
   }
   // The depth limit itself and a 50 MB string are accepted.

@@ -10,6 +10,8 @@
 #include <gtest/gtest.h>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/files.h>
+#include <hoxcm/host.h>
 #include <hoxcm/plugins.h>
 
 #include "support/temp_root.h"
@@ -17,8 +19,8 @@
 
 namespace hoxcm_test {
 
-inline const std::string kModules = "/usr/lib/tarvik/configmanager/apply_modules/";
-inline const std::string kPluginSchemas = "/usr/lib/tarvik/configmanager/plugin_schemas/";
+inline const std::string kModules = std::string(HoxPlatform::HostPaths::kManifestDirectory) + "/";
+inline const std::string kPluginSchemas = std::string(HoxPlatform::HostPaths::kManifestSchemaDirectory) + "/";
 
 // A version-3 manifest.
 inline std::string V3Manifest(const std::string& type, const std::vector<std::string>& accepts,

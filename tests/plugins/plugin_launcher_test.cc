@@ -92,7 +92,7 @@ TEST_F(PluginRunTest, RunnerFailuresBecomeUnexpectedErrors) {
       {"exit 2", "Config Manager plugin failed: t, pid="},
       {"exit 2", ", status=No such file or directory"},
       {"kill -9 $$", "terminated with signal=9"},
-      {"exit 0", "cannot open"},  // no result file
+      {"exit 0", "cannot read"},  // no result file
       {R"(printf '{"id":' > "$out")", "Invalid JSON"},
       {R"(printf '' > "$out")", "Invalid JSON"},
       {R"(echo '{"id":5}' > "$out")", "Invalid JSON"},

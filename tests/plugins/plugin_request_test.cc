@@ -92,7 +92,7 @@ TEST(ResultReadersTest, RecordsRoundTripAndNothingMalformedIsAccepted) {
     root.WriteFile("/r.json", text);
     EXPECT_GT(ThrownBy(readers[reader]).code, 0) << reader << ": " << text;
   }
-  EXPECT_THROW(ErrorInfo::Load(root.Path("/missing.json")), std::runtime_error);
+  EXPECT_THROW(ErrorInfo::Load(root.Path("/missing.json")), HoxPlatform::FileError);
   // A failure report stands in for the verdicts.
   root.WriteFile("/r.json", R"({"error":{"id":"x","args":["a"],"message":"m"}})");
   EXPECT_EQ(ImpactPluginResult::Load(path).error, ErrorInfo("x", {"a"}, "m"));

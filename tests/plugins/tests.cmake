@@ -3,7 +3,8 @@ hoxcm_add_test(plugins_test
   plugins/plugin_manager_test.cc
   plugins/plugin_request_test.cc
   plugins/plugin_launcher_test.cc
-  plugins/runner_conformance_test.cc)
+  plugins/runner_conformance_test.cc
+  plugins/runner_paths_test.cc)
 # The runners, the sample plugins and the conformance plugin must be built
 # before the tests that start them.
 add_library(hoxcm_conformance_plugin MODULE plugins/conformance_plugin.cc)

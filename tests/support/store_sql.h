@@ -14,7 +14,7 @@
 
 namespace hoxcm_test {
 
-inline constexpr const char* kStoreHostPath = "/var/lib/tarvik/configstore/configstore.db";
+inline const std::string kStoreHostPath(HoxPlatform::HostPaths::kStore);
 
 // Runs the statements of `sql`, binding `args` as text to those that take
 // parameters; returns every row they yield as "column|column|...|". Throws

@@ -6,7 +6,10 @@
 #include <sstream>
 #include <stdexcept>
 
+#include <hoxcm/host.h>
+
 namespace fs = std::filesystem;
+namespace HostPaths = HoxPlatform::HostPaths;
 
 namespace hoxcm_test {
 
@@ -61,15 +64,15 @@ void TempRoot::CopyTree(const std::string& sourceRelative, const std::string& ho
 }
 
 void TempRoot::InstallSampleSchemas() const {
-  CopyTree("data/sample-host/schemas", "/usr/lib/tarvik/configmanager/schemas");
+  CopyTree("data/sample-host/schemas", std::string(HostPaths::kSchemaDirectory));
 }
 
 void TempRoot::InstallPluginSchemas() const {
-  CopyTree("data/plugin_schemas", "/usr/lib/tarvik/configmanager/plugin_schemas");
+  CopyTree("data/plugin_schemas", std::string(HostPaths::kManifestSchemaDirectory));
 }
 
 void TempRoot::InstallRunners() const {
-  const fs::path bin = Path("/usr/lib/tarvik/configmanager/bin");
+  const fs::path bin = Path(std::string(HostPaths::kRunnerDirectory));
   fs::create_directories(bin);
   // Symbolic links: a runner finds the root from the path it was started
   // under, not from its resolved location.
@@ -78,7 +81,7 @@ void TempRoot::InstallRunners() const {
 }
 
 void TempRoot::InstallSamplePlugins() const {
-  const std::string modules = "/usr/lib/tarvik/configmanager/apply_modules";
+  const std::string modules(HostPaths::kManifestDirectory);
   CopyTree("data/sample-plugins", modules);
   fs::copy_file(BuildPath("sample-plugins/network/libnetwork.so"), Path(modules + "/network/libnetwork.so"),
                 fs::copy_options::overwrite_existing);

@@ -22,7 +22,7 @@ namespace {
 // Reading commands must not create a store as a side effect: a mistyped
 // root is an error, not a new empty host.
 void RequireHostRoot() {
-  const std::string store = HoxPlatform::HostPath("/var/lib/tarvik/configstore/configstore.db");
+  const std::string store = HoxPlatform::HostPath(HoxPlatform::HostPaths::kStore);
   if (!HoxConfigManager::fileExists(store)) {
     throw CommandError{HoxConfigManager::ConfigStoreConnectFailed,
                        "Failed to connect to ConfigStore: no store at " + store + " (run hoxcfg init)"};

@@ -3,11 +3,11 @@
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
-#include <fstream>
 #include <iostream>
 #include <unistd.h>
 
 #include <hoxcm/errors.h>
+#include <hoxcm/files.h>
 
 namespace hoxcfg {
 
@@ -57,19 +57,10 @@ void WriteOutput(const std::string& text, const std::string& path) {
     std::cout << text << std::flush;
     return;
   }
-  const std::string tmp = path + ".tmp";
-  {
-    std::ofstream out(tmp, std::ios::binary | std::ios::trunc);
-    out << text;
-    out.flush();
-    if (!out) {
-      std::remove(tmp.c_str());
-      throw CommandError{kExitError, "cannot write " + path};
-    }
-  }
-  if (std::rename(tmp.c_str(), path.c_str()) != 0) {
-    std::remove(tmp.c_str());
-    throw CommandError{kExitError, "cannot write " + path};
+  try {
+    HoxPlatform::WriteFileAtomically(path, text, 0644, HoxPlatform::Durability::kDurable);
+  } catch (const HoxPlatform::FileError& e) {
+    throw CommandError{kExitError, e.what()};
   }
 }
 

@@ -1,18 +1,13 @@
 #include "hoxcfg/host_setup.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
-#include <cerrno>
-#include <cstdio>
-#include <cstring>
 #include <filesystem>
 #include <iostream>
+#include <string_view>
 #include <system_error>
 
 #include <hoxcm/config_store.h>
 #include <hoxcm/documents.h>
+#include <hoxcm/files.h>
 #include <hoxcm/host.h>
 #include <hoxcm/schema_store.h>
 
@@ -23,78 +18,77 @@ namespace fs = std::filesystem;
 namespace hoxcfg {
 namespace {
 
-constexpr const char* kSchemaDir = "/usr/lib/tarvik/configmanager/schemas";
-constexpr const char* kManifestDir = "/usr/lib/tarvik/configmanager/apply_modules";
-constexpr const char* kManifestSchemaDir = "/usr/lib/tarvik/configmanager/plugin_schemas";
-constexpr const char* kRunnerDir = "/usr/lib/tarvik/configmanager/bin";
+using HoxPlatform::FileKind;
+namespace HostPaths = HoxPlatform::HostPaths;
 
-std::string Under(const std::string& hostPath) { return HoxPlatform::HostPath(hostPath); }
+std::string Under(std::string_view hostPath) { return HoxPlatform::HostPath(hostPath); }
 
-bool IsDir(const std::string& path) {
-  std::error_code ec;
-  return !path.empty() && fs::is_directory(path, ec);
+bool IsDir(const std::string& path) { return !path.empty() && HoxPlatform::IsDirectory(path); }
+bool IsFile(const std::string& path) { return !path.empty() && HoxPlatform::IsRegularFile(path); }
+
+// Runs a step of the set-up; a file error ends the command with its text.
+template <typename F>
+auto Checked(F&& step) {
+  try {
+    return step();
+  } catch (const HoxPlatform::FileError& e) {
+    throw CommandError{kExitError, e.what()};
+  }
 }
 
-bool IsFile(const std::string& path) {
-  std::error_code ec;
-  return !path.empty() && fs::is_regular_file(path, ec);
+void MakeDirs(const std::string& path, mode_t mode = 0755) {
+  Checked([&] { HoxPlatform::CreateDirectories(path, mode); });
 }
 
-void MakeDirs(const std::string& path, fs::perms perms = fs::perms::none) {
-  std::error_code ec;
-  fs::create_directories(path, ec);
-  if (ec) throw CommandError{kExitError, "cannot create " + path + ": " + ec.message()};
-  if (perms != fs::perms::none) fs::permissions(path, perms, ec);
+// Installs a copy of `from` at `to` with `mode`. The new file replaces the
+// old one atomically: a reader (a plugin run, a schema load) sees the old
+// file or the whole new one, never a partial copy.
+void CopyFile(const std::string& from, const std::string& to, mode_t mode, FileKind kind) {
+  MakeDirs(fs::path(to).parent_path().string());
+  Checked([&] {
+    HoxPlatform::WriteFileAtomically(to, HoxPlatform::ReadFile(from, kind), mode,
+                                     HoxPlatform::Durability::kDurable);
+  });
 }
 
 // Copies the regular files below `from` to `to`, keeping the relative layout
 // and replacing files that exist. Returns the number of files copied.
-int CopyTree(const std::string& from, const std::string& to) {
-  int count = 0;
-  std::error_code ec;
-  for (auto it = fs::recursive_directory_iterator(from, ec); !ec && it != fs::recursive_directory_iterator();
-       it.increment(ec)) {
-    if (!it->is_regular_file(ec)) continue;
-    const fs::path target = fs::path(to) / fs::relative(it->path(), from);
-    MakeDirs(target.parent_path().string());
-    fs::copy_file(it->path(), target, fs::copy_options::overwrite_existing, ec);
-    if (ec) break;
-    ++count;
+int CopyTree(const std::string& from, const std::string& to, mode_t mode, FileKind kind) {
+  const HoxPlatform::DirectoryListing listing = HoxPlatform::ListFiles(from);
+  if (!listing.problems.empty()) {
+    const auto& problem = listing.problems.front();
+    throw CommandError{kExitError, "cannot copy " + problem.path + ": " + problem.reason};
   }
-  if (ec) throw CommandError{kExitError, "cannot copy " + from + " to " + to + ": " + ec.message()};
-  return count;
+  for (const std::string& file : listing.files) {
+    CopyFile(file, (fs::path(to) / fs::path(file).lexically_relative(from)).string(), mode, kind);
+  }
+  return static_cast<int>(listing.files.size());
 }
 
-void CopyFile(const std::string& from, const std::string& to, fs::perms perms) {
-  MakeDirs(fs::path(to).parent_path().string());
-  std::error_code ec;
-  fs::copy_file(from, to, fs::copy_options::overwrite_existing, ec);
-  if (!ec) fs::permissions(to, perms, ec);
-  if (ec) throw CommandError{kExitError, "cannot copy " + from + " to " + to + ": " + ec.message()};
-}
-
-constexpr fs::perms kExecutable = fs::perms::owner_all | fs::perms::group_read | fs::perms::group_exec |
-                                  fs::perms::others_read | fs::perms::others_exec;
-constexpr fs::perms kReadable = fs::perms::owner_read | fs::perms::owner_write | fs::perms::group_read |
-                                fs::perms::others_read;
-constexpr fs::perms kPrivate = fs::perms::owner_read | fs::perms::owner_write;
+constexpr mode_t kExecutable = 0755;
+constexpr mode_t kReadable = 0644;
+constexpr mode_t kPrivate = 0600;
 
 std::string InstallRunner(const std::string& from, const char* name) {
-  const std::string target = Under(std::string(kRunnerDir) + "/" + name);
+  const std::string target = Under(std::string(HostPaths::kRunnerDirectory) + "/" + name);
   if (!IsFile(from)) return std::string("skipped ") + name + ": not built (looked for " + from + ")";
-  CopyFile(from, target, kExecutable);
+  CopyFile(from, target, kExecutable, FileKind::Program);
   return std::string("installed ") + name;
 }
 
 std::string InstallSamplePlugins(const ProductFiles& files) {
   const std::string manifests = files.dataDir + "/sample-plugins";
   if (!IsDir(manifests)) return "skipped sample plugins: none shipped (looked in " + manifests + ")";
-  const int count = CopyTree(manifests, Under(kManifestDir));
+  // Manifests, script modules and plugin libraries: readable by everyone,
+  // as an installation leaves them.
+  const int count = CopyTree(manifests, Under(HostPaths::kManifestDirectory), kReadable, FileKind::Program);
   // Built C++ plugins sit in the build tree at the path they take below the
   // manifest directory, beside their manifests; an installation ships them
   // inside the manifest tree already.
   int libraries = 0;
-  if (IsDir(files.pluginLibDir)) libraries = CopyTree(files.pluginLibDir, Under(kManifestDir));
+  if (IsDir(files.pluginLibDir)) {
+    libraries = CopyTree(files.pluginLibDir, Under(HostPaths::kManifestDirectory), kExecutable, FileKind::Program);
+  }
   std::string line = "installed sample plugins: " + std::to_string(count) + " files";
   if (files.fromBuildTree) {
     line += libraries > 0 ? ", " + std::to_string(libraries) + " built plugin libraries"
@@ -111,13 +105,14 @@ void ImportDocument(HoxConfigStore::ConfigKind kind, const std::string& path) {
 
 std::vector<std::string> InstallSampleHost(const std::string& sampleDir) {
   std::vector<std::string> report;
-  CopyFile(sampleDir + "/host-facts.json", Under("/etc/tarvik/host-facts.json"), kReadable);
-  CopyFile(sampleDir + "/product_uuid", Under("/sys/class/dmi/id/product_uuid"), kReadable);
+  CopyFile(sampleDir + "/host-facts.json", Under(HostPaths::kHostFacts), kReadable, FileKind::HostFile);
+  CopyFile(sampleDir + "/product_uuid", Under(HostPaths::kProductUuid), kReadable, FileKind::HostFile);
   report.push_back("installed host facts and DMI uuid");
-  CopyFile(sampleDir + "/etc/ssh/sshd_config", Under("/etc/ssh/sshd_config"), kReadable);
-  CopyFile(sampleDir + "/etc/ssh/ssh_config", Under("/etc/ssh/ssh_config"), kReadable);
-  MakeDirs(Under("/root/.ssh"), fs::perms::owner_all);
-  CopyFile(sampleDir + "/root/.ssh/authorized_keys", Under("/root/.ssh/authorized_keys"), kPrivate);
+  CopyFile(sampleDir + "/etc/ssh/sshd_config", Under(HostPaths::kSshServerConfig), kReadable, FileKind::HostFile);
+  CopyFile(sampleDir + "/etc/ssh/ssh_config", Under(HostPaths::kSshClientConfig), kReadable, FileKind::HostFile);
+  MakeDirs(fs::path(Under(HostPaths::kSshAuthorizedKeys)).parent_path().string(), 0700);
+  CopyFile(sampleDir + "/root/.ssh/authorized_keys", Under(HostPaths::kSshAuthorizedKeys), kPrivate,
+           FileKind::HostFile);
   report.push_back("installed SSH files");
   ImportDocument(HoxConfigStore::ConfigKind::Default, sampleDir + "/default-config.json");
   ImportDocument(HoxConfigStore::ConfigKind::User, sampleDir + "/user-config.json");
@@ -160,21 +155,27 @@ std::vector<std::string> InitHostRoot(const ProductFiles& files, bool sample) {
   std::vector<std::string> report;
   report.push_back("host root " + HoxPlatform::HostRoot() + " (product files from " +
                    (files.fromBuildTree ? "the build tree" : "the installation") + ")");
-  for (const char* dir : {kSchemaDir, kManifestDir, kManifestSchemaDir, kRunnerDir, "/var/tarvik/lifecycle",
-                          "/var/lib/tarvik/configstore", "/etc/tarvik"}) {
+  for (std::string_view dir : {HostPaths::kSchemaDirectory, HostPaths::kManifestDirectory,
+                               HostPaths::kManifestSchemaDirectory, HostPaths::kRunnerDirectory,
+                               HostPaths::kLifecycleDirectory, HostPaths::kStoreDirectory}) {
     MakeDirs(Under(dir));
   }
+  MakeDirs(fs::path(Under(HostPaths::kHostFacts)).parent_path().string());
 
   const std::string schemas = files.dataDir + "/sample-host/schemas";
   if (IsDir(schemas)) {
-    report.push_back("installed schemas: " + std::to_string(CopyTree(schemas, Under(kSchemaDir))) + " files");
+    report.push_back("installed schemas: " +
+                     std::to_string(CopyTree(schemas, Under(HostPaths::kSchemaDirectory), kReadable, FileKind::Schema)) +
+                     " files");
   } else {
     report.push_back("skipped schemas: none shipped (looked in " + schemas + ")");
   }
   const std::string manifestSchemas = files.dataDir + "/plugin_schemas";
   if (IsDir(manifestSchemas)) {
     report.push_back("installed manifest schemas: " +
-                     std::to_string(CopyTree(manifestSchemas, Under(kManifestSchemaDir))) + " files");
+                     std::to_string(CopyTree(manifestSchemas, Under(HostPaths::kManifestSchemaDirectory), kReadable,
+                                             FileKind::ManifestSchema)) +
+                     " files");
   } else {
     report.push_back("skipped manifest schemas: none shipped (looked in " + manifestSchemas + ")");
   }
@@ -197,27 +198,8 @@ void WritePrivateOutput(const std::string& text, const std::string& path) {
     std::cout << text << std::flush;
     return;
   }
-  const std::string tmp = path + ".tmp";
-  // The temporary file is always a new one: a leftover file or a link planted
-  // there (in a directory others may write) is removed, not written through.
-  constexpr int kFlags = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
-  int fd = ::open(tmp.c_str(), kFlags, 0600);
-  if (fd < 0 && errno == EEXIST && ::unlink(tmp.c_str()) == 0) fd = ::open(tmp.c_str(), kFlags, 0600);
-  if (fd < 0) throw CommandError{kExitError, "cannot write " + path + ": " + std::strerror(errno)};
-  bool ok = ::fchmod(fd, 0600) == 0;
-  for (std::size_t done = 0; ok && done < text.size();) {
-    const ssize_t n = ::write(fd, text.data() + done, text.size() - done);
-    if (n < 0 && errno == EINTR) continue;
-    ok = n > 0;
-    if (ok) done += static_cast<std::size_t>(n);
-  }
-  ok = ::fsync(fd) == 0 && ok;
-  const int err = errno;
-  ok = ::close(fd) == 0 && ok;
-  if (!ok || std::rename(tmp.c_str(), path.c_str()) != 0) {
-    std::remove(tmp.c_str());
-    throw CommandError{kExitError, "cannot write " + path + ": " + std::strerror(ok ? errno : err)};
-  }
+  // The export carries sensitive values in clear: only the owner may read it.
+  Checked([&] { HoxPlatform::WriteFileAtomically(path, text, kPrivate, HoxPlatform::Durability::kDurable); });
 }
 
 }  // namespace hoxcfg

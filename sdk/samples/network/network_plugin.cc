@@ -8,10 +8,10 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
-#include <fstream>
 #include <string>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/files.h>
 #include <hoxcm/json.h>
 #include <hoxcm/plugin_sdk.h>
 
@@ -24,16 +24,10 @@ std::string HostFile(const std::string& root, const std::string& path) {
   return root == "/" ? path : root + path;
 }
 
-// Replaces a file atomically: write beside it, rename over it.
+// Replaces a host file atomically and durably (the host reads it at boot).
 void WriteHostFile(const std::string& path, const std::string& text) {
-  std::filesystem::create_directories(std::filesystem::path(path).parent_path());
-  const std::string temp = path + ".tmp";
-  {
-    std::ofstream out(temp, std::ios::binary | std::ios::trunc);
-    out << text;
-    if (!out.flush()) throw std::runtime_error("cannot write " + temp);
-  }
-  std::filesystem::rename(temp, path);
+  HoxPlatform::CreateDirectories(std::filesystem::path(path).parent_path().string());
+  HoxPlatform::WriteFileAtomically(path, text, 0644, HoxPlatform::Durability::kDurable);
 }
 
 const Value& Member(const Value& object, const char* name) {

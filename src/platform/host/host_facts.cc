@@ -14,23 +14,15 @@
 
 #include <hoxcm/config_store.h>
 #include <hoxcm/errors.h>
+#include <hoxcm/files.h>
 #include <hoxcm/json.h>
 
 #include "foundation/json_parse.h"
-#include "platform/file_descriptor.h"
 #include "platform/host/host_internal.h"
 
 namespace HoxPlatform::detail {
 namespace {
 
-constexpr const char* kFactsPath = "/etc/tarvik/host-facts.json";
-constexpr const char* kProductUuidPath = "/sys/class/dmi/id/product_uuid";
-constexpr const char* kMachineIdPath = "/etc/machine-id";
-constexpr const char* kVendorPath = "/sys/class/dmi/id/sys_vendor";
-constexpr const char* kProductPath = "/sys/class/dmi/id/product_name";
-// No host file read here is legitimately larger; a bigger one is refused
-// rather than loaded whole.
-constexpr std::size_t kMaxHostFileSize = 16u << 20;
 
 
 std::string Trim(std::string text) {
@@ -41,7 +33,7 @@ std::string Trim(std::string text) {
 }
 
 // The trimmed first line of a host file; empty when missing or unreadable.
-std::string ReadFact(const char* hostPath) {
+std::string ReadFact(std::string_view hostPath) {
   std::string text;
   try {
     if (!ReadHostFile(HostPath(hostPath), text)) return {};
@@ -90,7 +82,7 @@ FactsCache& TheFactsCache() {
 enum class LoadMode { kSilent, kDelta, kLazy };
 
 HostFacts LoadFacts(LoadMode mode) {
-  const std::string path = HostPath(kFactsPath);
+  const std::string path = HostPath(HostPaths::kHostFacts);
   FactsCache& cache = TheFactsCache();
   std::lock_guard<std::mutex> lock(cache.mutex);
   const FileSignature signature = Signature(path);
@@ -137,31 +129,9 @@ HostFacts LoadFacts(LoadMode mode) {
 }  // namespace
 
 bool ReadHostFile(const std::string& path, std::string& out) {
-  const auto fail = [&](int error) {
-    throw HostCtl::Lib::HostCtlException("cannot read " + path + ": " + std::strerror(error));
-  };
-  FileDescriptor fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (fd.get() < 0) {
-    if (errno == ENOENT || errno == ENOTDIR) return false;
-    fail(errno);
-  }
-  struct stat st {};
-  if (::fstat(fd.get(), &st) != 0) fail(errno);
-  if (S_ISDIR(st.st_mode)) fail(EISDIR);
-  std::string text;
-  char buffer[8192];
-  for (;;) {
-    const ssize_t n = ::read(fd.get(), buffer, sizeof buffer);
-    if (n < 0 && errno == EINTR) continue;  // a signal interrupted the read
-    if (n < 0) fail(errno);
-    if (n == 0) break;
-    text.append(buffer, static_cast<std::size_t>(n));
-    // Sizes come from reading: files under /sys report a size they do not have.
-    if (text.size() > kMaxHostFileSize) {
-      throw HostCtl::Lib::HostCtlException("cannot read " + path + ": larger than 16 MiB");
-    }
-  }
-  out = std::move(text);
+  std::optional<std::string> text = ReadFileIfExists(path, FileKind::HostFile);
+  if (!text) return false;
+  out = std::move(*text);
   return true;
 }
 
@@ -230,15 +200,15 @@ namespace Host {
 HardwareInfo GetHardwareInfo() {
   using HoxPlatform::detail::ReadFact;
   HardwareInfo info;
-  info.biosUuid = ReadFact(HoxPlatform::detail::kProductUuidPath);
-  if (info.biosUuid.empty()) info.biosUuid = ReadFact(HoxPlatform::detail::kMachineIdPath);
+  info.biosUuid = ReadFact(HoxPlatform::HostPaths::kProductUuid);
+  if (info.biosUuid.empty()) info.biosUuid = ReadFact(HoxPlatform::HostPaths::kMachineId);
   if (info.biosUuid.empty()) {
     throw Lib::HostCtlException("No hardware identity: neither " +
-                                HoxPlatform::HostPath(HoxPlatform::detail::kProductUuidPath) + " nor " +
-                                HoxPlatform::HostPath(HoxPlatform::detail::kMachineIdPath) + " is readable");
+                                HoxPlatform::HostPath(HoxPlatform::HostPaths::kProductUuid) + " nor " +
+                                HoxPlatform::HostPath(HoxPlatform::HostPaths::kMachineId) + " is readable");
   }
-  info.vendor = ReadFact(HoxPlatform::detail::kVendorPath);
-  info.product = ReadFact(HoxPlatform::detail::kProductPath);
+  info.vendor = ReadFact(HoxPlatform::HostPaths::kSystemVendor);
+  info.product = ReadFact(HoxPlatform::HostPaths::kProductName);
   return info;
 }
 

@@ -12,9 +12,6 @@
 namespace HoxPlatform::detail {
 namespace {
 
-constexpr const char* kAuthorizedKeysPath = "/root/.ssh/authorized_keys";
-constexpr const char* kClientConfigPath = "/etc/ssh/ssh_config";
-constexpr const char* kServerConfigPath = "/etc/ssh/sshd_config";
 constexpr const char* kComponent = "security";
 constexpr const char* kGroup = "ssh";
 
@@ -144,7 +141,7 @@ void SyncSingleton(const char* key, const std::vector<std::pair<std::string, std
 
 // An ssh_config or sshd_config file read into its singleton object; a
 // missing file leaves the object alone.
-void SyncOptionsFile(const char* hostPath, bool client, const char* key) {
+void SyncOptionsFile(std::string_view hostPath, bool client, const char* key) {
   const std::string path = HoxPlatform::HostPath(hostPath);
   std::string text;
   if (!ReadHostFile(path, text)) return;
@@ -214,7 +211,7 @@ namespace QmkCtl::System {
 using namespace HoxPlatform::detail;
 
 void SshAuthKeysConfig::UpgradeConfigToConfigStore() {
-  const std::string path = HoxPlatform::HostPath(kAuthorizedKeysPath);
+  const std::string path = HoxPlatform::HostPath(HoxPlatform::HostPaths::kSshAuthorizedKeys);
   std::string text;
   if (!ReadHostFile(path, text)) return;
   std::vector<int> skipped;
@@ -260,8 +257,8 @@ void SshAuthKeysConfig::UpgradeConfigToConfigStore() {
   HoxConfigStore::ApplyUserConfigChanges(changes);
 }
 
-void SshClientConfig::UpgradeConfigToConfigStore() { SyncOptionsFile(kClientConfigPath, true, "client"); }
+void SshClientConfig::UpgradeConfigToConfigStore() { SyncOptionsFile(HoxPlatform::HostPaths::kSshClientConfig, true, "client"); }
 
-void SshServerConfig::UpgradeConfigToConfigStore() { SyncOptionsFile(kServerConfigPath, false, "server"); }
+void SshServerConfig::UpgradeConfigToConfigStore() { SyncOptionsFile(HoxPlatform::HostPaths::kSshServerConfig, false, "server"); }
 
 }  // namespace QmkCtl::System

@@ -10,9 +10,7 @@
 
 #include <cstring>
 #include <filesystem>
-#include <fstream>
 #include <memory>
-#include <sstream>
 #include <stdexcept>
 #include <system_error>
 
@@ -114,44 +112,6 @@ HostRunLock::HostRunLock(const std::string& path) : fd_(-1) {
 HostRunLock::~HostRunLock() {
   // Closing the descriptor releases the lock.
   ::close(fd_);
-}
-
-void WriteFilePrivately(const std::string& path, const std::string& content, bool durable) {
-  const std::filesystem::path target(path);
-  std::error_code ec;
-  std::filesystem::create_directories(target.parent_path(), ec);
-  std::string temp = path + ".XXXXXX";
-  // mkostemp creates the file with mode 0600, so the content is never
-  // readable by others, not even for a moment.
-  FileDescriptor fd(::mkostemp(temp.data(), O_CLOEXEC));
-  if (fd.get() < 0) ThrowErrno(errno, "cannot create a temporary file beside " + path);
-  auto fail = [&](int error, const char* what) {
-    ::unlink(temp.c_str());
-    ThrowErrno(error, std::string(what) + " " + temp);
-  };
-  const char* data = content.data();
-  std::size_t left = content.size();
-  while (left > 0) {
-    const ssize_t n = ::write(fd.get(), data, left);
-    if (n < 0) {
-      if (errno == EINTR) continue;
-      fail(errno, "cannot write");
-    }
-    data += n;
-    left -= static_cast<std::size_t>(n);
-  }
-  if (durable && ::fsync(fd.get()) != 0) fail(errno, "cannot flush");
-  if (fd.Close() != 0) fail(errno, "cannot close");
-  if (::rename(temp.c_str(), path.c_str()) != 0) fail(errno, "cannot rename");
-}
-
-std::string ReadWholeFile(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
-  if (!in) throw std::runtime_error("cannot open " + path);
-  std::stringstream ss;
-  ss << in.rdbuf();
-  if (in.bad()) throw std::runtime_error("cannot read " + path);
-  return ss.str();
 }
 
 }  // namespace HoxPlatform

@@ -1,7 +1,6 @@
-// Process and file primitives of the plugin framework: spawning a runner with
-// a clean slate, waiting for it, signalling it, the host-wide run lock and
-// the atomic, private writing of request files. The one place where the
-// framework talks to the kernel about processes.
+// Process primitives of the plugin framework: spawning a runner with a clean
+// slate, waiting for it, signalling it, and the host-wide run lock. The one
+// place where the framework talks to the kernel about processes.
 //
 // Thread safety: every function is safe to call from any thread; a
 // HostRunLock object is owned by one thread.
@@ -51,19 +50,5 @@ class HostRunLock {
  private:
   int fd_;
 };
-
-// Replaces `path` by `content` so that a reader sees either the old or the
-// whole new file, and nobody but the owner can read it: the text goes to a
-// mode-0600 temporary file in the same directory and is renamed over
-// `path`. With `durable` the file is flushed to disk before the rename, so
-// that it also survives a crash; files that only live for one plugin run
-// do without (a flush costs milliseconds, the rename alone already keeps
-// readers from seeing half a file). Creates missing parent directories.
-// Throws std::system_error on failure (the temporary file is removed).
-void WriteFilePrivately(const std::string& path, const std::string& content, bool durable = true);
-
-// The whole content of a file; throws std::runtime_error naming the path
-// when it cannot be read.
-std::string ReadWholeFile(const std::string& path);
 
 }  // namespace HoxPlatform

@@ -6,8 +6,9 @@
 
 #include <hoxcm/plugins.h>
 
+#include <hoxcm/files.h>
+
 #include "foundation/json_parse.h"
-#include "platform/process/process.h"
 
 namespace HoxConfigManager {
 namespace {
@@ -76,12 +77,12 @@ void ErrorInfo::Deserialize(const std::string& text) { *this = ErrorFromValue(Pa
 
 ErrorInfo ErrorInfo::Load(const std::string& path) {
   ErrorInfo info;
-  info.Deserialize(HoxPlatform::ReadWholeFile(path));
+  info.Deserialize(HoxPlatform::ReadFile(path, HoxPlatform::FileKind::PluginExchange));
   return info;
 }
 
 ImpactPluginResult ImpactPluginResult::Load(const std::string& path) {
-  const Document doc = ParseText(HoxPlatform::ReadWholeFile(path));
+  const Document doc = ParseText(HoxPlatform::ReadFile(path, HoxPlatform::FileKind::PluginExchange));
   ImpactPluginResult result;
   result.error = OptionalError(doc);
   const Value* impacts = ArrayMember(doc, "impacts");
@@ -105,7 +106,7 @@ ImpactPluginResult ImpactPluginResult::Load(const std::string& path) {
 }
 
 ValidationPluginResult ValidationPluginResult::Load(const std::string& path) {
-  const Document doc = ParseText(HoxPlatform::ReadWholeFile(path));
+  const Document doc = ParseText(HoxPlatform::ReadFile(path, HoxPlatform::FileKind::PluginExchange));
   ValidationPluginResult result;
   result.error = OptionalError(doc);
   const Value* errors = ArrayMember(doc, "errors");

@@ -1,11 +1,11 @@
 #include "platform/schema/schema_file.h"
 
 #include <algorithm>
-#include <fstream>
 #include <initializer_list>
 #include <regex>
 #include <set>
 
+#include <hoxcm/files.h>
 #include <hoxcm/json.h>
 
 #include "foundation/json_parse.h"
@@ -16,7 +16,6 @@
 namespace HoxSchemaStore::detail {
 namespace {
 
-constexpr std::size_t kMaxSchemaFileSize = 4u << 20;
 constexpr const char* kGeneratedId = "cs_generated_id";
 
 // Thrown inside this file only, turned into the load error text.
@@ -29,25 +28,13 @@ struct SchemaFileError {
 // An oversized file (a log dropped into the tree by mistake) is refused
 // by its size, without being loaded.
 bool ReadFile(const std::string& path, std::string& content, std::string& error) {
-  std::ifstream in(path, std::ios::binary | std::ios::ate);
-  if (!in) {
-    error = "cannot be opened";
+  try {
+    content = HoxPlatform::ReadFile(path, HoxPlatform::FileKind::Schema);
+    return true;
+  } catch (const HoxPlatform::FileError& e) {
+    error = e.reason();
     return false;
   }
-  const std::streamoff size = in.tellg();
-  if (size > static_cast<std::streamoff>(kMaxSchemaFileSize)) {
-    error = "is larger than 4 MiB";
-    return false;
-  }
-  content.resize(size > 0 ? static_cast<std::size_t>(size) : 0);
-  in.seekg(0);
-  in.read(content.data(), static_cast<std::streamsize>(content.size()));
-  if (in.bad() || size < 0) {
-    error = "cannot be read";
-    return false;
-  }
-  content.resize(static_cast<std::size_t>(in.gcount()));
-  return true;
 }
 
 bool GetBool(const rapidjson::Value& root, const char* name) {

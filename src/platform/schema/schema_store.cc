@@ -5,6 +5,7 @@
 #include <unordered_map>
 
 #include <hoxcm/errors.h>
+#include <hoxcm/files.h>
 #include <hoxcm/host.h>
 #include <hoxcm/json.h>
 
@@ -39,7 +40,6 @@ SchemaCache::~SchemaCache() = default;
 namespace detail {
 namespace {
 
-constexpr const char* kSchemaDirectory = "/usr/lib/tarvik/configmanager/schemas";
 
 class StoreCache final : public SchemaCache {
  public:
@@ -77,11 +77,10 @@ bool ValidName(const std::string& name) { return !name.empty() && name.front() !
 
 }  // namespace
 
-std::string SchemaDirectory() { return HoxPlatform::HostPath(kSchemaDirectory); }
+std::string SchemaDirectory() { return HoxPlatform::HostPath(HoxPlatform::HostPaths::kSchemaDirectory); }
 
 std::shared_ptr<DirectorySchemaStore> LoadStore(const std::string& directory) {
-  std::error_code ec;
-  if (!fs::is_directory(directory, ec)) {
+  if (!HoxPlatform::IsDirectory(directory)) {
     CSLogger::Log(CSLogger::kError, "Schema directory %s cannot be read", directory.c_str());
     return nullptr;
   }
@@ -89,23 +88,19 @@ std::shared_ptr<DirectorySchemaStore> LoadStore(const std::string& directory) {
 }
 
 DirectorySchemaStore::DirectorySchemaStore(const std::string& directory) {
-  std::vector<fs::path> files;
-  std::error_code ec;
-  fs::recursive_directory_iterator it(directory, fs::directory_options::follow_directory_symlink, ec), end;
-  for (; !ec && it != end; it.increment(ec)) {
-    std::error_code fileEc;
-    if (it->is_directory(fileEc) && it.depth() >= 2) {
-      // Keys are files of a group directory; nothing deeper is a schema
-      // (and symbolic-link loops end here).
-      it.disable_recursion_pending();
-      loadErrors_.push_back(it->path().string() + ": not at <component>/<group>/<key>.json");
-    } else if (it->is_regular_file(fileEc) && it->path().extension() == ".json") {
-      files.push_back(it->path());
-    }
+  HoxPlatform::ListOptions options;
+  options.suffix = ".json";
+  options.followDirectoryLinks = true;
+  // Keys are files of a group directory (<component>/<group>/<key>.json):
+  // nothing deeper is a schema.
+  options.maxDepth = 3;
+  const HoxPlatform::DirectoryListing listing = HoxPlatform::ListFiles(directory, options);
+  for (const std::string& deeper : listing.notEntered) {
+    loadErrors_.push_back(deeper + ": not at <component>/<group>/<key>.json");
   }
-  if (ec) loadErrors_.push_back(directory + ": " + ec.message());
-  std::sort(files.begin(), files.end());
-  for (const fs::path& file : files) {
+  for (const auto& problem : listing.problems) loadErrors_.push_back(problem.path + ": " + problem.reason);
+  for (const std::string& name : listing.files) {
+    const fs::path file(name);
     const fs::path relative = file.lexically_relative(directory);
     std::vector<std::string> parts;
     for (const auto& part : relative) parts.push_back(part.string());

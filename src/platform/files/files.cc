@@ -1,0 +1,289 @@
+// The file module: every read, write and listing of a host file goes through
+// here, so that errno values are turned into FileError in one place and every
+// descriptor is owned by a FileDescriptor.
+#include <hoxcm/files.h>
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <set>
+#include <utility>
+
+#include "platform/file_descriptor.h"
+
+namespace HoxPlatform {
+namespace {
+
+// The one conversion of an errno value into text (thread-safe strerror).
+std::string ErrorText(int error) {
+  char buffer[256];
+  // GNU strerror_r returns the text, which may not be `buffer`.
+  return ::strerror_r(error, buffer, sizeof buffer);
+}
+
+[[noreturn]] void Fail(std::string_view action, const std::string& path, int error) {
+  throw FileError(action, path, error, ErrorText(error));
+}
+
+[[noreturn]] void Refuse(std::string_view action, const std::string& path, std::string reason) {
+  throw FileError(action, path, 0, std::move(reason));
+}
+
+// What a file is, for the error text.
+const char* KindOf(mode_t mode) {
+  if (S_ISREG(mode)) return "a regular file";
+  if (S_ISDIR(mode)) return "a directory";
+  if (S_ISFIFO(mode)) return "a FIFO";
+  if (S_ISCHR(mode)) return "a character device";
+  if (S_ISBLK(mode)) return "a block device";
+  if (S_ISSOCK(mode)) return "a socket";
+  return "of an unknown kind";
+}
+
+std::string SizeText(std::size_t bytes) {
+  if (bytes % (1u << 20) == 0) return std::to_string(bytes >> 20) + " MiB";
+  return std::to_string(bytes) + " bytes";
+}
+
+// Opens `path` for reading. Empty when it does not exist and `missingOk`.
+std::optional<FileDescriptor> OpenForReading(const std::string& path, bool missingOk) {
+  for (;;) {
+    // O_NONBLOCK: opening a FIFO must not wait for a writer; it is refused
+    // below. Reads of regular files ignore the flag.
+    const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
+    if (fd >= 0) return std::optional<FileDescriptor>(std::in_place, fd);
+    if (errno == EINTR) continue;  // a signal interrupted the open
+    if (missingOk && (errno == ENOENT || errno == ENOTDIR)) return std::nullopt;
+    if (errno == ELOOP) Refuse("read", path, "too many levels of symbolic links");
+    Fail("read", path, errno);
+  }
+}
+
+std::string ReadOpened(const FileDescriptor& fd, const std::string& path, FileKind kind) {
+  const std::size_t limit = MaxFileSize(kind);
+  struct stat st {};
+  if (::fstat(fd.get(), &st) != 0) Fail("read", path, errno);
+  if (!S_ISREG(st.st_mode)) Refuse("read", path, std::string("not a regular file (") + KindOf(st.st_mode) + ")");
+  const auto tooLarge = [&] { Refuse("read", path, "larger than " + SizeText(limit)); };
+  if (st.st_size > 0 && static_cast<std::size_t>(st.st_size) > limit) tooLarge();
+  std::string text;
+  // The size is a hint only: files under /sys report a size they do not
+  // have, and a file may grow while it is read.
+  text.reserve(st.st_size > 0 ? static_cast<std::size_t>(st.st_size) : 0);
+  char buffer[65536];
+  for (;;) {
+    const ssize_t n = ::read(fd.get(), buffer, sizeof buffer);
+    if (n < 0 && errno == EINTR) continue;  // a signal interrupted the read
+    if (n < 0) Fail("read", path, errno);
+    if (n == 0) break;
+    if (text.size() + static_cast<std::size_t>(n) > limit) tooLarge();
+    text.append(buffer, static_cast<std::size_t>(n));
+  }
+  return text;
+}
+
+void WriteAll(const FileDescriptor& fd, std::string_view content, const std::string& temp) {
+  while (!content.empty()) {
+    const ssize_t n = ::write(fd.get(), content.data(), content.size());
+    if (n < 0 && errno == EINTR) continue;  // a signal interrupted the write
+    if (n < 0) Fail("write", temp, errno);
+    content.remove_prefix(static_cast<std::size_t>(n));
+  }
+}
+
+std::string DirectoryOf(const std::string& path) {
+  const std::size_t slash = path.rfind('/');
+  if (slash == std::string::npos) return ".";
+  return slash == 0 ? "/" : path.substr(0, slash);
+}
+
+// Flushes a directory's entries, so that a rename in it survives a crash.
+void SyncDirectory(const std::string& directory, const std::string& path) {
+  FileDescriptor fd(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (fd.get() < 0) Fail("write", path, errno);
+  if (::fsync(fd.get()) != 0) Fail("write", path, errno);
+}
+
+// Removes the temporary file of a failed write.
+class TemporaryFile {
+ public:
+  explicit TemporaryFile(std::string path) : path_(std::move(path)) {}
+  ~TemporaryFile() {
+    if (!path_.empty()) ::unlink(path_.c_str());
+  }
+  TemporaryFile(const TemporaryFile&) = delete;
+  TemporaryFile& operator=(const TemporaryFile&) = delete;
+  const std::string& path() const { return path_; }
+  void Release() { path_.clear(); }
+
+ private:
+  std::string path_;
+};
+
+class Lister {
+ public:
+  Lister(const ListOptions& options, DirectoryListing& out) : options_(options), out_(out) {}
+
+  void List(const std::string& directory, int depth) {
+    struct stat st {};
+    if (::stat(directory.c_str(), &st) != 0) {
+      out_.problems.push_back({directory, ErrorText(errno)});
+      return;
+    }
+    // A directory reached again through a link is not walked twice.
+    if (!visited_.insert({st.st_dev, st.st_ino}).second) return;
+    std::unique_ptr<DIR, int (*)(DIR*)> dir(::opendir(directory.c_str()), &::closedir);
+    if (!dir) {
+      out_.problems.push_back({directory, ErrorText(errno)});
+      return;
+    }
+    std::vector<std::string> names;
+    for (;;) {
+      errno = 0;
+      const dirent* entry = ::readdir(dir.get());
+      if (entry == nullptr) {
+        if (errno != 0) out_.problems.push_back({directory, ErrorText(errno)});
+        break;
+      }
+      const std::string_view name = entry->d_name;
+      if (name != "." && name != "..") names.emplace_back(name);
+    }
+    std::sort(names.begin(), names.end());
+    const std::string prefix = !directory.empty() && directory.back() == '/' ? directory : directory + "/";
+    for (const std::string& name : names) Visit(prefix + name, name, depth + 1);
+  }
+
+ private:
+  void Visit(const std::string& path, const std::string& name, int depth) {
+    struct stat link {};
+    if (::lstat(path.c_str(), &link) != 0) {
+      out_.problems.push_back({path, ErrorText(errno)});
+      return;
+    }
+    struct stat st = link;
+    if (S_ISLNK(link.st_mode) && ::stat(path.c_str(), &st) != 0) {
+      out_.problems.push_back({path, ErrorText(errno)});
+      return;
+    }
+    if (S_ISDIR(st.st_mode)) {
+      if (S_ISLNK(link.st_mode) && !options_.followDirectoryLinks) return;
+      if (options_.maxDepth > 0 && depth >= options_.maxDepth) {
+        out_.notEntered.push_back(path);
+        return;
+      }
+      List(path, depth);
+      return;
+    }
+    if (!options_.suffix.empty() &&
+        (name.size() < options_.suffix.size() ||
+         name.compare(name.size() - options_.suffix.size(), options_.suffix.size(), options_.suffix) != 0)) {
+      return;
+    }
+    if (S_ISREG(st.st_mode)) {
+      out_.files.push_back(path);
+    } else {
+      out_.problems.push_back({path, std::string("not a regular file (") + KindOf(st.st_mode) + ")"});
+    }
+  }
+
+  const ListOptions& options_;
+  DirectoryListing& out_;
+  std::set<std::pair<dev_t, ino_t>> visited_;
+};
+
+}  // namespace
+
+FileError::FileError(std::string_view action, std::string path, int error, std::string reason)
+    : HostCtlException("cannot " + std::string(action) + " " + path + ": " + reason),
+      path_(std::move(path)),
+      error_(error),
+      reason_(std::move(reason)) {}
+
+std::size_t MaxFileSize(FileKind kind) {
+  switch (kind) {
+    case FileKind::Document: return kMaxDocumentFileSize;
+    case FileKind::Manifest: return kMaxManifestFileSize;
+    case FileKind::ManifestSchema: return kMaxManifestSchemaFileSize;
+    case FileKind::Schema: return kMaxSchemaFileSize;
+    case FileKind::PluginExchange: return kMaxPluginExchangeFileSize;
+    case FileKind::HostFile: return kMaxHostFileSize;
+    case FileKind::Program: return kMaxProgramFileSize;
+  }
+  return 0;
+}
+
+std::string ReadFile(const std::string& path, FileKind kind) {
+  return ReadOpened(*OpenForReading(path, false), path, kind);
+}
+
+std::optional<std::string> ReadFileIfExists(const std::string& path, FileKind kind) {
+  std::optional<FileDescriptor> fd = OpenForReading(path, true);
+  if (!fd) return std::nullopt;
+  return ReadOpened(*fd, path, kind);
+}
+
+bool IsRegularFile(const std::string& path, std::optional<FileError>* problem) {
+  struct stat st {};
+  if (::stat(path.c_str(), &st) != 0) {
+    const int error = errno;
+    if (problem != nullptr) problem->emplace("stat", path, error, ErrorText(error));
+    return false;
+  }
+  return S_ISREG(st.st_mode);
+}
+
+bool IsDirectory(const std::string& path) {
+  struct stat st {};
+  return ::stat(path.c_str(), &st) == 0 && S_ISDIR(st.st_mode);
+}
+
+void WriteFileAtomically(const std::string& path, std::string_view content, mode_t mode, Durability durability) {
+  std::string pattern = path + ".XXXXXX";
+  // mkostemp creates a new file (O_EXCL) with mode 0600: nothing planted at
+  // the name is written through, and the content is never readable by
+  // others before the mode is set.
+  FileDescriptor fd(::mkostemp(pattern.data(), O_CLOEXEC));
+  if (fd.get() < 0) Fail("write", path, errno);
+  TemporaryFile temp(std::move(pattern));
+  WriteAll(fd, content, temp.path());
+  if (::fchmod(fd.get(), mode) != 0) Fail("write", temp.path(), errno);
+  if (durability == Durability::kDurable && ::fsync(fd.get()) != 0) Fail("write", temp.path(), errno);
+  // A failing close may be the first sign of a lost write.
+  if (fd.Close() != 0) Fail("write", temp.path(), errno);
+  if (::rename(temp.path().c_str(), path.c_str()) != 0) Fail("write", path, errno);
+  temp.Release();
+  if (durability == Durability::kDurable) SyncDirectory(DirectoryOf(path), path);
+}
+
+void CreateDirectories(const std::string& directory, mode_t mode) {
+  if (directory.empty()) return;
+  struct stat st {};
+  if (::stat(directory.c_str(), &st) == 0) {
+    if (!S_ISDIR(st.st_mode)) Refuse("create", directory, std::string("not a directory (") + KindOf(st.st_mode) + ")");
+    return;
+  }
+  const std::string parent = DirectoryOf(directory);
+  if (parent != directory) CreateDirectories(parent, mode);
+  if (::mkdir(directory.c_str(), mode) != 0) {
+    if (errno == EEXIST) return;  // made meanwhile by another process
+    Fail("create", directory, errno);
+  }
+  // mkdir applies the umask; the caller asked for exactly `mode`.
+  if (::chmod(directory.c_str(), mode) != 0) Fail("create", directory, errno);
+}
+
+DirectoryListing ListFiles(const std::string& directory, const ListOptions& options) {
+  DirectoryListing listing;
+  Lister(options, listing).List(directory, 0);
+  std::sort(listing.files.begin(), listing.files.end());
+  std::sort(listing.notEntered.begin(), listing.notEntered.end());
+  return listing;
+}
+
+}  // namespace HoxPlatform

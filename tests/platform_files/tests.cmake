@@ -1,0 +1,1 @@
+hoxcm_add_test(platform_files_test platform_files/files_test.cc)
