@@ -24,6 +24,9 @@ class SchemaObject;
 }
 
 namespace HoxConfigStore {
+namespace detail {
+class Transaction;
+}
 
 // Identity of one configuration object; `instanceId` is empty for a
 // singleton.
@@ -208,8 +211,7 @@ class HOXCM_API ConfigStoreTransaction {
   void Commit();
 
  private:
-  std::shared_ptr<DBStore> db_;
-  bool open_;
+  std::unique_ptr<detail::Transaction> transaction_;
 };
 
 // Stages one desired object (an instance or a singleton value) of a key.

@@ -13,12 +13,14 @@
 #include <system_error>
 
 #include <hoxcm/errors.h>
+#include <hoxcm/files.h>
 #include <hoxcm/host.h>
+
+#include "platform/file_descriptor.h"
 
 namespace HoxConfigStore::detail {
 namespace {
 
-constexpr const char* kStorePath = "/var/lib/tarvik/configstore/configstore.db";
 constexpr int kConnectFailed = 2001;
 
 // Layout changes, one per version: kMigrations[n] takes a store from version
@@ -202,17 +204,15 @@ std::shared_ptr<Database> Database::Open(const std::string& path, bool create) {
   if (!exists) {
     // The store holds sensitive values in clear: only its owner may read it.
     // SQLite gives its journal files the mode of the database file.
-    const std::filesystem::path directory = std::filesystem::path(path).parent_path();
-    std::error_code ec;
-    std::filesystem::create_directories(directory, ec);
-    if (ec) Refuse(path, "cannot create its directory: " + ec.message());
-    ::chmod(directory.c_str(), 0700);
-    const int fd = ::open(path.c_str(), O_CREAT | O_EXCL | O_WRONLY | O_CLOEXEC, 0600);
-    if (fd >= 0) {
-      ::close(fd);
-    } else if (errno != EEXIST) {
-      Refuse(path, std::string("cannot create the store: ") + std::strerror(errno));
+    const std::string directory = std::filesystem::path(path).parent_path().string();
+    try {
+      HoxPlatform::CreateDirectories(directory);
+    } catch (const HoxPlatform::FileError& e) {
+      Refuse(path, std::string("cannot create its directory: ") + e.what());
     }
+    ::chmod(directory.c_str(), 0700);
+    const HoxPlatform::FileDescriptor fd(::open(path.c_str(), O_CREAT | O_EXCL | O_WRONLY | O_CLOEXEC, 0600));
+    if (fd.get() < 0 && errno != EEXIST) Refuse(path, std::string("cannot create the store: ") + std::strerror(errno));
   }
   sqlite3* raw = nullptr;
   const int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | (exists ? 0 : SQLITE_OPEN_CREATE);
@@ -280,9 +280,10 @@ void Database::CheckAndMigrate(bool created) {
   if (version == kSchemaVersion) return;
 
   // Another process may create or migrate the store at the same moment: the
-  // version is read again under the write lock.
-  Exec("BEGIN IMMEDIATE", "migrate");
-  try {
+  // version is read again under the write lock. A failed step rolls the
+  // whole migration back.
+  {
+    WriteScope migration(*this, "migrate");
     int64_t current = 0;
     Statement again(db, "SELECT count(*) FROM sqlite_master WHERE type = 'table' AND name = 'schema_version'");
     again.Step();
@@ -292,10 +293,7 @@ void Database::CheckAndMigrate(bool created) {
       Statement set(db, "UPDATE schema_version SET version = ?");
       set.Bind(1, v + 1).Run();
     }
-    Exec("COMMIT", "migrate");
-  } catch (...) {
-    sqlite3_exec(db, "ROLLBACK", nullptr, nullptr, nullptr);
-    throw;
+    migration.Commit();
   }
   if (created || version < kSchemaVersion) {
     CSLogger::Log(CSLogger::kDetail, "ConfigStore %s at layout version %d", path_.c_str(), kSchemaVersion);
@@ -337,42 +335,31 @@ void Database::WriteScope::Commit() {
   done_ = true;
 }
 
-void Database::BeginTransaction() {
-  mutex_.lock();
-  if (transactionOpen_ || sqlite3_get_autocommit(handle_.get()) == 0) {
-    mutex_.unlock();
+Transaction::Transaction(std::shared_ptr<Database> db)
+    : db_(std::move(db)), lock_(db_->mutex_), owner_(std::this_thread::get_id()) {
+  // The lock is recursive: this thread may already hold it, in an open
+  // transaction of its own.
+  if (sqlite3_get_autocommit(db_->handle_.get()) == 0) {
     throw ConfigStoreException(2000, "ConfigStore error: transactions do not nest");
   }
-  try {
-    Exec("BEGIN IMMEDIATE", "begin transaction");
-  } catch (...) {
-    mutex_.unlock();
-    throw;
-  }
-  transactionOpen_ = true;
-  transactionOwner_ = std::this_thread::get_id();
+  db_->Exec("BEGIN IMMEDIATE", "begin transaction");
+  open_ = true;
 }
 
-void Database::CommitTransaction() {
-  std::lock_guard<std::recursive_mutex> lock(mutex_);
-  if (!transactionOpen_ || transactionOwner_ != std::this_thread::get_id()) {
+Transaction::~Transaction() {
+  if (open_) sqlite3_exec(db_->handle_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
+}
+
+void Transaction::Commit() {
+  if (!open_ || owner_ != std::this_thread::get_id()) {
     throw ConfigStoreException(2000, "ConfigStore error: no open transaction on this thread");
   }
-  Exec("COMMIT", "commit");
-  transactionOpen_ = false;
-  mutex_.unlock();  // the lock taken by BeginTransaction
-}
-
-void Database::RollbackTransaction() noexcept {
-  std::lock_guard<std::recursive_mutex> lock(mutex_);
-  if (!transactionOpen_ || transactionOwner_ != std::this_thread::get_id()) return;
-  sqlite3_exec(handle_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
-  transactionOpen_ = false;
-  mutex_.unlock();  // the lock taken by BeginTransaction
+  db_->Exec("COMMIT", "commit");
+  open_ = false;
 }
 
 std::shared_ptr<Database> CurrentDatabase(bool create) {
-  const std::string path = HoxPlatform::HostPath(kStorePath);
+  const std::string path = HoxPlatform::HostPath(HoxPlatform::HostPaths::kStore);
   Registry& registry = TheRegistry();
   std::lock_guard<std::mutex> lock(registry.mutex);
   // Drop connections inherited through fork and connections whose file is

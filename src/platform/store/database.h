@@ -4,9 +4,9 @@
 // process-wide registry of connections (one per root).
 //
 // Thread safety: a Database serialises its use with a recursive mutex. Every
-// operation takes it through Read() or Write(); a ConfigStoreTransaction holds
-// it from BeginTransaction() to its end, so that other threads wait while the
-// transaction is open and writers on the owning thread join it.
+// operation takes it through Read() or Write(); a Transaction (the engine of
+// ConfigStoreTransaction) holds it for its whole life, so that other threads
+// wait while the transaction is open and writers on the owning thread join it.
 #pragma once
 
 #include <sqlite3.h>
@@ -69,6 +69,28 @@ class Statement {
   std::unique_ptr<sqlite3_stmt, StatementFinalizer> stmt_;
 };
 
+class Database;
+
+// The explicit transaction of ConfigStoreTransaction: it holds the
+// connection's lock from construction to destruction, so other threads wait
+// while it is open, and it rolls back unless committed. Transactions do not
+// nest. It must end on the thread that began it.
+class Transaction {
+ public:
+  explicit Transaction(std::shared_ptr<Database> db);
+  ~Transaction();
+  Transaction(const Transaction&) = delete;
+  Transaction& operator=(const Transaction&) = delete;
+  // Throws when called from another thread.
+  void Commit();
+
+ private:
+  const std::shared_ptr<Database> db_;
+  std::unique_lock<std::recursive_mutex> lock_;
+  const std::thread::id owner_;
+  bool open_ = false;
+};
+
 class Database final : public DBStore {
  public:
   // Opens (and with `create`, creates) the store at `path`. Refuses, leaving
@@ -101,12 +123,6 @@ class Database final : public DBStore {
   Statement Prepare(std::string_view sql) { return Statement(handle_.get(), sql); }
   void Exec(std::string_view sql, std::string_view what);
 
-  // The explicit transaction of ConfigStoreTransaction. Begin locks the
-  // connection for the calling thread until Commit or Rollback.
-  void BeginTransaction();
-  void CommitTransaction();
-  void RollbackTransaction() noexcept;
-
   // Opened by this process (a forked child must open its own connection).
   pid_t OwnerPid() const { return pid_; }
   dev_t Device() const { return device_; }
@@ -117,6 +133,8 @@ class Database final : public DBStore {
 
  private:
   // A write transaction or savepoint that rolls back unless committed.
+  // Also the migration's transaction, which runs before the connection is
+  // shared.
   class WriteScope {
    public:
     WriteScope(Database& db, std::string_view what);
@@ -130,6 +148,8 @@ class Database final : public DBStore {
     bool done_ = false;
   };
 
+  friend class Transaction;
+
   Database(std::string path, SqliteHandle handle);
   void CheckAndMigrate(bool created);
   // The version row of the layout; refuses the store when it is damaged.
@@ -141,9 +161,7 @@ class Database final : public DBStore {
   const pid_t pid_;
   dev_t device_ = 0;
   ino_t inode_ = 0;
-  std::recursive_mutex mutex_;  // guards handle_ and transactionOwner_
-  std::thread::id transactionOwner_;
-  bool transactionOpen_ = false;
+  std::recursive_mutex mutex_;  // guards handle_
 };
 
 // The connection of the current root (HOX_ROOT), shared per process and

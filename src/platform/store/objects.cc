@@ -253,21 +253,20 @@ std::shared_ptr<ConfigStore> ConfigStore::GetStore(const std::string& ns) {
 
 // --- Transactions ---
 
-ConfigStoreTransaction::ConfigStoreTransaction(const std::shared_ptr<ConfigStore>& store)
-    : db_(store ? store->GetDB() : nullptr), open_(false) {
-  if (!db_) throw ConfigStoreException(2001, "Failed to connect to ConfigStore");
-  detail::AsDatabase(db_).BeginTransaction();
-  open_ = true;
+ConfigStoreTransaction::ConfigStoreTransaction(const std::shared_ptr<ConfigStore>& store) {
+  const std::shared_ptr<DBStore> db = store ? store->GetDB() : nullptr;
+  if (!db) throw ConfigStoreException(2001, "Failed to connect to ConfigStore");
+  auto database = std::dynamic_pointer_cast<detail::Database>(db);
+  if (!database) throw ConfigStoreException(2001, "Failed to connect to ConfigStore");
+  transaction_ = std::make_unique<detail::Transaction>(std::move(database));
 }
 
-ConfigStoreTransaction::~ConfigStoreTransaction() {
-  if (open_) detail::AsDatabase(db_).RollbackTransaction();
-}
+ConfigStoreTransaction::~ConfigStoreTransaction() = default;
 
 void ConfigStoreTransaction::Commit() {
-  if (!open_) throw ConfigStoreException(2000, "ConfigStore error: the transaction is no longer open");
-  detail::AsDatabase(db_).CommitTransaction();
-  open_ = false;
+  if (!transaction_) throw ConfigStoreException(2000, "ConfigStore error: the transaction is no longer open");
+  transaction_->Commit();
+  transaction_.reset();
 }
 
 }  // namespace HoxConfigStore
