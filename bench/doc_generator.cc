@@ -10,6 +10,7 @@
 
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
+#include <hoxcm/host_documents.h>
 
 namespace hoxcm_bench {
 

@@ -21,7 +21,7 @@
 #include <hoxcm/config_store.h>
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
-#include <hoxcm/operations.h>
+#include <hoxcm/extraction.h>
 #include <hoxcm/schema_store.h>
 
 namespace fs = std::filesystem;

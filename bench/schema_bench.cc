@@ -11,6 +11,7 @@
 #include <benchmark/benchmark.h>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
 #include "platform/schema/schema_store_impl.h"

@@ -16,6 +16,7 @@
 #include <string>
 #include <vector>
 
+#include <hoxcm/config_document.h>
 #include <hoxcm/export.h>
 #include <hoxcm/json.h>
 
@@ -47,9 +48,16 @@ struct HOXCM_API ConfigStoreObjectId {
   bool operator!=(const ConfigStoreObjectId& o) const { return !(*this == o); }
 };
 
-// One row of configuration contents: "Component", "ConfigGroup", "Name",
-// "Identifier", "Value", "AutoConfValue".
+// One row of configuration contents, by the column names below.
 using ConfigMap = std::map<std::string, std::string>;
+namespace RowColumn {
+inline constexpr char kComponent[] = "Component";
+inline constexpr char kGroup[] = "ConfigGroup";
+inline constexpr char kKey[] = "Name";
+inline constexpr char kIdentifier[] = "Identifier";  // empty for a singleton
+inline constexpr char kValue[] = "Value";            // the item's JSON text
+inline constexpr char kAutoConfValue[] = "AutoConfValue";  // only when set
+}  // namespace RowColumn
 using ConfigMapList = std::vector<std::shared_ptr<ConfigMap>>;
 
 enum BOOTMODE : int {
@@ -233,63 +241,5 @@ HOXCM_API rapidjson::Document GetDefaultUserConfigInstancesInternal(const std::s
                                                                     const std::string& component,
                                                                     const std::string& group,
                                                                     const std::string& key);
-
-// Clean-up actions applied to extracted values (docs/platform.md).
-enum CLEANUP_ACTIONS : int {
-  CLEANUP_REMOVE_GENERATED_ID = 1,   // drop "cs_generated_id"
-  CLEANUP_REMOVE_NULLS = 2,          // drop members whose value is null
-  CLEANUP_REMOVE_EMPTY_OBJECTS = 3,  // drop members that are empty objects
-  CLEANUP_REMOVE_DEFAULTS = 4,       // drop members equal to their schema default
-  CLEANUP_REMOVE_UNKNOWN = 5,        // drop members the schema does not describe
-};
-
-// Document building, comparison, redaction and serialisation of
-// configuration values. Stateless; every function is thread-safe.
-class HOXCM_API ConfigStoreDocument {
- public:
-  // Lower-case, hyphenated 8-4-4-4-12 form of a host UUID.
-  static std::string NormalizeHostId(const std::string& hostId);
-  // `source` with the host-specific sections reduced to the host `hostId`
-  // (format: docs/platform.md).
-  static void GetDocumentForHost(const rapidjson::Value& source, rapidjson::Document& result,
-                                 const std::string& hostId);
-  static bool ValueExists(const rapidjson::Value& object, const char* member);
-  // Schema-aware equality of a desired and a host value (docs/drift.md).
-  static bool IsEqualValue(const rapidjson::Value& desired, const rapidjson::Value& host,
-                           const rapidjson::Value& schema);
-  // A hash that agrees with IsEqualValue under the same schema.
-  static std::size_t HashValue(const rapidjson::Value& value, const rapidjson::Value& schema);
-  // Order-insensitive equality of two arrays of primitive values.
-  static bool IsEqualPrimitiveArray(const rapidjson::Value& a, const rapidjson::Value& b);
-  // Compact JSON of `value` with every property that `schema` marks
-  // "sensitive" replaced by "******", at any depth.
-  static std::string RedactAndSerializeValue(const rapidjson::Value& schema, const rapidjson::Value& value);
-  // Adds an item: a singleton (empty identifier) as doc[C][G][K], an instance
-  // appended to the array doc[C][G][K]. Under "profile" when it exists.
-  static void AddObject(rapidjson::Document& doc, const std::string& component, const std::string& group,
-                        const std::string& key, const std::string& identifier, rapidjson::Value& value,
-                        rapidjson::MemoryPoolAllocator<>& allocator);
-  // Adds an empty "profile" object to the document (an object).
-  static void AddProfile(rapidjson::Document& doc);
-  static void CleanupObject(rapidjson::Value& value, const rapidjson::Value& schema,
-                            const std::vector<CLEANUP_ACTIONS>& actions,
-                            rapidjson::MemoryPoolAllocator<>& allocator);
-  // Sorts object members by name, recursively, so that equal documents
-  // serialise identically.
-  static void NormalizeValue(rapidjson::Value& value, rapidjson::MemoryPoolAllocator<>& allocator);
-  // Splits a profile document into host-independent and host-specific
-  // sections by the schema document (docs/platform.md); result into `out`.
-  static void SplitDocument(const rapidjson::Value& profile, const rapidjson::Value& schemaDocument,
-                            const std::string& hostId, rapidjson::Document& out);
-  static void PatchRequiredProperty(rapidjson::Value& value, const std::string& field,
-                                    const rapidjson::Value& autoConf,
-                                    rapidjson::MemoryPoolAllocator<>& allocator);
-  static void PatchUnionTagProperty(rapidjson::Value& value, const std::string& field,
-                                    const rapidjson::Value& autoConf,
-                                    rapidjson::MemoryPoolAllocator<>& allocator);
-  // Parses JSON text; throws InvalidArgumentException 2080 when malformed.
-  static rapidjson::Document CreateDocument(const std::string& text);
-  static void SerializeValue(const rapidjson::Value& value, std::string& out);
-};
 
 }  // namespace HoxConfigStore

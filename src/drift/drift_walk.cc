@@ -8,11 +8,11 @@
 #include <vector>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/extraction.h>
 #include <hoxcm/host.h>
-#include <hoxcm/operations.h>
 
 #include "drift/host_matcher.h"
-#include "platform/compare/value_compare.h"
+#include "foundation/compare/value_compare.h"
 
 namespace HoxConfigManager {
 
@@ -30,8 +30,6 @@ using HoxConfigStore::detail::SameScalar;
 using HoxSchemaStore::SchemaObject;
 using rapidjson::SizeType;
 
-// A singleton whose configuration was deleted holds this marker on the host.
-constexpr std::string_view kDeletedDefault = "DELETE_DEFAULT";
 
 const Value& NullValue() {
   static const Value null;
@@ -110,7 +108,8 @@ class DriftWalk {
 
   void CompareSingle(const Value& desired, const Value& host, ConfigStoreObjectId& id,
                      const std::shared_ptr<SchemaObject>& schema) {
-    const bool deletedDefault = host.IsString() && NameOf(host) == kDeletedDefault;
+    // A singleton whose configuration was deleted holds this marker on the host.
+    const bool deletedDefault = host.IsString() && NameOf(host) == DocumentShape::kDeleteDefault;
     RAPIDJSON_ASSERT(desired.IsNull() || desired.IsObject());
     RAPIDJSON_ASSERT(host.IsNull() || host.IsObject() || deletedDefault);
     const Value& node = schema->GetInstanceSchema();
@@ -232,7 +231,7 @@ class DriftWalk {
     const Value& d = desiredIn.IsNull() ? emptyArray : desiredIn;
     const Value& h = hostIn.IsNull() ? emptyArray : hostIn;
     const std::string& identity = schema->GetIdentityMember();
-    const bool generated = identity.empty() || identity == HoxConfigStore::detail::kGeneratedIdMember;
+    const bool generated = identity.empty() || identity == DocumentShape::kGeneratedId;
     // Every instance is checked, and its identity found, before anything is
     // reported, so a malformed item reports nothing.
     std::vector<const Value*> desiredIds, hostIds;
@@ -312,7 +311,7 @@ class DriftWalk {
   }
 
   static std::string GeneratedIdOf(const Value& instance) {
-    auto member = instance.FindMember(HoxConfigStore::detail::kGeneratedIdMember);
+    auto member = instance.FindMember(Value(DocumentShape::Ref(DocumentShape::kGeneratedId)));
     if (member != instance.MemberEnd() && member->value.IsString()) {
       return std::string(member->value.GetString(), member->value.GetStringLength());
     }
@@ -361,45 +360,53 @@ void computeComponents(const Value& source, const Value& other, Allocator& alloc
                        std::shared_ptr<HoxConfigStore::DBStore>& connection, bool reverse) {
   RAPIDJSON_ASSERT(source.IsObject());
   RAPIDJSON_ASSERT(other.IsNull() || other.IsObject());
-  DriftWalk walk(allocator, handler);
-  const OtherLevel components(&other);
-  for (auto c = source.MemberBegin(); c != source.MemberEnd(); ++c) {
-    RAPIDJSON_ASSERT(c->value.IsObject());
-    const OtherLevel groups(components.Find(c->name));
-    for (auto g = c->value.MemberBegin(); g != c->value.MemberEnd(); ++g) {
-      RAPIDJSON_ASSERT(g->value.IsObject());
-      const Value* otherGroup = groups.Find(g->name);
-      const OtherLevel keys(otherGroup);
-      for (auto k = g->value.MemberBegin(); k != g->value.MemberEnd(); ++k) {
-        const Value* otherItem = keys.Find(k->name);
-        // The forward pass has compared this item, and found its schema.
-        if (reverse && otherItem != nullptr) continue;
-        ConfigStoreObjectId id(std::string(NameOf(c->name)), std::string(NameOf(g->name)),
-                               std::string(NameOf(k->name)));
-        std::string path;
-        path.reserve(3 + id.component.size() + id.group.size() + id.key.size());
-        path.append("/").append(id.component).append("/").append(id.group).append("/").append(id.key);
-        auto schema = HoxSchemaStore::GetSchema(id.component, id.group, id.key, store);
-        if (!schema) {
-          CSLogger::Log(CSLogger::kError, "Schema not found for %s:%s:%s", id.component.c_str(), id.group.c_str(),
-                        id.key.c_str());
-          ThrowException<SchemaNotFound>(SchemaObjectNotFound, path);
-        }
-        if (!reverse) {
-          walk.CompareItem(k->value, otherItem != nullptr ? *otherItem : NullValue(), id, schema, path);
-        } else {
-          // The host holds an item the desired document lacks: it drifts only
-          // when it differs from the key's default user configuration.
-          Document defaults;
-          if (schema->HasDefaultUserConfig()) {
-            if (!connection) connection = HoxConfigStore::GetDBStore(0, false);
-            GetExternalDefaultUserConfig(id, connection, schema, defaults);
-          }
-          walk.CompareItem(defaults, k->value, id, schema, path);
-        }
+  // Walks `source` and looks each level up in `other` as it goes.
+  class Pass : public DocumentShape::LevelVisitor {
+   public:
+    Pass(const Value& other, Allocator& allocator, const std::shared_ptr<HoxSchemaStore::SchemaStore>& store,
+         DriftHandler& handler, std::shared_ptr<HoxConfigStore::DBStore>& connection, bool reverse)
+        : components_(&other), store_(store), connection_(connection), reverse_(reverse), walk_(allocator, handler) {}
+
+    void EnterComponent(const Value& name, const Value&) { groups_.emplace(components_.Find(name)); }
+    void EnterGroup(const Value&, const Value& name, const Value&) { keys_.emplace(groups_->Find(name)); }
+
+    void Item(const DocumentShape::Item<const Value>& item) {
+      const Value* otherItem = keys_->Find(item.key);
+      // The forward pass has compared this item, and found its schema.
+      if (reverse_ && otherItem != nullptr) return;
+      ConfigStoreObjectId id(std::string(NameOf(item.component)), std::string(NameOf(item.group)),
+                             std::string(NameOf(item.key)));
+      const std::string path = DocumentShape::ItemPath(id.component, id.group, id.key);
+      auto schema = HoxSchemaStore::GetSchema(id.component, id.group, id.key, store_);
+      if (!schema) {
+        CSLogger::Log(CSLogger::kError, "Schema not found for %s:%s:%s", id.component.c_str(), id.group.c_str(),
+                      id.key.c_str());
+        ThrowException<SchemaNotFound>(SchemaObjectNotFound, path);
       }
+      if (!reverse_) {
+        walk_.CompareItem(item.value, otherItem != nullptr ? *otherItem : NullValue(), id, schema, path);
+        return;
+      }
+      // The host holds an item the desired document lacks: it drifts only
+      // when it differs from the key's default user configuration.
+      Document defaults;
+      if (schema->HasDefaultUserConfig()) {
+        if (!connection_) connection_ = HoxConfigStore::GetDBStore(0, false);
+        GetExternalDefaultUserConfig(id, connection_, schema, defaults);
+      }
+      walk_.CompareItem(defaults, item.value, id, schema, path);
     }
-  }
+
+   private:
+    const OtherLevel components_;
+    std::optional<OtherLevel> groups_;
+    std::optional<OtherLevel> keys_;
+    const std::shared_ptr<HoxSchemaStore::SchemaStore>& store_;
+    std::shared_ptr<HoxConfigStore::DBStore>& connection_;
+    const bool reverse_;
+    DriftWalk walk_;
+  } pass(other, allocator, store, handler, connection, reverse);
+  DocumentShape::Walk(source, pass);
 }
 
 void ComputeDrift(Value& desired, Allocator& allocator, DriftHandler& handler, std::optional<Document> current) {
@@ -410,9 +417,7 @@ void ComputeDrift(Value& desired, Allocator& allocator, DriftHandler& handler, s
   CSLogger::Log(CSLogger::kInfo, "DriftHandler: consolidated action required - %d",
                 handler.IsConsolidatedActionRequired() ? 1 : 0);
   CSLogger::Log(CSLogger::kInfo, "DriftHandler: create drift object - %d", handler.IsCreateDriftObject() ? 1 : 0);
-  RAPIDJSON_ASSERT(desired.IsObject());
-  auto profile = desired.FindMember("profile");
-  const Value& root = profile != desired.MemberEnd() ? profile->value : desired;
+  const Value& root = DocumentShape::Unwrap(desired);
   std::shared_ptr<HoxConfigStore::DBStore> connection;
   computeComponents(root, host, allocator, store, handler, connection, false);
   computeComponents(host, root, allocator, store, handler, connection, true);

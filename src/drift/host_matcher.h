@@ -13,7 +13,7 @@
 
 #include <hoxcm/json.h>
 
-#include "platform/compare/value_compare.h"
+#include "foundation/compare/value_compare.h"
 
 namespace HoxConfigManager::detail {
 

@@ -2,9 +2,6 @@
 
 #include <vector>
 
-#include <hoxcm/host.h>
-#include <hoxcm/schema_store.h>
-
 #include "foundation/json_parse.h"
 
 namespace HoxConfigManager {
@@ -16,18 +13,6 @@ void AddMember(Document* doc, Value* object, const std::string& name, Value* val
   RAPIDJSON_ASSERT(object->IsObject());
   Value key(name.c_str(), static_cast<rapidjson::SizeType>(name.size()), doc->GetAllocator());
   object->AddMember(key, *value, doc->GetAllocator());
-}
-
-std::string GetInstanceIdFromValue(const Value& instance,
-                                   const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema) {
-  RAPIDJSON_ASSERT(schema != nullptr);
-  const std::string& member = schema->GetIdentityMember();
-  if (member.empty() || !HoxConfigStore::ConfigStoreDocument::ValueExists(instance, member.c_str())) {
-    return {};
-  }
-  const Value& id = instance[member.c_str()];
-  if (!id.IsString()) ThrowException<ConfigManagerException>(InvalidKeyValue, member);
-  return std::string(id.GetString(), id.GetStringLength());
 }
 
 bool IsEqualArray(const Value& a, const Value& b) {

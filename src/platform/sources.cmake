@@ -2,12 +2,10 @@
 list(APPEND HOXCM_SOURCES
   src/platform/logger.cc
   src/platform/paths.cc
-  src/platform/strings.cc
 )
 # Each area of the platform keeps its own list.
 include(${CMAKE_CURRENT_LIST_DIR}/files/sources.cmake OPTIONAL)
 include(${CMAKE_CURRENT_LIST_DIR}/store/sources.cmake OPTIONAL)
 include(${CMAKE_CURRENT_LIST_DIR}/host/sources.cmake OPTIONAL)
 include(${CMAKE_CURRENT_LIST_DIR}/schema/sources.cmake OPTIONAL)
-include(${CMAKE_CURRENT_LIST_DIR}/compare/sources.cmake OPTIONAL)
 include(${CMAKE_CURRENT_LIST_DIR}/process/sources.cmake OPTIONAL)

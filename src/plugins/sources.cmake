@@ -5,4 +5,5 @@ list(APPEND HOXCM_SOURCES
   src/plugins/plugin_manager.cc
   src/plugins/plugin_request.cc
   src/plugins/plugin_schemas.cc
+  src/plugins/result_readers.cc
 )

@@ -9,7 +9,7 @@
 #include <hoxcm/config_store.h>
 
 #include "drift/drift_fixture.h"
-#include "platform/compare/value_compare.h"
+#include "foundation/compare/value_compare.h"
 
 namespace {
 

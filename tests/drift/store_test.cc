@@ -8,7 +8,7 @@
 #include <gtest/gtest.h>
 
 #include <hoxcm/config_store.h>
-#include <hoxcm/operations.h>
+#include <hoxcm/extraction.h>
 
 #include "drift/drift_fixture.h"
 #include "support/thrown.h"

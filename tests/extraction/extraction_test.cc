@@ -5,7 +5,7 @@
 #include <hoxcm/config_store.h>
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
-#include <hoxcm/operations.h>
+#include <hoxcm/extraction.h>
 
 #include "extraction/sample_host.h"
 #include "support/json.h"

@@ -2,7 +2,8 @@
 // from store rows, the solution filters, auto-configuration, boot documents.
 #include <hoxcm/config_store.h>
 #include <hoxcm/documents.h>
-#include <hoxcm/operations.h>
+#include <hoxcm/extraction.h>
+#include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
 #include "extraction/sample_host.h"

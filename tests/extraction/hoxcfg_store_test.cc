@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/host_documents.h>
 
 #include "extraction/sample_host.h"
 #include "support/run_hoxcfg.h"

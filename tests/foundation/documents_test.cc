@@ -3,6 +3,7 @@
 #include <string>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
 #include "support/json.h"

@@ -9,7 +9,8 @@
 #include <unordered_map>
 
 #include <hoxcm/drift.h>
-#include <hoxcm/operations.h>
+#include <hoxcm/extraction.h>
+#include <hoxcm/host_documents.h>
 
 #include "platform/process/process.h"
 #include "plugins/plugin_fixture.h"

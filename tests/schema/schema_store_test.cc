@@ -7,6 +7,7 @@
 #include <vector>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
 #include "support/json.h"

@@ -5,6 +5,7 @@
 #include <string>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/host_documents.h>
 
 #include "support/temp_root.h"
 

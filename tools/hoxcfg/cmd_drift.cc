@@ -8,6 +8,7 @@
 
 #include <hoxcm/documents.h>
 #include <hoxcm/drift.h>
+#include <hoxcm/host_documents.h>
 
 #include "hoxcfg/commands.h"
 #include "hoxcfg/common.h"

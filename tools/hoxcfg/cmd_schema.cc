@@ -4,6 +4,7 @@
 #include <string>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
 #include "hoxcfg/commands.h"
@@ -49,7 +50,7 @@ void RegisterSchemaCheck(CLI::App& app, GlobalOptions& options) {
       }
       if (!document.IsObject()) throw CommandError{kExitError, "a host document must be a JSON object"};
       if (!HoxConfigManager::GenerateHostDocumentSchema(document, schema)) return Report(schema, options);
-      const rapidjson::Value& root = document.HasMember("profile") ? document["profile"] : document;
+      const rapidjson::Value& root = HoxConfigManager::DocumentShape::Unwrap(document);
       JsonValidator::ValidateCMDocument(schema, root, errors, {}, "");
       return Report(errors, options);
     });

@@ -8,7 +8,8 @@
 #include <hoxcm/config_store.h>
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
-#include <hoxcm/operations.h>
+#include <hoxcm/extraction.h>
+#include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
 #include "hoxcfg/commands.h"
@@ -33,25 +34,18 @@ void RequireHostRoot() {
 // possibly under "profile") by the mask of the store, so that what is shown
 // on a terminal never carries a secret.
 void RedactDocument(rapidjson::Document& doc) {
+  namespace Shape = HoxConfigManager::DocumentShape;
   auto store = HoxSchemaStore::SchemaStore::GetStore();
   if (!store || !doc.IsObject()) return;
-  rapidjson::Value* root = &doc;
-  if (doc.HasMember("profile") && doc["profile"].IsObject()) root = &doc["profile"];
-  for (auto& component : root->GetObject()) {
-    if (!component.value.IsObject()) continue;
-    for (auto& group : component.value.GetObject()) {
-      if (!group.value.IsObject()) continue;
-      for (auto& key : group.value.GetObject()) {
-        auto schema = store->Find(component.name.GetString(), group.name.GetString(), key.name.GetString());
-        if (!schema) continue;
-        const std::string text =
-            HoxConfigStore::ConfigStoreDocument::RedactAndSerializeValue(schema->GetJsonSchema(), key.value);
-        rapidjson::Document redacted(&doc.GetAllocator());
-        HoxConfigManager::ParseDocument(text, redacted);
-        key.value.Swap(redacted);
-      }
-    }
-  }
+  Shape::ForEachItem(Shape::Unwrap(doc), [&](const Shape::Item<rapidjson::Value>& item) {
+    auto schema = store->Find(item.component.GetString(), item.group.GetString(), item.key.GetString());
+    if (!schema) return;
+    const std::string text =
+        HoxConfigStore::ConfigStoreDocument::RedactAndSerializeValue(schema->GetJsonSchema(), item.value);
+    rapidjson::Document redacted(&doc.GetAllocator());
+    HoxConfigManager::ParseDocument(text, redacted);
+    item.value.Swap(redacted);
+  });
 }
 
 void RegisterInit(CLI::App& app, GlobalOptions& options) {

@@ -9,6 +9,7 @@
 #include <hoxcm/documents.h>
 #include <hoxcm/files.h>
 #include <hoxcm/host.h>
+#include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
 #include "hoxcfg/common.h"

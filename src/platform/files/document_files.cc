@@ -3,6 +3,7 @@
 
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
+#include <hoxcm/host_documents.h>
 
 #include "foundation/json_parse.h"
 

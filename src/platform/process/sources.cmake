@@ -1,5 +1,4 @@
-# Runner processes, the host run lock, request files and result readers.
+# Runner processes and the host run lock.
 list(APPEND HOXCM_SOURCES
   src/platform/process/process.cc
-  src/platform/process/result_readers.cc
 )

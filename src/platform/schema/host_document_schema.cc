@@ -6,6 +6,7 @@
 #include <hoxcm/documents.h>
 #include <hoxcm/errors.h>
 #include <hoxcm/host.h>
+#include <hoxcm/host_documents.h>
 #include <hoxcm/json.h>
 #include <hoxcm/schema_store.h>
 
@@ -36,26 +37,36 @@ void GenerateSchemaDocument(const rapidjson::Value& value, const std::shared_ptr
   out.SetObject();
   auto& a = out.GetAllocator();
   out.AddMember("$schema", kDraft4, a);
-  rapidjson::Value components = ClosedObjectSchema(a);
-  for (const auto& component : value.GetObject()) {
-    RAPIDJSON_ASSERT(component.value.IsObject());
-    rapidjson::Value groups = ClosedObjectSchema(a);
-    for (const auto& group : component.value.GetObject()) {
-      RAPIDJSON_ASSERT(group.value.IsObject());
-      rapidjson::Value keys = ClosedObjectSchema(a);
-      for (const auto& key : group.value.GetObject()) {
-        auto schema = store->Find(component.name.GetString(), group.name.GetString(), key.name.GetString());
-        if (!schema) continue;
-        rapidjson::Value keySchema(schema->GetJsonSchema(), a);
-        // Host-specific keys are told apart when a document is split per host.
-        if (schema->IsHostSpecific()) keySchema.AddMember("hostSpecific", true, a);
-        keys["properties"].AddMember(rapidjson::Value(key.name, a), keySchema, a);
-      }
-      groups["properties"].AddMember(rapidjson::Value(group.name, a), keys, a);
+  // One closed object schema per level; every component and group of the
+  // document gets one, even without keys.
+  struct Builder : HoxConfigManager::DocumentShape::LevelVisitor {
+    Builder(const SchemaStore& store, rapidjson::Document::AllocatorType& a)
+        : store(store), a(a), components(ClosedObjectSchema(a)) {}
+    void EnterComponent(const rapidjson::Value& name, const rapidjson::Value&) {
+      auto& properties = components["properties"];
+      properties.AddMember(rapidjson::Value(name, a), ClosedObjectSchema(a), a);
+      groups = &(properties.MemberEnd() - 1)->value["properties"];
     }
-    components["properties"].AddMember(rapidjson::Value(component.name, a), groups, a);
-  }
-  for (auto& m : components.GetObject()) out.AddMember(m.name, m.value, a);
+    void EnterGroup(const rapidjson::Value&, const rapidjson::Value& name, const rapidjson::Value&) {
+      groups->AddMember(rapidjson::Value(name, a), ClosedObjectSchema(a), a);
+      keys = &(groups->MemberEnd() - 1)->value["properties"];
+    }
+    void Item(const HoxConfigManager::DocumentShape::Item<const rapidjson::Value>& item) {
+      auto schema = store.Find(item.component.GetString(), item.group.GetString(), item.key.GetString());
+      if (!schema) return;
+      rapidjson::Value keySchema(schema->GetJsonSchema(), a);
+      // Host-specific keys are told apart when a document is split per host.
+      if (schema->IsHostSpecific()) keySchema.AddMember("hostSpecific", true, a);
+      keys->AddMember(rapidjson::Value(item.key, a), keySchema, a);
+    }
+    const SchemaStore& store;
+    rapidjson::Document::AllocatorType& a;
+    rapidjson::Value components;
+    rapidjson::Value* groups = nullptr;
+    rapidjson::Value* keys = nullptr;
+  } builder(*store, a);
+  HoxConfigManager::DocumentShape::Walk(value, builder);
+  for (auto& m : builder.components.GetObject()) out.AddMember(m.name, m.value, a);
 }
 
 }  // namespace HoxSchemaStore
@@ -64,36 +75,27 @@ namespace HoxConfigManager {
 
 bool GenerateHostDocumentSchema(const Value& document, Document& out) {
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "GenerateHostDocumentSchema");
-  RAPIDJSON_ASSERT(document.IsObject());
-  auto profile = document.FindMember("profile");
-  const Value& root = profile != document.MemberEnd() ? profile->value : document;
+  const Value& root = DocumentShape::Unwrap(document);
   RAPIDJSON_ASSERT(root.IsObject());
   auto store = HoxSchemaStore::SchemaStore::GetStore();
   if (!store) ThrowException<ConfigManagerException>(SchemaStoreAccessFailed);
 
   out.SetArray();
   auto& a = out.GetAllocator();
-  for (const auto& component : root.GetObject()) {
-    RAPIDJSON_ASSERT(component.value.IsObject());
-    for (const auto& group : component.value.GetObject()) {
-      RAPIDJSON_ASSERT(group.value.IsObject());
-      for (const auto& key : group.value.GetObject()) {
-        const HoxSchemaStore::SchemaObjectId id(component.name.GetString(), group.name.GetString(),
-                                                key.name.GetString());
-        if (store->Find(id.component, id.group, id.key)) continue;
-        CSLogger::Log(CSLogger::kError, "Schema not found for %s", id.toString().c_str());
-        const std::string field = "/" + id.component + "/" + id.group + "/" + id.key;
-        Value error(rapidjson::kObjectType);
-        error.AddMember("field", Value(field, a), a);
-        error.AddMember("errId", static_cast<int>(JsonValidator::VALIDATION_ERR_UNKNOWN_KEY), a);
-        Value args(rapidjson::kArrayType);
-        args.PushBack(Value(id.toString(), a), a);
-        error.AddMember("errArgs", args, a);
-        error.AddMember("error", Value("No schema for the key " + id.toString(), a), a);
-        out.PushBack(error, a);
-      }
-    }
-  }
+  DocumentShape::ForEachItem(root, [&](const DocumentShape::Item<const Value>& item) {
+    const HoxSchemaStore::SchemaObjectId id(item.component.GetString(), item.group.GetString(),
+                                            item.key.GetString());
+    if (store->Find(id.component, id.group, id.key)) return;
+    CSLogger::Log(CSLogger::kError, "Schema not found for %s", id.toString().c_str());
+    Value error(rapidjson::kObjectType);
+    error.AddMember("field", Value(item.Path(), a), a);
+    error.AddMember("errId", static_cast<int>(JsonValidator::VALIDATION_ERR_UNKNOWN_KEY), a);
+    Value args(rapidjson::kArrayType);
+    args.PushBack(Value(id.toString(), a), a);
+    error.AddMember("errArgs", args, a);
+    error.AddMember("error", Value("No schema for the key " + id.toString(), a), a);
+    out.PushBack(error, a);
+  });
   if (!out.Empty()) return false;
   HoxSchemaStore::GenerateSchemaDocument(root, HoxSchemaStore::SchemaStore::GetCache(), out);
   return true;

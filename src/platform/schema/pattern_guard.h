@@ -14,18 +14,15 @@
 
 #include <hoxcm/json.h>
 
+#include "foundation/regex_limits.h"
 #include "platform/schema/validator_errors.h"
 
 namespace JsonValidator::detail {
 
 constexpr std::size_t kMaxPatternSubject = 4096;
-// Subjects up to this length are matched safely on any thread's stack.
-constexpr std::size_t kSmallSubject = 256;
-
-// Compiling a regular expression recurses once per element of the pattern:
-// a pattern of some ten thousand elements exhausts a thread's stack before
-// any subject is matched. A schema with a longer pattern is not usable.
-constexpr std::size_t kMaxPatternLength = 4096;
+// The limits of foundation/regex_limits.h, under the names the validator uses.
+using HoxConfigManager::detail::kMaxPatternLength;
+using HoxConfigManager::detail::kSmallSubject;
 
 // Empty when every regular expression of `schema` ("pattern" values and
 // "patternProperties" names) is at most kMaxPatternLength bytes long;

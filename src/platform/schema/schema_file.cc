@@ -5,6 +5,7 @@
 #include <regex>
 #include <set>
 
+#include <hoxcm/documents.h>
 #include <hoxcm/files.h>
 #include <hoxcm/json.h>
 
@@ -16,7 +17,8 @@
 namespace HoxSchemaStore::detail {
 namespace {
 
-constexpr const char* kGeneratedId = "cs_generated_id";
+namespace Shape = HoxConfigManager::DocumentShape;
+
 
 // Thrown inside this file only, turned into the load error text.
 struct SchemaFileError {
@@ -200,13 +202,13 @@ void CheckIdentity(rapidjson::Value& instance, const std::string& identity, rapi
     props = instance.FindMember("properties");
   }
   if (!props->value.IsObject()) Fail("\"properties\" of the schema is not an object");
-  if (identity == kGeneratedId) {
+  if (identity == Shape::kGeneratedId) {
     // Instances carry the store's generated identity; declare it so that
     // schemas may forbid additional properties.
-    if (!props->value.HasMember(kGeneratedId)) {
+    if (!props->value.HasMember(rapidjson::Value(Shape::Ref(Shape::kGeneratedId)))) {
       rapidjson::Value type(rapidjson::kObjectType);
       type.AddMember("type", "string", a);
-      props->value.AddMember(rapidjson::Value(kGeneratedId, a), type, a);
+      props->value.AddMember(Shape::Ref(Shape::kGeneratedId), type, a);
     }
     return;
   }

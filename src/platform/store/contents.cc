@@ -19,7 +19,7 @@ using detail::Statement;
 
 namespace {
 
-constexpr const char* kGeneratedId = "cs_generated_id";
+namespace Shape = HoxConfigManager::DocumentShape;
 
 struct ItemRow {
   std::string component;
@@ -48,15 +48,15 @@ bool IsMultiInstance(const HoxSchemaStore::SchemaObject* schema, const rapidjson
 std::string IdentifyInstance(rapidjson::Value& instance, rapidjson::MemoryPoolAllocator<>& allocator,
                              const HoxSchemaStore::SchemaObject* schema, const std::string& requested) {
   RAPIDJSON_ASSERT(instance.IsObject());
-  const std::string member = schema != nullptr ? schema->GetIdentityMember() : kGeneratedId;
+  const std::string member = schema != nullptr ? schema->GetIdentityMember() : std::string(Shape::kGeneratedId);
   if (member.empty()) return requested;
   auto it = instance.FindMember(member.c_str());
-  if (member == kGeneratedId) {
+  if (member == Shape::kGeneratedId) {
     std::string id = requested;
     if (id.empty() && it != instance.MemberEnd() && it->value.IsString()) id = it->value.GetString();
     if (id.empty()) id = GenerateInstanceId();
     if (it == instance.MemberEnd()) {
-      instance.AddMember(rapidjson::Value(kGeneratedId, allocator), rapidjson::Value(id, allocator), allocator);
+      instance.AddMember(Shape::Ref(Shape::kGeneratedId), rapidjson::Value(id, allocator), allocator);
     } else {
       it->value.SetString(id, allocator);
     }
@@ -94,42 +94,31 @@ std::string Serialize(const rapidjson::Value& value) {
 // One row per singleton and per instance of a host document ("profile"
 // unwrapped), in document order. Throws before anything is written.
 std::vector<ItemRow> RowsFromDocument(const rapidjson::Value& document) {
-  RAPIDJSON_ASSERT(document.IsObject());
-  const rapidjson::Value& root = document.HasMember("profile") ? document["profile"] : document;
-  RAPIDJSON_ASSERT(root.IsObject());
   rapidjson::Document scratch;
   std::vector<ItemRow> rows;
-  for (const auto& component : root.GetObject()) {
-    RAPIDJSON_ASSERT(component.value.IsObject());
-    for (const auto& group : component.value.GetObject()) {
-      RAPIDJSON_ASSERT(group.value.IsObject());
-      for (const auto& key : group.value.GetObject()) {
-        ItemRow base{component.name.GetString(), group.name.GetString(), key.name.GetString(), {}, {}};
-        const auto schema = FindSchema(base.component, base.group, base.key);
-        if (!IsMultiInstance(schema.get(), key.value)) {
-          RAPIDJSON_ASSERT(key.value.IsObject());
-          base.value = Serialize(key.value);
-          rows.push_back(std::move(base));
-          continue;
-        }
-        RAPIDJSON_ASSERT(key.value.IsArray());
-        std::set<std::string> seen;
-        for (const auto& element : key.value.GetArray()) {
-          rapidjson::Value instance(element, scratch.GetAllocator());
-          ItemRow row = base;
-          row.identifier = IdentifyInstance(instance, scratch.GetAllocator(), schema.get(), {});
-          if (!seen.insert(row.identifier).second) {
-            HoxConfigManager::ThrowException<HoxConfigManager::ConfigManagerException>(
-                HoxConfigManager::InvalidKeyValue,
-                "/" + base.component + "/" + base.group + "/" + base.key + " (duplicate instance " +
-                    row.identifier + ")");
-          }
-          row.value = Serialize(instance);
-          rows.push_back(std::move(row));
-        }
-      }
+  Shape::ForEachItem(Shape::Unwrap(document), [&](const Shape::Item<const rapidjson::Value>& item) {
+    ItemRow base{item.component.GetString(), item.group.GetString(), item.key.GetString(), {}, {}};
+    const auto schema = FindSchema(base.component, base.group, base.key);
+    if (!IsMultiInstance(schema.get(), item.value)) {
+      RAPIDJSON_ASSERT(item.value.IsObject());
+      base.value = Serialize(item.value);
+      rows.push_back(std::move(base));
+      return;
     }
-  }
+    RAPIDJSON_ASSERT(item.value.IsArray());
+    std::set<std::string> seen;
+    for (const auto& element : item.value.GetArray()) {
+      rapidjson::Value instance(element, scratch.GetAllocator());
+      ItemRow row = base;
+      row.identifier = IdentifyInstance(instance, scratch.GetAllocator(), schema.get(), {});
+      if (!seen.insert(row.identifier).second) {
+        HoxConfigManager::ThrowException<HoxConfigManager::ConfigManagerException>(
+            HoxConfigManager::InvalidKeyValue, item.Path() + " (duplicate instance " + row.identifier + ")");
+      }
+      row.value = Serialize(instance);
+      rows.push_back(std::move(row));
+    }
+  });
   return rows;
 }
 
@@ -178,12 +167,12 @@ ConfigMapList ReadRows(Statement& select) {
       row->emplace_hint(row->end(), std::piecewise_construct, std::forward_as_tuple(name),
                         std::forward_as_tuple(text.data() != nullptr ? text.data() : "", text.size()));
     };
-    if (!select.IsNull(5)) add("AutoConfValue", 5);
-    add("Component", 0);
-    add("ConfigGroup", 1);
-    add("Identifier", 3);
-    add("Name", 2);
-    add("Value", 4);
+    if (!select.IsNull(5)) add(RowColumn::kAutoConfValue, 5);
+    add(RowColumn::kComponent, 0);
+    add(RowColumn::kGroup, 1);
+    add(RowColumn::kIdentifier, 3);
+    add(RowColumn::kKey, 2);
+    add(RowColumn::kValue, 4);
     rows.push_back(std::move(row));
   }
   return rows;
@@ -217,10 +206,10 @@ rapidjson::Document ItemFromRows(const ConfigMapList& rows, const std::string& c
   if (rows.empty()) return doc;
   const auto schema = FindSchema(component, group, key);
   const bool multi = asArray || (schema ? schema->IsMultiInstance()
-                                        : rows.size() > 1 || rows.front()->at("Identifier") != "");
+                                        : rows.size() > 1 || rows.front()->at(RowColumn::kIdentifier) != "");
   if (multi) doc.SetArray();
   for (const auto& row : rows) {
-    rapidjson::Document value = ConfigStoreDocument::CreateDocument(row->at("Value"));
+    rapidjson::Document value = ConfigStoreDocument::CreateDocument(row->at(RowColumn::kValue));
     if (!multi) {
       doc.Swap(value);
       return doc;

@@ -1,5 +1,4 @@
 list(APPEND HOXCM_SOURCES
-  src/platform/store/config_store_document.cc
   src/platform/store/contents.cc
   src/platform/store/database.cc
   src/platform/store/host_state.cc

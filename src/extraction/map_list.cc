@@ -9,20 +9,20 @@
 
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
-#include <hoxcm/operations.h>
+#include <hoxcm/extraction.h>
 
-#include "operations/extraction_internal.h"
+#include "extraction/extraction_internal.h"
 
 namespace HoxConfigManager {
 namespace {
+
+namespace RowColumn = HoxConfigStore::RowColumn;
 
 using HoxConfigStore::ConfigMap;
 using HoxConfigStore::ConfigStoreDocument;
 using HoxSchemaStore::SchemaObject;
 using HoxSchemaStore::SchemaObjectId;
 
-constexpr const char* kGeneratedIdMember = "cs_generated_id";
-constexpr const char* kDeleteDefault = "DELETE_DEFAULT";
 
 // Validator findings that only summarise another finding (a failed "oneOf"
 // because its tag is missing, ...): auto-configuration answers the
@@ -90,17 +90,17 @@ struct RowColumns {
   explicit RowColumns(const ConfigMap& row) {
     for (const auto& [name, text] : row) {
       const std::string_view column(name);
-      if (column == "Component") {
+      if (column == RowColumn::kComponent) {
         component = &text;
-      } else if (column == "ConfigGroup") {
+      } else if (column == RowColumn::kGroup) {
         group = &text;
-      } else if (column == "Name") {
+      } else if (column == RowColumn::kKey) {
         key = &text;
-      } else if (column == "Identifier") {
+      } else if (column == RowColumn::kIdentifier) {
         identifier = &text;
-      } else if (column == "Value") {
+      } else if (column == RowColumn::kValue) {
         value = &text;
-      } else if (column == "AutoConfValue") {
+      } else if (column == RowColumn::kAutoConfValue) {
         autoConf = &text;
       }
     }
@@ -152,10 +152,14 @@ void ProcessAutoConfig(Value& value, const Value& schema, const std::string& aut
     switch (error["errId"].GetInt()) {
       case JsonValidator::VALIDATION_ERR_REQUIRED:
         CSLogger::Log(CSLogger::kInfo, "patching validation error: '%s' %s", field.c_str(), text);
-        ConfigStoreDocument::PatchRequiredProperty(value, field, autoConf, allocator);
+        if (!ConfigStoreDocument::PatchRequiredProperty(value, field, autoConf, allocator)) {
+          CSLogger::Log(CSLogger::kDetail, "No auto configuration value for '%s'", field.c_str());
+        }
         break;
       case JsonValidator::VALIDATION_ERR_UNION_TAG:
-        ConfigStoreDocument::PatchUnionTagProperty(value, field, autoConf, allocator);
+        if (!ConfigStoreDocument::PatchUnionTagProperty(value, field, autoConf, allocator)) {
+          CSLogger::Log(CSLogger::kDetail, "No auto configuration value for '%s'", field.c_str());
+        }
         break;
       default:
         CSLogger::Log(CSLogger::kError, "unexpected validation error: '%s' %s", field.c_str(), text);
@@ -198,7 +202,7 @@ void ProcessConfigMapList(Document& result, const HoxConfigStore::ConfigMapList&
     }
 
     const std::string& text = *columns.value;
-    if (text == kDeleteDefault) {
+    if (text == DocumentShape::kDeleteDefault) {
       ThrowException<ConfigManagerException>(DeleteDefaultNotSupported,
                                              SchemaObjectId(component, group, key).toString());
     }
@@ -227,7 +231,7 @@ void ProcessConfigMapList(Document& result, const HoxConfigStore::ConfigMapList&
       ProcessAutoConfig(value, schema.GetInstanceSchema(), *columns.autoConf, allocator);
     }
 
-    if (schema.GetIdentityMember() != kGeneratedIdMember) {
+    if (schema.GetIdentityMember() != DocumentShape::kGeneratedId) {
       const std::vector<std::string>& solutionIds = schema.GetSolutionInstanceIds();
       if (!identifier.empty() &&
           std::find(solutionIds.begin(), solutionIds.end(), identifier) != solutionIds.end()) {

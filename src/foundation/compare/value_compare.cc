@@ -1,4 +1,4 @@
-#include "platform/compare/value_compare.h"
+#include "foundation/compare/value_compare.h"
 
 #include <bit>
 #include <functional>
@@ -6,9 +6,9 @@
 #include <string>
 #include <vector>
 
-#include <hoxcm/config_store.h>
+#include <hoxcm/config_document.h>
 
-#include "platform/schema/pattern_guard.h"
+#include "foundation/regex_limits.h"
 
 namespace HoxConfigStore::detail {
 
@@ -114,8 +114,8 @@ const Value* PatternPropertySchema(const Value& schema, std::string_view name, P
     // with that of the pattern: past the limits that are safe on any stack,
     // a sensitive pattern is taken to match and any other not to.
     bool matches = sensitive;
-    if (subject.size() <= JsonValidator::detail::kSmallSubject &&
-        it->name.GetStringLength() <= JsonValidator::detail::kMaxPatternLength) {
+    if (subject.size() <= HoxConfigManager::detail::kSmallSubject &&
+        it->name.GetStringLength() <= HoxConfigManager::detail::kMaxPatternLength) {
       std::optional<std::regex> local;
       std::optional<std::regex>* compiled = &local;
       bool fresh = true;

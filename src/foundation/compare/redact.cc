@@ -1,9 +1,9 @@
 // Serialisation of configuration values with sensitive properties masked.
 #include <string_view>
 
-#include <hoxcm/config_store.h>
+#include <hoxcm/config_document.h>
 
-#include "platform/compare/value_compare.h"
+#include "foundation/compare/value_compare.h"
 
 namespace HoxConfigStore {
 

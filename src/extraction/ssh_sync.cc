@@ -4,7 +4,7 @@
 
 #include <hoxcm/host.h>
 
-#include "operations/extraction_internal.h"
+#include "extraction/extraction_internal.h"
 
 namespace HoxConfigManager::detail {
 namespace {

@@ -8,9 +8,10 @@
 
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
-#include <hoxcm/operations.h>
+#include <hoxcm/extraction.h>
+#include <hoxcm/host_documents.h>
 
-#include "operations/extraction_internal.h"
+#include "extraction/extraction_internal.h"
 
 namespace HoxConfigManager {
 namespace detail {
@@ -28,6 +29,8 @@ std::set<HoxSchemaStore::SchemaObjectId> DspExcludedObjects() {
 }  // namespace detail
 
 namespace {
+
+namespace RowColumn = HoxConfigStore::RowColumn;
 
 using detail::Column;
 using HoxConfigStore::ConfigMapList;
@@ -49,7 +52,7 @@ std::shared_ptr<HoxConfigStore::DBStore> DatabaseOrThrow() {
 using KeyColumns = std::tuple<const std::string&, const std::string&, const std::string&>;
 
 KeyColumns KeyOf(const HoxConfigStore::ConfigMap& row) {
-  return {Column(row, "Component"), Column(row, "ConfigGroup"), Column(row, "Name")};
+  return {Column(row, RowColumn::kComponent), Column(row, RowColumn::kGroup), Column(row, RowColumn::kKey)};
 }
 
 // The rows of one key. The store returns rows ordered by component, group
@@ -175,12 +178,12 @@ Document ExtractSmartnicConfiguration() {
   Document parsed(&allocator);
   for (const auto& row : contents) {
     RAPIDJSON_ASSERT(row != nullptr);
-    const std::string& key = Column(*row, "Name");
-    const std::string& component = Column(*row, "Component");
-    const std::string& group = Column(*row, "ConfigGroup");
-    const std::string& identifier = Column(*row, "Identifier");
-    const std::string& text = Column(*row, "Value");
-    if (text == "DELETE_DEFAULT") {
+    const std::string& key = Column(*row, RowColumn::kKey);
+    const std::string& component = Column(*row, RowColumn::kComponent);
+    const std::string& group = Column(*row, RowColumn::kGroup);
+    const std::string& identifier = Column(*row, RowColumn::kIdentifier);
+    const std::string& text = Column(*row, RowColumn::kValue);
+    if (text == DocumentShape::kDeleteDefault) {
       ThrowException<ConfigManagerException>(DeleteDefaultNotSupported,
                                              SchemaObjectId(component, group, key).toString());
     }
@@ -198,8 +201,8 @@ Document ExportDocument() {
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "ExportDocument");
   try {
     Document user = ExtractUserConfiguration(true);
-    RAPIDJSON_ASSERT(user.IsObject() && user.HasMember("profile"));
-    const Value& profile = user["profile"];
+    RAPIDJSON_ASSERT(user.IsObject() && user.HasMember(Value(DocumentShape::Ref(DocumentShape::kProfile))));
+    const Value& profile = DocumentShape::Unwrap(user);
 
     Document schemaDocument;
     HoxSchemaStore::GenerateSchemaDocument(profile, HoxSchemaStore::SchemaStore::GetCache(), schemaDocument);

@@ -5,9 +5,8 @@
 #include <string_view>
 #include <vector>
 
-#include <hoxcm/config_store.h>
+#include <hoxcm/config_document.h>
 #include <hoxcm/documents.h>
-#include <hoxcm/host.h>
 
 #include "foundation/json_parse.h"
 
@@ -17,9 +16,9 @@ namespace {
 using Allocator = rapidjson::MemoryPoolAllocator<>;
 using rapidjson::Value;
 
-constexpr const char* kProfile = "profile";
+namespace Shape = HoxConfigManager::DocumentShape;
+
 constexpr const char* kHostSpecific = "hostSpecific";
-constexpr const char* kGeneratedId = "cs_generated_id";
 
 std::string_view Name(const Value& name) { return {name.GetString(), name.GetStringLength()}; }
 
@@ -50,21 +49,25 @@ void SetMember(Value& parent, std::string_view name, Value& value, Allocator& al
 }
 
 // Copies every item (component, group, key) of `items` into `target`,
-// replacing items that exist there.
+// replacing items that exist there; components and groups are created in
+// `target` even when they hold no item.
 void MergeItems(Value& target, const Value& items, Allocator& allocator) {
-  RAPIDJSON_ASSERT(items.IsObject());
-  for (const auto& component : items.GetObject()) {
-    RAPIDJSON_ASSERT(component.value.IsObject());
-    Value& targetComponent = ObjectMember(target, Name(component.name), allocator);
-    for (const auto& group : component.value.GetObject()) {
-      RAPIDJSON_ASSERT(group.value.IsObject());
-      Value& targetGroup = ObjectMember(targetComponent, Name(group.name), allocator);
-      for (const auto& key : group.value.GetObject()) {
-        Value copy(key.value, allocator);
-        SetMember(targetGroup, Name(key.name), copy, allocator);
-      }
+  struct Merge : Shape::LevelVisitor {
+    Merge(Value& target, Allocator& allocator) : target(target), allocator(allocator) {}
+    void EnterComponent(const Value& name, const Value&) { component = &ObjectMember(target, Name(name), allocator); }
+    void EnterGroup(const Value&, const Value& name, const Value&) {
+      group = &ObjectMember(*component, Name(name), allocator);
     }
-  }
+    void Item(const Shape::Item<const Value>& item) {
+      Value copy(item.value, allocator);
+      SetMember(*group, Name(item.key), copy, allocator);
+    }
+    Value& target;
+    Allocator& allocator;
+    Value* component = nullptr;
+    Value* group = nullptr;
+  } merge(target, allocator);
+  Shape::Walk(items, merge);
 }
 
 // The schema of an object's member `name`, or null when the schema does not
@@ -144,7 +147,7 @@ void Clean(Value& value, const Value* schema, CLEANUP_ACTIONS action) {
         }
         break;
       case CLEANUP_REMOVE_UNKNOWN:
-        drop = memberSchema == nullptr && Name(it->name) != kGeneratedId && !DescribesOtherMembers(objectSchema);
+        drop = memberSchema == nullptr && Name(it->name) != Shape::kGeneratedId && !DescribesOtherMembers(objectSchema);
         break;
     }
     if (drop) {
@@ -190,12 +193,9 @@ bool NamesMemberOfObject(const rapidjson::Pointer& pointer, Value& value) {
   return container != nullptr && container->IsObject();
 }
 
-// The auto-configuration value of `field`; null (logged) when there is none.
-const Value* AutoConfSource(const rapidjson::Pointer& pointer, const std::string& field, const Value& autoConf) {
-  if (!pointer.IsValid()) return nullptr;
-  const Value* source = pointer.Get(autoConf);
-  if (source == nullptr) CSLogger::Log(CSLogger::kDetail, "No auto configuration value for '%s'", field.c_str());
-  return source;
+// The auto-configuration value of `field`; null when there is none.
+const Value* AutoConfSource(const rapidjson::Pointer& pointer, const Value& autoConf) {
+  return pointer.IsValid() ? pointer.Get(autoConf) : nullptr;
 }
 
 }  // namespace
@@ -231,7 +231,7 @@ void ConfigStoreDocument::GetDocumentForHost(const rapidjson::Value& source, rap
   }
   if (sections == nullptr) return;
   RAPIDJSON_ASSERT(sections->IsObject());
-  Value& target = result.HasMember(kProfile) ? result[kProfile] : static_cast<Value&>(result);
+  Value& target = Shape::Unwrap(result);
   const std::string host = NormalizeHostId(hostId);
   for (const auto& section : sections->GetObject()) {
     RAPIDJSON_ASSERT(section.value.IsObject());
@@ -242,27 +242,19 @@ void ConfigStoreDocument::GetDocumentForHost(const rapidjson::Value& source, rap
 
 void ConfigStoreDocument::SplitDocument(const rapidjson::Value& profile, const rapidjson::Value& schemaDocument,
                                         const std::string& hostId, rapidjson::Document& out) {
-  RAPIDJSON_ASSERT(profile.IsObject());
-  const Value& root = profile.HasMember(kProfile) ? profile[kProfile] : profile;
-  RAPIDJSON_ASSERT(root.IsObject());
+  const Value& root = Shape::Unwrap(profile);
   out.SetObject();
   Allocator& allocator = out.GetAllocator();
   Value shared(rapidjson::kObjectType);
   Value specific(rapidjson::kObjectType);
-  for (const auto& component : root.GetObject()) {
-    RAPIDJSON_ASSERT(component.value.IsObject());
-    for (const auto& group : component.value.GetObject()) {
-      RAPIDJSON_ASSERT(group.value.IsObject());
-      for (const auto& key : group.value.GetObject()) {
-        Value& target = IsHostSpecific(schemaDocument, component.name, group.name, key.name) ? specific : shared;
-        Value& targetGroup =
-            ObjectMember(ObjectMember(target, Name(component.name), allocator), Name(group.name), allocator);
-        Value copy(key.value, allocator);
-        SetMember(targetGroup, Name(key.name), copy, allocator);
-      }
-    }
-  }
-  out.AddMember(rapidjson::StringRef(kProfile), shared, allocator);
+  Shape::ForEachItem(root, [&](const Shape::Item<const Value>& item) {
+    Value& target = IsHostSpecific(schemaDocument, item.component, item.group, item.key) ? specific : shared;
+    Value& targetGroup =
+        ObjectMember(ObjectMember(target, Name(item.component), allocator), Name(item.group), allocator);
+    Value copy(item.value, allocator);
+    SetMember(targetGroup, Name(item.key), copy, allocator);
+  });
+  out.AddMember(Shape::Ref(Shape::kProfile), shared, allocator);
   if (!specific.ObjectEmpty()) {
     Value sections(rapidjson::kObjectType);
     sections.AddMember(Value(NormalizeHostId(hostId), allocator), specific, allocator);
@@ -279,7 +271,7 @@ void ConfigStoreDocument::AddObject(rapidjson::Document& doc, const std::string&
                                     rapidjson::MemoryPoolAllocator<>& allocator) {
   if (doc.IsNull()) doc.SetObject();
   RAPIDJSON_ASSERT(doc.IsObject());
-  Value& root = doc.HasMember(kProfile) ? doc[kProfile] : static_cast<Value&>(doc);
+  Value& root = Shape::Unwrap(doc);
   Value& groupValue = ObjectMember(ObjectMember(root, component, allocator), group, allocator);
   if (identifier.empty()) {
     SetMember(groupValue, key, value, allocator);
@@ -298,8 +290,8 @@ void ConfigStoreDocument::AddObject(rapidjson::Document& doc, const std::string&
 
 void ConfigStoreDocument::AddProfile(rapidjson::Document& doc) {
   if (!doc.IsObject()) doc.SetObject();
-  if (!doc.HasMember(kProfile)) {
-    doc.AddMember(rapidjson::StringRef(kProfile), Value(rapidjson::kObjectType), doc.GetAllocator());
+  if (!doc.HasMember(Value(Shape::Ref(Shape::kProfile)))) {
+    doc.AddMember(Shape::Ref(Shape::kProfile), Value(rapidjson::kObjectType), doc.GetAllocator());
   }
 }
 
@@ -315,7 +307,7 @@ void ConfigStoreDocument::CleanupObject(rapidjson::Value& value, const rapidjson
   }
   for (CLEANUP_ACTIONS action : actions) {
     if (action == CLEANUP_REMOVE_GENERATED_ID) {
-      if (value.IsObject()) value.EraseMember(kGeneratedId);
+      if (value.IsObject()) value.EraseMember(Value(Shape::Ref(Shape::kGeneratedId)));
       continue;
     }
     Clean(value, instanceSchema, action);
@@ -341,34 +333,36 @@ void ConfigStoreDocument::NormalizeValue(rapidjson::Value& value, rapidjson::Mem
   value = sorted;
 }
 
-void ConfigStoreDocument::PatchRequiredProperty(rapidjson::Value& value, const std::string& field,
+bool ConfigStoreDocument::PatchRequiredProperty(rapidjson::Value& value, const std::string& field,
                                                 const rapidjson::Value& autoConf,
                                                 rapidjson::MemoryPoolAllocator<>& allocator) {
   const rapidjson::Pointer pointer = FieldPointer(field);
-  const Value* source = AutoConfSource(pointer, field, autoConf);
-  if (source == nullptr) return;
+  const Value* source = AutoConfSource(pointer, autoConf);
+  if (source == nullptr) return false;
   Value* existing = pointer.Get(value);
   if (existing == nullptr) {
     if (NamesMemberOfObject(pointer, value)) pointer.Set(value, Value(*source, allocator), allocator);
-    return;
+    return true;
   }
   // The field names an object: fill the members it lacks.
-  if (!existing->IsObject() || !source->IsObject()) return;
+  if (!existing->IsObject() || !source->IsObject()) return true;
   for (const auto& member : source->GetObject()) {
     if (!existing->HasMember(member.name)) {
       existing->AddMember(Value(member.name, allocator), Value(member.value, allocator), allocator);
     }
   }
+  return true;
 }
 
-void ConfigStoreDocument::PatchUnionTagProperty(rapidjson::Value& value, const std::string& field,
+bool ConfigStoreDocument::PatchUnionTagProperty(rapidjson::Value& value, const std::string& field,
                                                 const rapidjson::Value& autoConf,
                                                 rapidjson::MemoryPoolAllocator<>& allocator) {
   const rapidjson::Pointer pointer = FieldPointer(field);
-  const Value* source = AutoConfSource(pointer, field, autoConf);
-  if (source == nullptr) return;
+  const Value* source = AutoConfSource(pointer, autoConf);
+  if (source == nullptr) return false;
   // The tag is missing or names no variant: the auto-configured tag wins.
   if (NamesMemberOfObject(pointer, value)) pointer.Set(value, Value(*source, allocator), allocator);
+  return true;
 }
 
 rapidjson::Document ConfigStoreDocument::CreateDocument(const std::string& text) {

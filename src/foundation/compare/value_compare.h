@@ -23,11 +23,11 @@
 #include <string_view>
 #include <unordered_map>
 
+#include <hoxcm/documents.h>
 #include <hoxcm/json.h>
 
 namespace HoxConfigStore::detail {
 
-constexpr const char* kGeneratedIdMember = "cs_generated_id";
 // Objects with more members than this are searched through a hash index.
 constexpr rapidjson::SizeType kWideObject = 16;
 
@@ -45,7 +45,9 @@ inline bool SameBytes(std::string_view a, std::string_view b) {
   }
   return true;
 }
-inline bool IsGeneratedId(const rapidjson::Value& name) { return NameOf(name) == kGeneratedIdMember; }
+inline bool IsGeneratedId(const rapidjson::Value& name) {
+  return NameOf(name) == HoxConfigManager::DocumentShape::kGeneratedId;
+}
 
 inline std::uint64_t Mix(std::uint64_t x) {
   x += 0x9e3779b97f4a7c15ULL;

@@ -1,6 +1,8 @@
-// Document utilities that depend on the host: its identity, its
-// maintenance-mode state, and documents built from configuration-store rows.
+// Documents built from configuration-store rows, and the boot document
+// reduced to this host.
 #include <hoxcm/documents.h>
+#include <hoxcm/extraction.h>
+#include <hoxcm/host_documents.h>
 
 #include <algorithm>
 #include <string>
@@ -9,55 +11,27 @@
 #include <hoxcm/host.h>
 #include <hoxcm/schema_store.h>
 
+#include "extraction/extraction_internal.h"
+
 namespace HoxConfigManager {
 namespace {
 
+namespace RowColumn = HoxConfigStore::RowColumn;
+
+using detail::Column;
 using HoxConfigStore::ConfigMap;
 using HoxConfigStore::ConfigMapList;
-
-constexpr const char* kGeneratedIdMember = "cs_generated_id";
-
-// The column of a row, empty when the row lacks it.
-const std::string& Column(const ConfigMap& row, const char* name) {
-  static const std::string kEmpty;
-  auto it = row.find(name);
-  return it == row.end() ? kEmpty : it->second;
-}
 
 // Parses one row's "Value" into a value allocated in `doc`.
 Value ParseRowValue(const ConfigMap& row, Document& doc) {
   Document parsed(&doc.GetAllocator());
-  ParseDocument(Column(row, "Value"), parsed);
+  ParseDocument(Column(row, RowColumn::kValue), parsed);
   Value value;
   value.Swap(parsed);
   return value;
 }
 
 }  // namespace
-
-std::string GetBIOSUUID() {
-  return HoxConfigStore::ConfigStoreDocument::NormalizeHostId(HostCtl::Host::GetHardwareInfo().biosUuid);
-}
-
-void CreateMergedDocument(const Document& source, Document& result) {
-  HoxConfigStore::ConfigStoreDocument::GetDocumentForHost(source, result, GetBIOSUUID());
-}
-
-bool IsMaintenanceModeEnabled() {
-  CSLogger::Log(CSLogger::kInfo, "Checking if host is in maintenanceMode");
-  // A host whose state cannot be read is treated as not in maintenance mode:
-  // callers then refuse the changes that need it instead of applying them.
-  if (VSI_CheckSig() != 0) {
-    CSLogger::Log(CSLogger::kError, "Kernel interface signature check failed; assuming no maintenance mode");
-    return false;
-  }
-  bool enabled = false;
-  if (const int rc = VSI_Get("maintenanceMode", &enabled); rc != 0) {
-    CSLogger::Log(CSLogger::kError, "Failed to read the maintenance mode state, error=%d", rc);
-    return false;
-  }
-  return enabled;
-}
 
 void CreateDocumentFromMap(const ConfigMapList& rows, const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema,
                            Document& doc) {
@@ -81,7 +55,7 @@ void CreateDocumentFromMap(const ConfigMapList& rows, const std::shared_ptr<HoxS
 ConfigMapList FilterSolutionUserInstances(const ConfigMapList& rows,
                                           const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema) {
   RAPIDJSON_ASSERT(schema != nullptr);
-  if (rows.empty() || !schema->IsMultiInstance() || schema->GetIdentityMember() == kGeneratedIdMember) {
+  if (rows.empty() || !schema->IsMultiInstance() || schema->GetIdentityMember() == DocumentShape::kGeneratedId) {
     return rows;
   }
   const std::vector<std::string>& solutionUsers = schema->GetSolutionUserNames();
@@ -90,7 +64,7 @@ ConfigMapList FilterSolutionUserInstances(const ConfigMapList& rows,
   kept.reserve(rows.size());
   for (const auto& row : rows) {
     RAPIDJSON_ASSERT(row != nullptr);
-    const std::string& id = Column(*row, "Identifier");
+    const std::string& id = Column(*row, RowColumn::kIdentifier);
     if (std::find(solutionUsers.begin(), solutionUsers.end(), id) == solutionUsers.end()) kept.push_back(row);
   }
   return kept;
