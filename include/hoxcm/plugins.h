@@ -234,7 +234,6 @@ class HOXCM_API PluginLauncher {
 
  private:
   PluginRequest request;
-  Document result;
   std::string id;
   std::string operation;
   std::string type;

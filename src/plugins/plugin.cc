@@ -1,5 +1,5 @@
 // Plugin: identity and capabilities of one installed plugin, read from its
-// manifest. Its runs (Apply, Impact, Validate) are in plugin_launcher.cc.
+// manifest. Its runs (Apply, Impact, Validate) are in plugin_runner.cc.
 #include <boost/algorithm/string.hpp>
 
 #include <hoxcm/documents.h>

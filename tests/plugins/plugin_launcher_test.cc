@@ -9,6 +9,7 @@
 #include <thread>
 
 #include "plugins/plugin_fixture.h"
+#include "plugins/plugin_runner.h"
 
 namespace hoxcm_test {
 namespace {
@@ -139,6 +140,15 @@ TEST_F(PluginRunTest, AnAbortEndsTheRunWhetherTheRunnerSleepsOrHasExited) {
   EXPECT_EQ(error.args, std::vector<std::string>{"t"});
   EXPECT_TRUE(std::filesystem::exists(root.Path("/started")));
 
+  // A runner that ignores SIGTERM is waited for until it ends by itself:
+  // killing it could leave the host half-configured.
+  Runner("trap '' TERM; /bin/sleep 1.5; touch \"$root/outlived\"");
+  EXPECT_EQ(Apply(std::make_shared<Monitor>([deadline = Clock::now() + std::chrono::milliseconds(200)] {
+              return Clock::now() >= deadline;
+            })).id,
+            kApplyAborted);
+  EXPECT_TRUE(std::filesystem::exists(root.Path("/outlived")));
+
   // An abort said only to the calling thread: the run's monitor thread never
   // sees it and the runner succeeds; the judgement after reaping does.
   Runner("touch \"$root/finished\"; " + std::string(kSuccess));
@@ -178,6 +188,12 @@ echo "start $id" >> "$root/log"; /bin/sleep 0.3; echo "end $id" >> "$root/log")s
   EXPECT_TRUE(log == "start child\nend child\nstart parent\nend parent\n" ||
               log == "start parent\nend parent\nstart child\nend child\n")
       << log;
+
+  // A caller holding the host lock runs its plugins under it: they do not
+  // wait for the lock they are given.
+  const HoxPlatform::HostRunLock held = LaunchingRunner::LockHost();
+  LaunchingRunner underLock(held);
+  EXPECT_EQ(underLock.Apply(*plugin_, inputs_, "", std::make_shared<Monitor>()), ErrorInfo());
 }
 
 }  // namespace

@@ -3,8 +3,6 @@
 // plugins end to end: the apply tasks of a changed document, grouped per
 // plugin and run in the registry's order, leave the host compliant with
 // that document and its files rewritten.
-#include <sys/wait.h>
-
 #include <cerrno>
 #include <unordered_map>
 
@@ -12,7 +10,7 @@
 #include <hoxcm/extraction.h>
 #include <hoxcm/host_documents.h>
 
-#include "platform/process/process.h"
+#include "platform/process/child_process.h"
 #include "plugins/plugin_fixture.h"
 
 namespace hoxcm_test {
@@ -141,11 +139,12 @@ TEST_P(RunnerConformanceTest, ABadRequestEndsTheRunnerWithInvalidArgument) {
         R"({"type":"APPLY","key":7)" + module + "}"}) {
     std::filesystem::remove(root.Path("/var/tarvik/lifecycle/cm-plugin-input.json"));
     if (request != "-") root.WriteFile("/var/tarvik/lifecycle/cm-plugin-input.json", request);
-    int error = 0, status = 0;
-    const pid_t pid = HoxPlatform::SpawnClean(runner, {runner}, &error);
-    ASSERT_GT(pid, 0) << error;
-    ASSERT_EQ(HoxPlatform::WaitForExit(pid, &status), 0);
-    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == EINVAL) << request << " status " << status;
+    int error = 0;
+    HoxPlatform::ChildProcess child = HoxPlatform::ChildProcess::Spawn(runner, {runner}, &error);
+    ASSERT_TRUE(child) << error;
+    HoxPlatform::ExitStatus status;
+    ASSERT_EQ(child.Wait(&status), 0);
+    EXPECT_TRUE(!status.signalled && status.code == EINVAL) << request << " status " << status.code;
   }
 }
 

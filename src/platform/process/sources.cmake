@@ -1,4 +1,5 @@
-# Runner processes and the host run lock.
+# Child processes and the host run lock.
 list(APPEND HOXCM_SOURCES
+  src/platform/process/child_process.cc
   src/platform/process/process.cc
 )

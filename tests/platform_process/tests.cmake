@@ -1,0 +1,1 @@
+hoxcm_add_test(platform_process_test platform_process/child_process_test.cc)
