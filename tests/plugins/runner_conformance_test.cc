@@ -1,10 +1,9 @@
 // One suite, run against both runners: the same plugin written for each
 // interface must give the same results, failures included. Then the sample
-// plugins end to end: the apply tasks of a changed document, grouped per
-// plugin and run in the registry's order, leave the host compliant with
-// that document and its files rewritten.
+// plugins end to end: remediating the host to a changed document runs them
+// in the registry's order and leaves the host compliant with that document
+// and its files rewritten.
 #include <cerrno>
-#include <unordered_map>
 
 #include <hoxcm/drift.h>
 #include <hoxcm/extraction.h>
@@ -12,6 +11,7 @@
 
 #include "platform/process/child_process.h"
 #include "plugins/plugin_fixture.h"
+#include "workflow/remediation.h"
 
 namespace hoxcm_test {
 namespace {
@@ -206,25 +206,15 @@ TEST_F(SamplePluginsTest, ApplyingADocumentMakesTheHostCompliantAndWritesItsFile
   CheckCompliance(check, before);
   ASSERT_FALSE(before.compliant);
 
-  // What the apply operation does with its tasks, reduced to the plugin
-  // framework's part: one group per "<action>:<plugin id>", run in the
-  // registry's order.
-  PluginManager manager(APPLY);
-  std::unordered_map<std::string, TaskMap> groups;
-  for (const DesiredConfigInput& task : GenerateApplyTasks(desired)) {
-    const auto owners = manager.Find(task.object->GetConfigStoreObjectId());
-    ASSERT_EQ(owners.size(), 1u) << task.object->GetConfigStoreObjectId().toString();
-    const std::string key = (owners[0]->GetVersion() == 3 ? "REMEDIATE" : task.action) + ":" + owners[0]->GetId();
-    groups.try_emplace(key, TaskMap{owners[0], {}}).first->second.inputs.push_back(task);
-  }
-  std::size_t ran = 0;
-  for (const std::string& name : manager.GetDependencies()) {
-    const auto group = groups.find(name);
-    if (group == groups.end()) continue;
-    EXPECT_EQ(group->second.plugin->Apply(group->second.inputs, "", PluginMonitor::Dummy()), ErrorInfo()) << name;
-    ++ran;
-  }
-  EXPECT_EQ(ran, groups.size()) << "a group is missing from the order";
+  // Every task has a plugin and every group a place in the registry's order.
+  PluginManager registry(APPLY);
+  Document copy;
+  copy.CopyFrom(desired, copy.GetAllocator());
+  const RemediationPlan plan =
+      PlanRemediation(GenerateApplyTasks(copy), RegistryOwners(registry), registry.GetDependencies(), false);
+  EXPECT_TRUE(plan.unowned.empty() && plan.unscheduled.empty() && plan.bootSkipped.empty());
+  EXPECT_GT(plan.groups.size(), 2u);
+  EXPECT_EQ(RemediateHost(desired, "", TaskHandle::Dummy(), false), ErrorInfo());
 
   ComplianceResult after;
   check.CopyFrom(desired, check.GetAllocator());

@@ -1,0 +1,68 @@
+#include "workflow/remediation_plan.h"
+
+#include <unordered_map>
+
+#include <hoxcm/host.h>
+
+namespace HoxConfigManager {
+
+OwnerLookup RegistryOwners(PluginManager& registry) {
+  return [&registry](const HoxConfigStore::ConfigStoreObjectId& id) {
+    std::vector<PlanOwner> owners;
+    for (const std::shared_ptr<Plugin>& plugin : registry.Find(id)) {
+      if (!plugin) continue;
+      owners.push_back({plugin, plugin->GetId(), plugin->GetVersion(), plugin->CheckType(APPLY_BOOT)});
+    }
+    return owners;
+  };
+}
+
+RemediationPlan PlanRemediation(const std::vector<DesiredConfigInput>& tasks, const OwnerLookup& owners,
+                                const std::vector<std::string>& order, bool boot) {
+  RemediationPlan plan;
+  std::vector<RemediationGroup> groups;  // in the order of their first task
+  std::unordered_map<std::string, std::size_t> byKey;
+  for (const DesiredConfigInput& task : tasks) {
+    const HoxConfigStore::ConfigStoreObjectId& id = task.object->GetConfigStoreObjectId();
+    const std::string csoid = id.toString();
+    const std::vector<PlanOwner> found = owners(id);
+    if (found.empty()) {
+      CSLogger::Log(CSLogger::kWarning, "Plugin not present for %s", csoid.c_str());
+      plan.unowned.push_back(task);
+      continue;
+    }
+    for (const PlanOwner& owner : found) {
+      if (boot && !owner.bootCapable) {
+        CSLogger::Log(CSLogger::kError, "Plugin=%s does not support boot-time remediation for csoid=%s",
+                      owner.id.c_str(), csoid.c_str());
+        plan.bootSkipped.push_back({owner.id, task});
+        continue;
+      }
+      CSLogger::Log(CSLogger::kDetail, "Found plugin=%s for cso=%s", owner.id.c_str(), csoid.c_str());
+      const std::string key = (owner.version == 3 ? std::string("REMEDIATE") : task.action) + ":" + owner.id;
+      CSLogger::Log(CSLogger::kDetail, "Adding key=%s for plugin=%s", key.c_str(), owner.id.c_str());
+      const auto [it, added] = byKey.try_emplace(key, groups.size());
+      // A later plugin with the same id joins the first one's group.
+      if (added) groups.push_back({key, owner.plugin, owner.id, {}});
+      groups[it->second].inputs.push_back(task);
+    }
+  }
+
+  std::vector<bool> scheduled(groups.size(), false);
+  std::size_t afterLast = 0;  // entries of the order after the last group
+  for (const std::string& entry : order) {
+    ++afterLast;
+    const auto it = byKey.find(entry);
+    if (it == byKey.end() || scheduled[it->second]) continue;
+    scheduled[it->second] = true;
+    plan.groups.push_back(std::move(groups[it->second]));
+    afterLast = 0;
+  }
+  plan.abortCheckAfterLast = afterLast > 0;
+  for (std::size_t i = 0; i < groups.size(); ++i) {
+    if (!scheduled[i]) plan.unscheduled.push_back(std::move(groups[i]));
+  }
+  return plan;
+}
+
+}  // namespace HoxConfigManager

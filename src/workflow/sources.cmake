@@ -1,0 +1,5 @@
+# The workflow operations built on the drift engine and the plugin framework.
+list(APPEND HOXCM_SOURCES
+  src/workflow/remediation.cc
+  src/workflow/remediation_plan.cc
+)

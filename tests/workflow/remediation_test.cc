@@ -1,0 +1,140 @@
+// Running a remediation plan with a scripted runner: order, progress,
+// notifications, failures and aborts, without processes. The plugins are
+// real (small manifests in a temporary root); their runs are not.
+#include <algorithm>
+#include <cstdlib>
+
+#include "plugins/plugin_fixture.h"
+#include "support/fake_plugin_runner.h"
+#include "workflow/remediation.h"
+
+namespace hoxcm_test {
+namespace {
+
+using namespace HoxConfigManager;
+
+constexpr const char* kStarted = "info com.tarvik.hox.settings.apply.plugin.started ";
+constexpr const char* kFinished = "info com.tarvik.hox.settings.apply.plugin.finished ";
+constexpr const char* kAborted = "com.tarvik.hox.settings.apply.plugin.aborted";
+
+std::string Progress(float value) { return "progress " + std::to_string(value); }
+
+class RemediationTest : public PluginTest {
+ protected:
+  RemediationTest() : task_(std::make_shared<RecordingTask>()) {
+    for (const char* id : {"a", "b", "c"}) {
+      auto plugin = std::make_shared<Plugin>(
+          Manifest(std::string(id) + "/plugin.json",
+                   V3Manifest("python", {"network:dns:config"}, "network", std::string("REMEDIATE:") + id, {}))
+              .c_str());
+      plan_.groups.push_back({std::string("REMEDIATE:") + id, plugin, id, {Input(), Input()}});
+    }
+  }
+  static DesiredConfigInput Input() { return {Object({"network", "dns", "config"}, "{}"), nullptr, "SET"}; }
+  RemediationOutcome Run() { return RunRemediation(plan_, runner_, "ctx", task_); }
+
+  RemediationPlan plan_;
+  FakePluginRunner runner_;
+  std::shared_ptr<RecordingTask> task_;
+};
+
+TEST_F(RemediationTest, RunsEachGroupInOrderAndSharesEightyPercentAmongAllGroups) {
+  // Given three groups of which the last never runs, the two that run
+  // advance the progress by a third of 80 each.
+  plan_.unscheduled.push_back(plan_.groups.back());
+  plan_.groups.pop_back();
+  plan_.groups[1].inputs.pop_back();
+  ::setenv("HOX_LOG_LEVEL", "3", 1);
+  testing::internal::CaptureStderr();
+  const RemediationOutcome outcome = Run();
+  const std::string log = testing::internal::GetCapturedStderr();
+  ::unsetenv("HOX_LOG_LEVEL");
+
+  EXPECT_EQ(outcome.error, ErrorInfo());
+  const float step = 80.0f / 3;
+  EXPECT_EQ(task_->Events(), (std::vector<std::string>{Progress(20), kStarted + std::string("a"),
+                                                        Progress(20 + step), kFinished + std::string("a"),
+                                                        kStarted + std::string("b"), Progress(20 + step + step),
+                                                        kFinished + std::string("b")}));
+  ASSERT_EQ(runner_.calls.size(), 2u);
+  EXPECT_EQ(runner_.calls[1].inputs.size(), 1u);
+  EXPECT_EQ(runner_.calls[1].clusterContext + " " + runner_.calls[1].taskId, "ctx task-1");
+  ASSERT_EQ(outcome.runs.size(), 2u);
+  EXPECT_EQ(outcome.runs[0].key + " " + outcome.runs[0].pluginId, "REMEDIATE:a a");
+  EXPECT_EQ(outcome.runs[0].inputCount, 2u);
+  EXPECT_EQ(outcome.runs[1].inputCount, 1u);
+  for (const char* line : {"detail: Found match for dependency REMEDIATE:a\n",
+                           "detail: Found match for dependency REMEDIATE:b\n",
+                           "detail: HOXi host remediated successfully.\n"}) {
+    EXPECT_NE(log.find(line), std::string::npos) << line << log;
+  }
+}
+
+TEST_F(RemediationTest, TheFirstFailingPluginStopsTheRunAndIsPosted) {
+  const ErrorInfo failure("b.failed", {"b"}, "disk full");
+  runner_.apply["b"] = failure;
+  ::setenv("HOX_LOG_LEVEL", "0", 1);
+  testing::internal::CaptureStderr();
+  const RemediationOutcome outcome = Run();
+  const std::string log = testing::internal::GetCapturedStderr();
+  ::unsetenv("HOX_LOG_LEVEL");
+
+  EXPECT_EQ(outcome.error, failure);
+  EXPECT_EQ(runner_.CalledIds(), (std::vector<std::string>{"a", "b"}));
+  const std::vector<std::string> events = task_->Events();
+  EXPECT_EQ(std::vector<std::string>(events.end() - 2, events.end()),
+            (std::vector<std::string>{kStarted + std::string("b"), "error b.failed b"}));
+  ASSERT_EQ(outcome.runs.size(), 2u);
+  EXPECT_EQ(outcome.runs[1].outcome, failure);
+  EXPECT_NE(log.find("error: b plugin failed to execute.\n"), std::string::npos) << log;
+}
+
+TEST_F(RemediationTest, AnAbortIsSeenBeforeEachGroupAndAfterTheLastWhenTheOrderGoesOn) {
+  struct Case {
+    const char* abortDuring;  // "" aborts before the run
+    bool checkAfterLast;
+    std::vector<std::string> ran;
+    bool aborted;
+  } cases[] = {
+      {"", false, {}, true},
+      {"a", false, {"a"}, true},
+      {"c", true, {"a", "b", "c"}, true},
+      {"c", false, {"a", "b", "c"}, false},
+  };
+  for (const Case& c : cases) {
+    runner_.calls.clear();
+    task_->aborted = *c.abortDuring == '\0';
+    runner_.during = [this, &c](const FakePluginRunner::Call& call) {
+      if (call.pluginId == c.abortDuring) task_->aborted = true;
+    };
+    plan_.abortCheckAfterLast = c.checkAfterLast;
+    const RemediationOutcome outcome = Run();
+    EXPECT_EQ(runner_.CalledIds(), c.ran) << c.abortDuring;
+    EXPECT_EQ(outcome.error, c.aborted ? ErrorInfo(kAborted, {}, "") : ErrorInfo()) << c.abortDuring;
+  }
+}
+
+TEST_F(RemediationTest, RemediateHostPlansOverTheApplyRegistry) {
+  // Given a plugin that cannot run at boot time beside one that can.
+  std::string noBoot = V3Manifest("python", {"system:identity:hostname"}, "system", "REMEDIATE:h", {});
+  noBoot.replace(noBoot.find("\"boot\":true"), 11, "\"boot\":false");
+  Manifest("h/plugin.json", noBoot);
+  Document boot;
+  ParseDocument(R"({"network":{"dns":{"config":{"servers":[]}}},"system":{"identity":{"hostname":{}}}})", boot);
+  EXPECT_EQ(RemediateHost(boot, "ctx", task_, true, runner_), ErrorInfo());
+  std::vector<std::string> ran = runner_.CalledIds();
+  std::sort(ran.begin(), ran.end());
+  EXPECT_EQ(ran, (std::vector<std::string>{"a", "b", "c"}));
+
+  // A document without tasks loads no plugin: a broken manifest stays unread.
+  Manifest("broken/plugin.json", "{");
+  runner_.calls.clear();
+  Document empty;
+  ParseDocument("{}", empty);
+  EXPECT_EQ(RemediateHost(empty, "", task_, true, runner_), ErrorInfo());
+  EXPECT_TRUE(runner_.calls.empty());
+  EXPECT_ANY_THROW(RemediateHost(boot, "", task_, true, runner_));
+}
+
+}  // namespace
+}  // namespace hoxcm_test
