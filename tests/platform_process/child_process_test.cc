@@ -5,6 +5,7 @@
 #include <sys/wait.h>
 
 #include <stdexcept>
+#include <tuple>
 
 #include <gtest/gtest.h>
 
@@ -17,58 +18,47 @@ using HoxPlatform::ExitStatus;
 
 ChildProcess Shell(const std::string& script) {
   int error = 0;
-  ChildProcess child = ChildProcess::Spawn("/bin/sh", {"sh", "-c", script}, &error);
-  EXPECT_TRUE(child) << error;
-  return child;
+  return ChildProcess::Spawn("/bin/sh", {"sh", "-c", script}, &error);
 }
 
-// True when `pid` is no child of ours any more: reaped, not a zombie.
+// No child of ours any more: reaped, not a zombie.
 bool Reaped(int pid) { return ::waitpid(pid, nullptr, WNOHANG) < 0 && errno == ECHILD; }
 
 TEST(ChildProcessTest, WaitTellsAnExitCodeFromASignal) {
-  const struct {
-    const char* script;
-    bool signalled;
-    int code;
-  } cases[] = {{"exit 0", false, 0}, {"exit 71", false, 71}, {"kill -9 $$", true, SIGKILL}, {"kill $$", true, SIGTERM}};
-  for (const auto& c : cases) {
-    ChildProcess child = Shell(c.script);
+  const std::tuple<const char*, bool, int> cases[] = {
+      {"exit 0", false, 0}, {"exit 71", false, 71}, {"kill -9 $$", true, SIGKILL}, {"kill $$", true, SIGTERM}};
+  for (const auto& [script, signalled, code] : cases) {
+    ChildProcess child = Shell(script);
     const int pid = child.pid();
     ExitStatus status;
-    ASSERT_EQ(child.Wait(&status), 0) << c.script;
-    EXPECT_EQ(status.signalled, c.signalled) << c.script;
-    EXPECT_EQ(status.code, c.code) << c.script;
-    EXPECT_EQ(status.Succeeded(), c.code == 0) << c.script;
-    EXPECT_FALSE(child);
-    EXPECT_TRUE(Reaped(pid));
+    ASSERT_EQ(child.Wait(&status), 0) << script;
+    EXPECT_EQ(status.signalled, signalled) << script;
+    EXPECT_EQ(status.code, code) << script;
+    EXPECT_EQ(status.Succeeded(), code == 0) << script;
+    EXPECT_TRUE(!child && Reaped(pid)) << script;
   }
 }
 
 TEST(ChildProcessTest, EveryWayOutOfScopeReapsTheChildOnce) {
-  // A child still running when its owner goes away is waited for.
-  int pid = 0;
+  int running = 0, unwound = 0;
   {
-    ChildProcess child = Shell("sleep 0.2");
-    pid = child.pid();
+    ChildProcess child = Shell("sleep 0.2");  // still running when its owner goes
+    running = child.pid();
   }
-  EXPECT_TRUE(Reaped(pid));
-
-  // So is one whose owner is left by an exception.
   try {
     ChildProcess child = Shell("exit 3");
-    pid = child.pid();
+    unwound = child.pid();
     throw std::runtime_error("unwound");
   } catch (const std::runtime_error&) {
   }
-  EXPECT_TRUE(Reaped(pid));
+  EXPECT_TRUE(Reaped(running) && Reaped(unwound));
 
-  // Moving hands the child over: the moved-from object owns nothing, and
-  // an owner that is assigned another child reaps its own first.
+  // Moving hands the child over; an owner assigned another child reaps its
+  // own first; a reaped child cannot be waited for or signalled again.
   ChildProcess first = Shell("exit 0");
   const int firstPid = first.pid();
   ChildProcess second = std::move(first);
-  EXPECT_FALSE(first);
-  EXPECT_EQ(second.pid(), firstPid);
+  EXPECT_TRUE(!first && second.pid() == firstPid);
   second = Shell("exit 0");
   EXPECT_TRUE(Reaped(firstPid));
   ExitStatus status;
@@ -76,7 +66,6 @@ TEST(ChildProcessTest, EveryWayOutOfScopeReapsTheChildOnce) {
   EXPECT_EQ(second.Wait(&status), ECHILD);
   EXPECT_EQ(second.Signal(SIGTERM), ESRCH);
 
-  // A program that cannot be started gives an empty child and the reason.
   int error = 0;
   EXPECT_FALSE(ChildProcess::Spawn("/nonexistent/runner", {"runner"}, &error));
   EXPECT_EQ(error, ENOENT);

@@ -1,12 +1,12 @@
 // Remediation planning as a function of tasks, owners and order: no
 // manifest, no process.
-#include <cstdlib>
 #include <map>
 
 #include <gtest/gtest.h>
 
 #include <hoxcm/documents.h>
 
+#include "support/log_capture.h"
 #include "workflow/remediation_plan.h"
 
 namespace hoxcm_test {
@@ -97,11 +97,8 @@ TEST(RemediationPlanTest, GroupsPerPluginKeyInTheRegistrysOrder) {
 }
 
 TEST(RemediationPlanTest, LogsEachFindingAtItsPriority) {
-  ::setenv("HOX_LOG_LEVEL", "3", 1);
-  testing::internal::CaptureStderr();
-  PlanRemediation({Task("x/y/z SET"), Task("sys/ntp/cfg ADD")}, Owners, kOrder, true);
-  const std::string log = testing::internal::GetCapturedStderr();
-  ::unsetenv("HOX_LOG_LEVEL");
+  const std::string log =
+      LogOf("3", [] { PlanRemediation({Task("x/y/z SET"), Task("sys/ntp/cfg ADD")}, Owners, kOrder, true); });
   for (const char* line : {"warning: Plugin not present for comp x grp y key z\n",
                            "detail: Found plugin=ntp for cso=comp sys grp ntp key cfg\n",
                            "detail: Adding key=ADD:ntp for plugin=ntp\n",

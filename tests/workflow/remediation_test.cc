@@ -2,10 +2,10 @@
 // notifications, failures and aborts, without processes. The plugins are
 // real (small manifests in a temporary root); their runs are not.
 #include <algorithm>
-#include <cstdlib>
 
 #include "plugins/plugin_fixture.h"
 #include "support/fake_plugin_runner.h"
+#include "support/log_capture.h"
 #include "workflow/remediation.h"
 
 namespace hoxcm_test {
@@ -13,8 +13,8 @@ namespace {
 
 using namespace HoxConfigManager;
 
-constexpr const char* kStarted = "info com.tarvik.hox.settings.apply.plugin.started ";
-constexpr const char* kFinished = "info com.tarvik.hox.settings.apply.plugin.finished ";
+const std::string kStarted = "info com.tarvik.hox.settings.apply.plugin.started ";
+const std::string kFinished = "info com.tarvik.hox.settings.apply.plugin.finished ";
 constexpr const char* kAborted = "com.tarvik.hox.settings.apply.plugin.aborted";
 
 std::string Progress(float value) { return "progress " + std::to_string(value); }
@@ -44,25 +44,21 @@ TEST_F(RemediationTest, RunsEachGroupInOrderAndSharesEightyPercentAmongAllGroups
   plan_.unscheduled.push_back(plan_.groups.back());
   plan_.groups.pop_back();
   plan_.groups[1].inputs.pop_back();
-  ::setenv("HOX_LOG_LEVEL", "3", 1);
-  testing::internal::CaptureStderr();
-  const RemediationOutcome outcome = Run();
-  const std::string log = testing::internal::GetCapturedStderr();
-  ::unsetenv("HOX_LOG_LEVEL");
+  RemediationOutcome outcome;
+  const std::string log = LogOf("3", [&] { outcome = Run(); });
 
   EXPECT_EQ(outcome.error, ErrorInfo());
   const float step = 80.0f / 3;
-  EXPECT_EQ(task_->Events(), (std::vector<std::string>{Progress(20), kStarted + std::string("a"),
-                                                        Progress(20 + step), kFinished + std::string("a"),
-                                                        kStarted + std::string("b"), Progress(20 + step + step),
-                                                        kFinished + std::string("b")}));
+  EXPECT_EQ(task_->Events(), (std::vector<std::string>{Progress(20), kStarted + "a", Progress(20 + step),
+                                                        kFinished + "a", kStarted + "b", Progress(20 + step + step),
+                                                        kFinished + "b"}));
   ASSERT_EQ(runner_.calls.size(), 2u);
   EXPECT_EQ(runner_.calls[1].inputs.size(), 1u);
-  EXPECT_EQ(runner_.calls[1].clusterContext + " " + runner_.calls[1].taskId, "ctx task-1");
+  EXPECT_EQ(runner_.calls[1].context + " " + runner_.calls[1].taskId, "ctx task-1");
   ASSERT_EQ(outcome.runs.size(), 2u);
-  EXPECT_EQ(outcome.runs[0].key + " " + outcome.runs[0].pluginId, "REMEDIATE:a a");
-  EXPECT_EQ(outcome.runs[0].inputCount, 2u);
-  EXPECT_EQ(outcome.runs[1].inputCount, 1u);
+  EXPECT_EQ(outcome.runs[0].key + " " + outcome.runs[0].pluginId + " " + std::to_string(outcome.runs[0].inputCount) +
+                " " + std::to_string(outcome.runs[1].inputCount),
+            "REMEDIATE:a a 2 1");
   for (const char* line : {"detail: Found match for dependency REMEDIATE:a\n",
                            "detail: Found match for dependency REMEDIATE:b\n",
                            "detail: HOXi host remediated successfully.\n"}) {
@@ -73,17 +69,14 @@ TEST_F(RemediationTest, RunsEachGroupInOrderAndSharesEightyPercentAmongAllGroups
 TEST_F(RemediationTest, TheFirstFailingPluginStopsTheRunAndIsPosted) {
   const ErrorInfo failure("b.failed", {"b"}, "disk full");
   runner_.apply["b"] = failure;
-  ::setenv("HOX_LOG_LEVEL", "0", 1);
-  testing::internal::CaptureStderr();
-  const RemediationOutcome outcome = Run();
-  const std::string log = testing::internal::GetCapturedStderr();
-  ::unsetenv("HOX_LOG_LEVEL");
+  RemediationOutcome outcome;
+  const std::string log = LogOf("0", [&] { outcome = Run(); });
 
   EXPECT_EQ(outcome.error, failure);
   EXPECT_EQ(runner_.CalledIds(), (std::vector<std::string>{"a", "b"}));
   const std::vector<std::string> events = task_->Events();
   EXPECT_EQ(std::vector<std::string>(events.end() - 2, events.end()),
-            (std::vector<std::string>{kStarted + std::string("b"), "error b.failed b"}));
+            (std::vector<std::string>{kStarted + "b", "error b.failed b"}));
   ASSERT_EQ(outcome.runs.size(), 2u);
   EXPECT_EQ(outcome.runs[1].outcome, failure);
   EXPECT_NE(log.find("error: b plugin failed to execute.\n"), std::string::npos) << log;
