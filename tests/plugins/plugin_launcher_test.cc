@@ -8,6 +8,8 @@
 #include <chrono>
 #include <thread>
 
+#include <hoxcm/host.h>
+
 #include "plugins/plugin_fixture.h"
 #include "plugins/plugin_runner.h"
 
@@ -48,7 +50,7 @@ class PluginRunTest : public PluginTest {
   // Installs a shell script as the script runner. `body` runs with $root
   // set to the root and $out to the result file.
   void Runner(const std::string& body) {
-    const std::string path = "/usr/lib/tarvik/configmanager/bin/py_plugin_runner";
+    const std::string path(HoxPlatform::HostPaths::kPythonRunner);
     root.WriteFile(path, "#!/bin/sh\nroot=\"${0%/usr/lib/tarvik/configmanager/bin/*}\"\n"
                          "out=\"$root/var/tarvik/lifecycle/cm-plugin-output.json\"\n" +
                              body + "\n");
@@ -101,7 +103,7 @@ TEST_F(PluginRunTest, RunnerFailuresBecomeUnexpectedErrors) {
   };
   for (const auto& [body, message] : cases) {
     // A result left by an earlier run must never be taken for this run's.
-    root.WriteFile("/var/tarvik/lifecycle/cm-plugin-output.json", R"({"id":"","args":[],"message":""})");
+    root.WriteFile(std::string(HoxPlatform::HostPaths::kResultFile), R"({"id":"","args":[],"message":""})");
     Runner(body);
     const ErrorInfo error = Apply();
     EXPECT_EQ(error.id, kApplyUnexpected) << body;
@@ -116,7 +118,7 @@ TEST_F(PluginRunTest, RunnerFailuresBecomeUnexpectedErrors) {
                   })));
   EXPECT_EQ(unanswered.id, kApplyUnexpected);
 
-  std::filesystem::remove(root.Path("/usr/lib/tarvik/configmanager/bin/py_plugin_runner"));
+  std::filesystem::remove(root.Path(std::string(HoxPlatform::HostPaths::kPythonRunner)));
   EXPECT_EQ(Apply().message, "Failed to fork plugin runner. No such file or directory");
 
   // Impact and validation results are checked just as strictly.

@@ -7,6 +7,7 @@
 
 #include <hoxcm/drift.h>
 #include <hoxcm/extraction.h>
+#include <hoxcm/host.h>
 #include <hoxcm/host_documents.h>
 
 #include "platform/process/child_process.h"
@@ -129,16 +130,18 @@ TEST_P(RunnerConformanceTest, ImpactAndValidationResults) {
 }
 
 TEST_P(RunnerConformanceTest, ABadRequestEndsTheRunnerWithInvalidArgument) {
-  const std::string runner = root.Path(std::string("/usr/lib/tarvik/configmanager/bin/") +
-                                       (GetParam() == "c++" ? "cpp_plugin_runner" : "py_plugin_runner"));
+  namespace HostPaths = HoxPlatform::HostPaths;
+  const std::string runner =
+      root.Path(std::string(GetParam() == "c++" ? HostPaths::kCppRunner : HostPaths::kPythonRunner));
+  const std::string requestFile(HostPaths::kRequestFile);
   const std::string module = R"(,"module":"libconformance.so")";
   for (const std::string& request :
        {std::string("-"), std::string("[]"), std::string("{\"type\":\"APPLY\""),
         R"({"type":["APPLY"],"key":"conformance")" + module + "}",
         R"({"type":"APPLY","key":"conformance/../../..")" + module + "}",
         R"({"type":"APPLY","key":7)" + module + "}"}) {
-    std::filesystem::remove(root.Path("/var/tarvik/lifecycle/cm-plugin-input.json"));
-    if (request != "-") root.WriteFile("/var/tarvik/lifecycle/cm-plugin-input.json", request);
+    std::filesystem::remove(root.Path(requestFile));
+    if (request != "-") root.WriteFile(requestFile, request);
     int error = 0;
     HoxPlatform::ChildProcess child = HoxPlatform::ChildProcess::Spawn(runner, {runner}, &error);
     ASSERT_TRUE(child) << error;
