@@ -14,6 +14,7 @@
 #include <memory>
 #include <string>
 #include <type_traits>
+#include <utility>
 #include <unordered_map>
 #include <vector>
 
@@ -27,15 +28,32 @@ HOXCM_API char* Str_Vasprintf(std::size_t* length, const char* format, va_list a
 
 namespace HostCtl::Lib {
 
-// Base of every platform and library exception: carries the message text.
+// Where the fault behind an exception lies, when the thrower knows it. It
+// travels beside the code and the message and never changes them, so that a
+// front end can say "file:line:column" or "file: /document/path".
+struct HOXCM_API ErrorLocation {
+  std::string file;          // the file that was read; empty when the text came from elsewhere
+  std::size_t offset = 0;    // byte offset of the fault in the text
+  std::size_t line = 0;      // 1-based line of the fault; 0 when not known
+  std::size_t column = 0;    // 1-based column on that line, in characters
+  std::string reason;        // the parser's reason, or the system's for a file that cannot be read
+  std::string documentPath;  // the faulty value's place in the document ("/network/dns/config"); may be empty
+};
+
+// Base of every platform and library exception: carries the message text and,
+// optionally, the location of the fault.
 class HOXCM_API HostCtlException : public std::exception {
  public:
   explicit HostCtlException(const char* message);
   explicit HostCtlException(std::string message);
   const char* what() const noexcept override;
+  // Null unless the thrower attached a location.
+  const ErrorLocation* GetLocation() const noexcept { return location_.get(); }
+  void SetLocation(ErrorLocation location);
 
  private:
   std::string message_;
+  std::shared_ptr<const ErrorLocation> location_;  // shared: copies of a thrown exception stay cheap
 };
 
 }  // namespace HostCtl::Lib
@@ -122,18 +140,36 @@ struct FreeDeleter {
 };
 }  // namespace detail
 
-// Throws T(code, formatted message). An unknown code is a programming error
-// and raises std::out_of_range instead.
+using HostCtl::Lib::ErrorLocation;
+
+namespace detail {
+// T(code, formatted message); an unknown code raises std::out_of_range.
 template <typename T, typename... Args>
-[[noreturn]] void ThrowException(CMErrorCodes code, const Args&... args) {
+T MakeException(CMErrorCodes code, const Args&... args) {
   const char* format = ErrorMessageTable().at(code);
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wformat-security"
 #pragma GCC diagnostic ignored "-Wformat-extra-args"
-  std::unique_ptr<char, detail::FreeDeleter> text(
-      Str_Asprintf(nullptr, format, detail::FormatArg(args)...));
+  std::unique_ptr<char, FreeDeleter> text(Str_Asprintf(nullptr, format, FormatArg(args)...));
 #pragma GCC diagnostic pop
-  throw T(static_cast<int>(code), text.get());
+  return T(static_cast<int>(code), text.get());
+}
+}  // namespace detail
+
+// Throws T(code, formatted message). An unknown code is a programming error
+// and raises std::out_of_range instead.
+template <typename T, typename... Args>
+[[noreturn]] void ThrowException(CMErrorCodes code, const Args&... args) {
+  throw detail::MakeException<T>(code, args...);
+}
+
+// The same, with the location of the fault attached: code and message are
+// those of ThrowException.
+template <typename T, typename... Args>
+[[noreturn]] void ThrowExceptionAt(ErrorLocation location, CMErrorCodes code, const Args&... args) {
+  T exception = detail::MakeException<T>(code, args...);
+  exception.SetLocation(std::move(location));
+  throw exception;
 }
 
 // A structured, localisable error reported by a plugin or an operation. An

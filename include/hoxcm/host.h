@@ -82,15 +82,35 @@ inline constexpr Entry kTable[] = {
 
 }  // namespace HoxPlatform
 
+// The library's log. An embedding process hears only warnings and errors on
+// stderr unless it asks for more: the threshold and the destination come
+// from SetThreshold/SetDestination when called, else from HOX_LOG_LEVEL (-1
+// for none, 0 to 3 or error|warning|info|detail; default warning) and
+// HOX_LOG_SYSLOG (1 the system log instead of stderr, 2 both), read on every
+// call. The settings are process-wide; every function is thread-safe.
 class HOXCM_API CSLogger {
  public:
   enum log_priority : int { kError = 0, kWarning = 1, kInfo = 2, kDetail = 3 };
-  // printf-style. Lines at or above the threshold (HOX_LOG_LEVEL: -1 for
-  // none, 0 to 3 or error|warning|info|detail, default info) go to stderr;
-  // HOX_LOG_SYSLOG=1 sends them to syslog instead, 2 to both.
+  enum class Destination { kStderr, kSyslog, kBoth };
+  // printf-style; one write per line.
   static void Log(int priority, const char* format, ...) __attribute__((format(printf, 2, 3)));
   static bool IsEnabled(int priority);
+  // Lines up to `priority` are written (-1: none); overrides HOX_LOG_LEVEL.
+  static void SetThreshold(int priority);
+  // Overrides HOX_LOG_SYSLOG.
+  static void SetDestination(Destination destination);
 };
+
+namespace HoxPlatform {
+
+// Writes "EVENT by USER" to the host's system log (the datagram socket
+// /dev/log under the root, else the machine's), facility authpriv, as
+// `program`: the audit trail of changes made to the host. USER names the
+// real user and, under sudo, the user who ran sudo. True when the line was
+// delivered; a host without a system log loses it, as syslog(3) would.
+HOXCM_API bool AuditLog(std::string_view program, std::string_view event);
+
+}  // namespace HoxPlatform
 
 namespace HostCtl {
 namespace Host {

@@ -163,6 +163,8 @@ enum VALIDATION_ERR_CODES : int {
 
 // Validates `document` against `schema` and leaves in `result` an array of
 // errors, each {"field", "errId", "errArgs", "error"} (empty when valid).
+// "error" says what is wrong with the value at "field" ("must be at least
+// 1280"); a type error's second argument is the expected type.
 // Error kinds in `ignored` are dropped. Returns the number of errors kept.
 // `context` prefixes every "field".
 HOXCM_API int Validate(const rapidjson::Value& schema, const rapidjson::Value& document,
@@ -175,7 +177,16 @@ HOXCM_API int ValidateCMDocument(const rapidjson::Value& schema, const rapidjson
                                  rapidjson::Document& result, const std::set<int>& ignored,
                                  const std::string& context);
 
-// Message identifier of a validator error code.
+// Message identifier of a validator error code, and back (VALIDATION_ERR_GENERIC
+// for an identifier that names no code).
 HOXCM_API std::string ConvertErrorCodeToMsgId(int code);
+HOXCM_API int ConvertMsgIdToErrorCode(const std::string& messageId);
+
+// What a finding says about its field, as the validator's "error" text:
+// "must be a string", "must be at least 1280", "is required but missing".
+// `args` are the finding's arguments; `engineText`, when known, refines
+// exclusive bounds and formats.
+HOXCM_API std::string DescribeFinding(int code, const std::vector<std::string>& args,
+                                      const std::string& engineText = "");
 
 }  // namespace JsonValidator

@@ -47,8 +47,9 @@ std::string JsonToString(const Value& value) {
 }
 
 void ParseDocument(const std::string& text, Document& doc) {
-  if (!detail::ParseJson(text.data(), text.size(), doc)) {
-    ThrowException<InvalidArgumentException>(JsonParseFailed);
+  ErrorLocation where;
+  if (!detail::ParseJson(text.data(), text.size(), doc, &where)) {
+    ThrowExceptionAt<InvalidArgumentException>(std::move(where), JsonParseFailed);
   }
 }
 

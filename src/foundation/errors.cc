@@ -6,6 +6,9 @@ namespace HostCtl::Lib {
 HostCtlException::HostCtlException(const char* message) : message_(message ? message : "") {}
 HostCtlException::HostCtlException(std::string message) : message_(std::move(message)) {}
 const char* HostCtlException::what() const noexcept { return message_.c_str(); }
+void HostCtlException::SetLocation(ErrorLocation location) {
+  location_ = std::make_shared<const ErrorLocation>(std::move(location));
+}
 
 }  // namespace HostCtl::Lib
 

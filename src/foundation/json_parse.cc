@@ -1,5 +1,6 @@
 #include "foundation/json_parse.h"
 
+#include <algorithm>
 #include <cstdint>
 #include <cstring>
 
@@ -68,9 +69,42 @@ bool IsAscii(const char* text, std::size_t size) {
   return true;
 }
 
+// The reader's message as a clause: "Missing a comma." -> "missing a comma".
+std::string Clause(const char* message) {
+  std::string text(message);
+  if (!text.empty() && text.back() == '.') text.pop_back();
+  if (!text.empty() && text[0] >= 'A' && text[0] <= 'Z') text[0] = static_cast<char>(text[0] - 'A' + 'a');
+  return text;
+}
+
+// Line and column of `offset`: columns count characters, so UTF-8
+// continuation bytes do not advance them.
+void Locate(const char* text, std::size_t size, std::size_t offset, ErrorLocation& where) {
+  offset = std::min(offset, size);
+  where.offset = offset;
+  where.line = 1;
+  where.column = 1;
+  for (std::size_t i = 0; i < offset; ++i) {
+    const auto c = static_cast<unsigned char>(text[i]);
+    if (c == '\n') {
+      ++where.line;
+      where.column = 1;
+    } else if ((c & 0xC0) != 0x80) {
+      ++where.column;
+    }
+  }
+}
+
 }  // namespace
 
 bool ParseJson(const char* text, std::size_t size, Document& doc, std::string* error) {
+  ErrorLocation where;
+  if (ParseJson(text, size, doc, &where)) return true;
+  if (error != nullptr) *error = where.reason + " at offset " + std::to_string(where.offset);
+  return false;
+}
+
+bool ParseJson(const char* text, std::size_t size, Document& doc, ErrorLocation* where) {
   bool ok = false;
   bool tooDeep = false;
   bool trailingNul = false;
@@ -93,11 +127,11 @@ bool ParseJson(const char* text, std::size_t size, Document& doc, std::string* e
     return ok;
   };
   doc.Populate(generator);
-  if (!ok && error != nullptr) {
-    *error = tooDeep       ? "nesting deeper than " + std::to_string(kMaxJsonDepth) + " levels"
-             : trailingNul ? std::string("a NUL byte after the document")
-                           : std::string(rapidjson::GetParseError_En(result.Code()));
-    *error += " at offset " + std::to_string(result.Offset());
+  if (!ok && where != nullptr) {
+    where->reason = tooDeep       ? "nesting deeper than " + std::to_string(kMaxJsonDepth) + " levels"
+                    : trailingNul ? std::string("a NUL byte after the document")
+                                  : Clause(rapidjson::GetParseError_En(result.Code()));
+    Locate(text, size, result.Offset(), *where);
   }
   if (!ok) doc.SetNull();
   return ok;

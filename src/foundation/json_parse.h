@@ -14,5 +14,9 @@ namespace HoxConfigManager::detail {
 // encoding, trailing content, nesting deeper than kMaxJsonDepth); `error`, when
 // given, receives a short description with the offset.
 bool ParseJson(const char* text, std::size_t size, Document& doc, std::string* error = nullptr);
+// The same; on failure `where` (when given) receives the offset, the line and
+// column (in characters) and the reason ("nesting deeper than 512 levels",
+// "invalid encoding in string", ...). Its file is left as it was.
+bool ParseJson(const char* text, std::size_t size, Document& doc, ErrorLocation* where);
 
 }  // namespace HoxConfigManager::detail

@@ -1,5 +1,7 @@
 #include <hoxcm/host.h>
 
+#include <algorithm>
+#include <atomic>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
@@ -12,8 +14,19 @@
 
 namespace {
 
+// Settings made through the API; kUnset defers to the environment.
+constexpr int kUnset = -2;
+std::atomic<int>& ThresholdSetting() {
+  static std::atomic<int> threshold{kUnset};
+  return threshold;
+}
+std::atomic<int>& DestinationSetting() {
+  static std::atomic<int> destination{kUnset};
+  return destination;
+}
+
 int ParseLevel(const char* text) {
-  if (text == nullptr || *text == '\0') return CSLogger::kInfo;
+  if (text == nullptr || *text == '\0') return CSLogger::kWarning;
   if (std::strcmp(text, "error") == 0) return CSLogger::kError;
   if (std::strcmp(text, "warning") == 0) return CSLogger::kWarning;
   if (std::strcmp(text, "info") == 0) return CSLogger::kInfo;
@@ -21,7 +34,7 @@ int ParseLevel(const char* text) {
   char* end = nullptr;
   const long n = std::strtol(text, &end, 10);
   if (end != text && *end == '\0' && n >= -1 && n <= 3) return static_cast<int>(n);
-  return CSLogger::kInfo;
+  return CSLogger::kWarning;
 }
 
 const char* PriorityName(int priority) {
@@ -42,8 +55,10 @@ int SyslogPriority(int priority) {
   }
 }
 
-// HOX_LOG_SYSLOG: unset or 0 stderr only, 1 syslog only, 2 both.
+// 0 stderr only, 1 syslog only, 2 both; HOX_LOG_SYSLOG unless set through the API.
 int SyslogMode() {
+  const int set = DestinationSetting().load(std::memory_order_relaxed);
+  if (set != kUnset) return set;
   const char* s = std::getenv("HOX_LOG_SYSLOG");
   if (s == nullptr) return 0;
   if (std::strcmp(s, "1") == 0) return 1;
@@ -53,7 +68,19 @@ int SyslogMode() {
 
 }  // namespace
 
-bool CSLogger::IsEnabled(int priority) { return priority <= ParseLevel(std::getenv("HOX_LOG_LEVEL")); }
+bool CSLogger::IsEnabled(int priority) {
+  const int set = ThresholdSetting().load(std::memory_order_relaxed);
+  return priority <= (set != kUnset ? set : ParseLevel(std::getenv("HOX_LOG_LEVEL")));
+}
+
+void CSLogger::SetThreshold(int priority) {
+  ThresholdSetting().store(std::clamp(priority, -1, static_cast<int>(kDetail)), std::memory_order_relaxed);
+}
+
+void CSLogger::SetDestination(Destination destination) {
+  const int mode = destination == Destination::kStderr ? 0 : destination == Destination::kSyslog ? 1 : 2;
+  DestinationSetting().store(mode, std::memory_order_relaxed);
+}
 
 void CSLogger::Log(int priority, const char* format, ...) {
   if (format == nullptr || !IsEnabled(priority)) return;

@@ -1,6 +1,7 @@
 # Process-wide services shared by everything.
 list(APPEND HOXCM_SOURCES
   src/platform/logger.cc
+  src/platform/system_log.cc
   src/platform/paths.cc
 )
 # Each area of the platform keeps its own list.

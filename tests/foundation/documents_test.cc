@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <string>
+#include <tuple>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/host_documents.h>
@@ -92,6 +93,51 @@ TEST(DocumentsTest, ParsersRefuseMalformedInputOfEveryKindWithoutCrashing) {
   EXPECT_NO_THROW(ParseDocument(atLimit, doc));
   ParseDocument("{\"v\":" + unterminated + "\"}", doc);
   EXPECT_EQ(doc["v"].GetStringLength(), unterminated.size() - 1);
+}
+
+TEST(DocumentsTest, ParseFailuresCarryTheirLocationBesideTheFixedText) {
+  // Given malformed text, the exception should keep code 2080 and its text
+  // and carry the line, the column (in characters) and the parser's reason;
+  // a file that cannot be read carries the file and the system's reason.
+  const struct {
+    std::string text;
+    std::size_t line, column;
+    const char* reason;
+  } cases[] = {
+      {"{\n  \"a\": tru}", 2, 11, "invalid value"},
+      {"{\"a\": 1,\n \"\xc3\xa9\": [1, 2", 2, 12, "missing a comma or ']' after an array element"},
+      {"[\"\xff\"]", 1, 3, "invalid encoding in string"},
+      {std::string(kMaxJsonDepth + 1, '['), 1, kMaxJsonDepth + 1, "nesting deeper than 512 levels"},
+  };
+  for (const auto& c : cases) {
+    Document doc;
+    try {
+      ParseDocument(c.text, doc);
+      ADD_FAILURE() << c.text;
+    } catch (const InvalidArgumentException& e) {
+      EXPECT_STREQ(e.what(), "Failed to parse JSON String");
+      ASSERT_NE(e.GetLocation(), nullptr);
+      EXPECT_EQ(e.GetLocation()->line, c.line) << c.reason;
+      EXPECT_EQ(e.GetLocation()->column, c.column) << c.reason;
+      EXPECT_EQ(e.GetLocation()->reason, c.reason);
+    }
+  }
+  hoxcm_test::TempRoot root;
+  root.WriteFile("/bad.json", "[1,\n2,]");
+  for (const auto& [path, line, reason] : {std::tuple{root.Path("/bad.json"), 2, "invalid value"},
+                                           std::tuple{root.Path("/missing.json"), 0, "No such file or directory"},
+                                           std::tuple{root.Path("/"), 0, "Is a directory"}}) {
+    Document doc;
+    try {
+      CreateDocumentFromFile(path.c_str(), doc);
+      ADD_FAILURE() << path;
+    } catch (const ConfigManagerException& e) {
+      ASSERT_NE(e.GetLocation(), nullptr);
+      EXPECT_EQ(e.GetLocation()->file, path);
+      EXPECT_EQ(e.GetLocation()->line, static_cast<std::size_t>(line)) << path;
+      EXPECT_EQ(e.GetLocation()->reason, reason) << path;
+    }
+  }
 }
 
 TEST(DocumentsTest, FilesAreWrittenWholeAndReadBack) {

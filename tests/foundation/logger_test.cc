@@ -19,16 +19,17 @@ std::string LoggedAt(const char* level, int priority) {
 }  // namespace
 
 TEST(LoggerTest, WritesFormattedLinesUpToTheThreshold) {
-  // Given a threshold, lines at or above it are written whole, the rest not.
+  // Given a threshold, lines at or above it are written whole, the rest not;
+  // without one, an embedding process hears warnings and errors only.
   struct Case {
     const char* level;
     int priority;
     bool written;
   } cases[] = {
-      {"", CSLogger::kInfo, true},        {"", CSLogger::kDetail, false},
+      {"", CSLogger::kWarning, true},     {"", CSLogger::kInfo, false},
       {"error", CSLogger::kError, true},  {"error", CSLogger::kWarning, false},
       {"3", CSLogger::kDetail, true},     {"-1", CSLogger::kError, false},
-      {"bogus", CSLogger::kInfo, true},   {"detail", CSLogger::kDetail, true},
+      {"bogus", CSLogger::kInfo, false},  {"detail", CSLogger::kDetail, true},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(std::string(c.level) + "/" + std::to_string(c.priority));

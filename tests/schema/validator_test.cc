@@ -104,6 +104,32 @@ TEST(ValidatorTest, ReportsEachFaultAtItsFieldWithItsKind) {
   for (const auto& [schema, doc, expected] : cases) EXPECT_EQ(Check(Parse(schema), Parse(doc)), expected) << doc;
 }
 
+TEST(ValidatorTest, FindingsReadAsSentencesWithTheExpectedTypeOrBound) {
+  // Given a fault, the text should name the expected type or the schema's
+  // bound (trailing zeros gone), found through references and items.
+  const struct {
+    const char* schema;
+    const char* doc;
+    const char* text;
+  } cases[] = {
+      {R"({"properties": {"a": {"type": "string"}}})", R"({"a": 1})", "must be a string"},
+      {R"({"definitions": {"n": {"type": ["integer", "null"]}}, "properties": {"a": {"items": {"$ref": "#/definitions/n"}}}})",
+       R"({"a": [1, "x"]})", "must be an integer or null"},
+      {R"({"properties": {"a": {"minimum": 3}}})", R"({"a": 1})", "must be at least 3"},
+      {R"({"properties": {"a": {"minimum": 3, "exclusiveMinimum": true}}})", R"({"a": 3})", "must be greater than 3"},
+      {R"({"properties": {"a": {"maxLength": 2}}})", R"({"a": "abc"})", "must be at most 2 characters long"},
+      {R"({"properties": {"a": {"enum": [1]}}})", R"({"a": 2})", "must be one of the values the schema allows"},
+  };
+  for (const auto& c : cases) {
+    Document result;
+    JsonValidator::Validate(Parse(c.schema), Parse(c.doc), result, {}, "");
+    ASSERT_EQ(result.Size(), 1u) << c.doc;
+    EXPECT_STREQ(result[0]["error"].GetString(), c.text) << c.schema;
+    const int code = result[0]["errId"].GetInt();
+    EXPECT_EQ(JsonValidator::ConvertMsgIdToErrorCode(JsonValidator::ConvertErrorCodeToMsgId(code)), code);
+  }
+}
+
 TEST(ValidatorTest, ArgumentsNameTheMemberAndTheLimit) {
   Document result;
   JsonValidator::Validate(Parse(R"({"properties": {"mtu": {"maximum": 9000}}, "required": ["name"]})"),
@@ -112,7 +138,7 @@ TEST(ValidatorTest, ArgumentsNameTheMemberAndTheLimit) {
   EXPECT_EQ(JsonToString(result[0]["errArgs"]), R"(["mtu","9000"])");
   EXPECT_STREQ(result[0]["field"].GetString(), "/network/interfaces/vnic/0/mtu");
   EXPECT_EQ(JsonToString(result[1]["errArgs"]), R"(["name"])");
-  EXPECT_STREQ(result[1]["error"].GetString(), "Missing required property 'name'.");
+  EXPECT_STREQ(result[1]["error"].GetString(), "is required but missing");
   // Ignored kinds are dropped and not counted.
   EXPECT_EQ(JsonValidator::Validate(Parse(R"({"required": ["a", "b"], "maxProperties": 0})"), Parse(R"({"c": 1})"),
                                     result, {9}, ""),

@@ -11,20 +11,19 @@ namespace HoxPlatform::detail {
 
 void ReadDocumentFile(const std::string& path, FileKind kind, HoxConfigManager::Document& doc) {
   using HoxConfigManager::ConfigManagerException;
-  // The code's fixed text, then what went wrong where.
-  const auto fail = [](const std::string& detail) {
-    const std::string text = std::string(HoxConfigManager::ErrorMessageTable().at(HoxConfigManager::JsonParseFailed)) +
-                             ": " + detail;
-    throw ConfigManagerException(HoxConfigManager::JsonParseFailed, text.c_str());
-  };
+  // The code's fixed text; what went wrong where travels as its location.
+  HoxConfigManager::ErrorLocation where;
+  where.file = path;
   std::string text;
   try {
     text = ReadFile(path, kind);
   } catch (const FileError& e) {
-    fail(e.what());
+    where.reason = e.reason();
+    HoxConfigManager::ThrowExceptionAt<ConfigManagerException>(std::move(where), HoxConfigManager::JsonParseFailed);
   }
-  std::string error;
-  if (!HoxConfigManager::detail::ParseJson(text.data(), text.size(), doc, &error)) fail(path + ": " + error);
+  if (!HoxConfigManager::detail::ParseJson(text.data(), text.size(), doc, &where)) {
+    HoxConfigManager::ThrowExceptionAt<ConfigManagerException>(std::move(where), HoxConfigManager::JsonParseFailed);
+  }
 }
 
 }  // namespace HoxPlatform::detail

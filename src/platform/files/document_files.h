@@ -11,9 +11,9 @@
 namespace HoxPlatform::detail {
 
 // Reads and parses the file at `path`, at most MaxFileSize(kind) bytes.
-// Throws ConfigManagerException 2080 "Failed to parse JSON String: " followed
-// by the path and the reason (unreadable, not a regular file, too large, a
-// syntax error and where it is).
+// Throws ConfigManagerException 2080 "Failed to parse JSON String" whose
+// location names the file and the reason (unreadable, not a regular file, too
+// large, a syntax error with its line and column).
 void ReadDocumentFile(const std::string& path, FileKind kind, HoxConfigManager::Document& doc);
 
 }  // namespace HoxPlatform::detail

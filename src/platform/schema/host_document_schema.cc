@@ -93,7 +93,7 @@ bool GenerateHostDocumentSchema(const Value& document, Document& out) {
     Value args(rapidjson::kArrayType);
     args.PushBack(Value(id.toString(), a), a);
     error.AddMember("errArgs", args, a);
-    error.AddMember("error", Value("No schema for the key " + id.toString(), a), a);
+    error.AddMember("error", Value(JsonValidator::DescribeFinding(JsonValidator::VALIDATION_ERR_UNKNOWN_KEY, {}), a), a);
     out.PushBack(error, a);
   });
   if (!out.Empty()) return false;

@@ -66,6 +66,49 @@ std::string ContextToPath(const std::string& base, const std::vector<std::string
   return path;
 }
 
+// The type(s) the schema expects at `field` (below the validated root at
+// `base`): "string", "string or null"; empty when the walk through
+// properties, items and additionalProperties (local references followed)
+// does not reach a node with a "type".
+std::string ExpectedType(const Value& schema, const std::string& base, const std::string& field) {
+  const Value* node = &schema;
+  std::size_t start = base.size();
+  while (start < field.size()) {
+    std::size_t end = field.find('/', start + 1);
+    if (end == std::string::npos) end = field.size();
+    const std::string segment = field.substr(start + 1, end - start - 1);
+    start = end;
+    node = detail::ResolveLocalReference(schema, node);
+    if (node == nullptr || !node->IsObject()) return std::string();
+    const auto props = node->FindMember("properties");
+    const auto items = node->FindMember("items");
+    const auto extra = node->FindMember("additionalProperties");
+    if (props != node->MemberEnd() && props->value.IsObject() && props->value.HasMember(segment.c_str())) {
+      node = &props->value[segment.c_str()];
+    } else if (items != node->MemberEnd() && items->value.IsObject() && !segment.empty() &&
+               segment.find_first_not_of("0123456789") == std::string::npos) {
+      node = &items->value;
+    } else if (extra != node->MemberEnd() && extra->value.IsObject()) {
+      node = &extra->value;
+    } else {
+      return std::string();
+    }
+  }
+  node = detail::ResolveLocalReference(schema, node);
+  if (node == nullptr || !node->IsObject()) return std::string();
+  const auto type = node->FindMember("type");
+  if (type == node->MemberEnd()) return std::string();
+  if (type->value.IsString()) return type->value.GetString();
+  std::string types;
+  if (type->value.IsArray()) {
+    for (const auto& t : type->value.GetArray()) {
+      if (!t.IsString()) return std::string();
+      types += (types.empty() ? "" : " or ") + std::string(t.GetString());
+    }
+  }
+  return types;
+}
+
 void RunEngine(const Value& schema, const Value& document, const std::string& path, std::vector<Finding>& out) {
   if (std::string overlong = detail::FindOverlongPattern(schema); !overlong.empty()) {
     out.push_back(SchemaInvalid(path, overlong));
@@ -103,6 +146,12 @@ void RunEngine(const Value& schema, const Value& document, const std::string& pa
   while (results.popError(error)) {
     Finding f;
     if (!detail::ClassifyEngineError(ContextToPath(path, error.context), error.description, f)) continue;
+    if (f.code == VALIDATION_ERR_TYPE) {
+      if (std::string expected = ExpectedType(schema, path, f.field); !expected.empty()) {
+        f.args.push_back(std::move(expected));
+        f.text = DescribeFinding(f.code, f.args, error.description);
+      }
+    }
     // Variants of a failed oneOf/anyOf may report the same fault twice.
     if (!seen.emplace(f.field, f.code, f.text).second) continue;
     out.push_back(std::move(f));
@@ -268,7 +317,7 @@ int ValidateCMDocument(const Value& schema, const Value& document, rapidjson::Do
     // are configuration keys without a schema.
     if (f.code == VALIDATION_ERR_ADDITIONAL_PROPERTIES && Depth(f.field, context) <= 3) {
       f.code = VALIDATION_ERR_UNKNOWN_KEY;
-      f.text = "No schema for " + f.field.substr(context.size());
+      f.text = DescribeFinding(f.code, f.args);
     }
   }
   return WriteFindings(findings, ignored, result);

@@ -113,6 +113,7 @@ bool ClassifyEngineError(const std::string& path, const std::string& description
     if (rule.limitArgument) {
       out.args.push_back(LastSegment(path));
       out.args.push_back(FirstNumber(description));
+      out.text = DescribeFinding(out.code, out.args, description);
       return true;
     }
     break;
@@ -123,13 +124,91 @@ bool ClassifyEngineError(const std::string& path, const std::string& description
     const std::string name = QuotedName(description);
     out.field = path + "/" + name;
     out.args.push_back(name);
-    return true;
+  } else {
+    out.args.push_back(LastSegment(path));
   }
-  out.args.push_back(LastSegment(path));
+  out.text = DescribeFinding(out.code, out.args, description);
   return true;
 }
 
 }  // namespace detail
+
+namespace {
+
+// "string" -> "a string", "integer" -> "an integer"; alternatives joined
+// with "or" stay joined ("string or null" -> "a string or null").
+std::string WithArticles(const std::string& types) {
+  std::string out;
+  std::size_t start = 0;
+  while (start <= types.size()) {
+    std::size_t end = types.find(" or ", start);
+    if (end == std::string::npos) end = types.size();
+    const std::string type = types.substr(start, end - start);
+    if (!out.empty()) out += " or ";
+    if (type == "null") {
+      out += type;
+    } else {
+      out += (type.find_first_of("aeiou") == 0 ? "an " : "a ") + type;
+    }
+    start = end + 4;
+  }
+  return out;
+}
+
+}  // namespace
+
+std::string DescribeFinding(int code, const std::vector<std::string>& args, const std::string& engineText) {
+  const std::string limit = args.size() > 1 ? args[1] : "the limit";
+  // The engine says "greater than 3" for an exclusive bound and "greater
+  // than or equal to 3" for an inclusive one.
+  const bool exclusive = !engineText.empty() && engineText.find("or equal") == std::string::npos;
+  switch (code) {
+    case VALIDATION_ERR_TYPE:
+      return args.size() > 1 ? "must be " + WithArticles(args[1]) : "has a type the schema does not allow";
+    case VALIDATION_ERR_ENUM: return "must be one of the values the schema allows";
+    case VALIDATION_ERR_MINIMUM: return (exclusive ? "must be greater than " : "must be at least ") + limit;
+    case VALIDATION_ERR_MAXIMUM: return (exclusive ? "must be less than " : "must be at most ") + limit;
+    case VALIDATION_ERR_MIN_LENGTH: return "must be at least " + limit + " characters long";
+    case VALIDATION_ERR_MAX_LENGTH: return "must be at most " + limit + " characters long";
+    case VALIDATION_ERR_PATTERN: return "does not match the pattern the schema requires";
+    case VALIDATION_ERR_REQUIRED: return "is required but missing";
+    case VALIDATION_ERR_ADDITIONAL_PROPERTIES: return "is not allowed here: the schema does not describe it";
+    case VALIDATION_ERR_MIN_ITEMS: return "must hold at least " + limit + " items";
+    case VALIDATION_ERR_MAX_ITEMS: return "must hold at most " + limit + " items";
+    case VALIDATION_ERR_UNIQUE_ITEMS: return "must not hold the same item twice";
+    case VALIDATION_ERR_FORMAT: {
+      static constexpr std::string_view kOpening = "String should be a valid ";
+      if (engineText.starts_with(kOpening)) {
+        std::string format = engineText.substr(kOpening.size());
+        if (!format.empty() && format.back() == '.') format.pop_back();
+        return "must be a valid " + format;
+      }
+      return "does not have the format the schema requires";
+    }
+    case VALIDATION_ERR_ONE_OF: return "must match exactly one of the forms the schema allows";
+    case VALIDATION_ERR_ANY_OF: return "must match at least one of the forms the schema allows";
+    case VALIDATION_ERR_ALL_OF: return "must match every form the schema requires";
+    case VALIDATION_ERR_NOT: return "must not match the form the schema excludes";
+    case VALIDATION_ERR_MULTIPLE_OF:
+      return args.size() > 1 && !args[1].empty() ? "must be a multiple of " + args[1]
+                                                  : "cannot be checked as a multiple";
+    case VALIDATION_ERR_DEPENDENCIES: return "is required by another member but missing";
+    case VALIDATION_ERR_MIN_PROPERTIES: return "must have at least " + limit + " members";
+    case VALIDATION_ERR_MAX_PROPERTIES: return "must have at most " + limit + " members";
+    case VALIDATION_ERR_ADDITIONAL_ITEMS: return "holds more items than the schema allows";
+    case VALIDATION_ERR_UNKNOWN_KEY: return "is not a configuration key of this host: no schema describes it";
+    default: return engineText.empty() ? "is not valid" : engineText;
+  }
+}
+
+int ConvertMsgIdToErrorCode(const std::string& messageId) {
+  // Codes without an identifier of their own share the generic one, which
+  // the generic code (the lowest) claims first.
+  for (int code = VALIDATION_OK; code <= VALIDATION_ERR_UNION_TAG; ++code) {
+    if (ConvertErrorCodeToMsgId(code) == messageId) return code;
+  }
+  return VALIDATION_ERR_GENERIC;
+}
 
 std::string ConvertErrorCodeToMsgId(int code) {
   static constexpr std::string_view kPrefix = "com.tarvik.hox.settings.validation.";
