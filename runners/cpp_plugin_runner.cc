@@ -142,9 +142,27 @@ int CommitRequestFile(const std::string& path) {
   return 0;
 }
 
+constexpr const char* kUsage =
+    "Usage: cpp_plugin_runner                         run the plugin request\n"
+    "       cpp_plugin_runner --commit-request FILE   store the objects of an applied request\n"
+    "\n"
+    "Runs the request ROOT/var/tarvik/lifecycle/cm-plugin-input.json against its shared-object\n"
+    "plugin (ROOT/usr/lib/tarvik/configmanager/apply_modules/<plugin id>/<module>) and writes the\n"
+    "result to ROOT/var/tarvik/lifecycle/cm-plugin-output.json. ROOT is where the runner is\n"
+    "installed: the directory above usr/lib/tarvik/configmanager/bin/. The request's \"type\" is\n"
+    "APPLY, IMPACT or VALIDATE; an applied request is stored in the configuration store.\n"
+    "Exit 0 when the plugin ran (its own failure is in the result), else an errno value:\n"
+    "EINVAL bad request, ELIBACC module not loadable, ENOSYS no entry point, EPROTO interface\n"
+    "version, EOPNOTSUPP operation not supported, EBADMSG bad result, ENOTRECOVERABLE the plugin\n"
+    "threw, EIO the store update failed. See docs/plugin-protocol.md.\n";
+
 }  // namespace
 
 int main(int argc, char** argv) {
+  if (argc == 2 && (std::strcmp(argv[1], "--help") == 0 || std::strcmp(argv[1], "-h") == 0)) {
+    std::fputs(kUsage, stdout);
+    return 0;
+  }
   const std::string root = RootFromProgramPath(argc > 0 ? argv[0] : "");
   ::setenv("HOX_ROOT", root.c_str(), 1);
   try {

@@ -48,6 +48,8 @@ inline constexpr std::string_view kSshServerConfig = "/etc/ssh/sshd_config";
 inline constexpr std::string_view kSshAuthorizedKeys = "/root/.ssh/authorized_keys";
 inline constexpr std::string_view kAutodeployWaiterNotify = "/etc/tarvik/autodeploy/waiterNotify.json";
 inline constexpr std::string_view kAutodeployFirewall = "/etc/tarvik/firewall/autodeploy.xml";
+// The system log's datagram socket: audit lines of changes to the host.
+inline constexpr std::string_view kSystemLog = "/dev/log";
 
 // Every entry by a name of its own (the names of the script runner's copy).
 struct Entry {
@@ -77,6 +79,7 @@ inline constexpr Entry kTable[] = {
     {"ssh_authorized_keys", kSshAuthorizedKeys},
     {"autodeploy_waiter_notify", kAutodeployWaiterNotify},
     {"autodeploy_firewall", kAutodeployFirewall},
+    {"system_log", kSystemLog},
 };
 }  // namespace HostPaths
 

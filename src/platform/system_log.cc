@@ -78,8 +78,8 @@ bool AuditLog(std::string_view program, std::string_view event) {
   const std::string message = "<" + std::to_string(LOG_AUTHPRIV | LOG_NOTICE) + ">" + stamp + " " +
                               OneLine(program) + "[" + std::to_string(::getpid()) + "]: " + OneLine(event) +
                               " by " + OneLine(Who());
-  if (SendDatagram(HostPath("/dev/log"), message)) return true;
-  return HostRoot() != "/" && SendDatagram("/dev/log", message);
+  if (SendDatagram(HostPath(HostPaths::kSystemLog), message)) return true;
+  return HostRoot() != "/" && SendDatagram(std::string(HostPaths::kSystemLog), message);
 }
 
 }  // namespace HoxPlatform

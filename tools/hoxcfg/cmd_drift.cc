@@ -1,7 +1,5 @@
 // hoxcfg compliance and drift: what a desired document would change on the
 // host, as a compliance report or as the apply tasks it would generate.
-#include <cstdlib>
-#include <iostream>
 #include <memory>
 #include <string>
 #include <vector>
@@ -10,106 +8,118 @@
 #include <hoxcm/drift.h>
 #include <hoxcm/host_documents.h>
 
+#include "hoxcfg/cli.h"
 #include "hoxcfg/commands.h"
-#include "hoxcfg/common.h"
 
 namespace hoxcfg {
 namespace {
 
+constexpr const char* kFileHelp = "Desired configuration document ('-': standard input)";
 
 // The document as it applies to this host: host-specific sections (as an
 // export writes them) are reduced to this host's.
-rapidjson::Document LoadDocument(const std::string& path) {
-  rapidjson::Document file;
-  HoxConfigManager::CreateDocumentFromFile(path.c_str(), file);
+rapidjson::Document LoadDesired(const std::string& path) {
+  const rapidjson::Document file = ReadConfigurationDocument(path);
   rapidjson::Document doc;
   HoxConfigManager::CreateMergedDocument(file, doc);
   return doc;
 }
 
-// One report list as text: every entry's path, then its values (already
+// The part of a desired document the drift walk compares: its "profile"
+// when it has one.
+const rapidjson::Value& ComparedRoot(const rapidjson::Document& desired) {
+  const auto profile = desired.FindMember("profile");
+  return profile != desired.MemberEnd() ? profile->value : desired;
+}
+
+std::string Plural(std::size_t n, const char* word) {
+  return std::to_string(n) + " " + word + (n == 1 ? "" : "s");
+}
+
+// One report list as text: every entry's item, then its values (already
 // redacted by the report).
-std::string FormatList(const char* title, const rapidjson::Value& entries) {
+std::string FormatList(const char* title, const rapidjson::Value& entries, const rapidjson::Value& desired) {
   std::string out = std::string(title) + " (" + std::to_string(entries.Size()) + ")\n";
   for (const auto& entry : entries.GetArray()) {
-    out += "  " + std::string(entry["path"].GetString()) + "\n";
+    const char* host = entry.HasMember("hostValue") ? entry["hostValue"].GetString() : nullptr;
+    out += "  " + ReportPathToItemName(entry["path"].GetString(), desired, host) + "\n";
     if (entry.HasMember("desiredValue")) out += "      desired: " + std::string(entry["desiredValue"].GetString()) + "\n";
-    if (entry.HasMember("hostValue")) out += "      host:    " + std::string(entry["hostValue"].GetString()) + "\n";
+    if (host != nullptr) out += "      host:    " + std::string(host) + "\n";
   }
   return out;
 }
 
 void RegisterCompliance(CLI::App& app, GlobalOptions& options) {
-  auto* cmd = app.add_subcommand("compliance", "Compare the host with a desired document (exit 1 when it differs)")
-                  ->fallthrough();
+  auto* cmd = AddCommand(app, "compliance", "Compare the host with a desired document",
+                         {{kExitOk, "the host complies with FILE"},
+                          {kExitNegative, "it does not: the differences are listed"},
+                          {kExitUsage, kUsageStatus}});
   auto file = std::make_shared<std::string>();
-  auto json = std::make_shared<bool>(false);
-  cmd->add_option("FILE", *file, "Desired configuration document")->required();
-  cmd->add_flag("--json", *json, "Print the report document itself");
-  cmd->callback([&options, file, json] {
-    Run(options, [&] {
-      rapidjson::Document desired = LoadDocument(*file);
-      HoxConfigManager::ComplianceResult result;
-      HoxConfigManager::CheckCompliance(desired, result);
-      std::string text;
-      if (*json) {
-        text = FormatJson(result.document, options);
-      } else {
-        const auto& report = result.document;
-        const unsigned count = report["ADDS"].Size() + report["DELETES"].Size() + report["SETS"].Size();
-        text = result.compliant ? "compliant\n"
-                                : "not compliant: " + std::to_string(count) + " difference(s)\n";
-        if (!result.compliant) {
-          text += FormatList("ADDS", report["ADDS"]) + FormatList("DELETES", report["DELETES"]) +
-                  FormatList("SETS", report["SETS"]);
-        }
-      }
-      std::cout << text << std::flush;
-      return result.compliant ? kExitOk : kExitNegative;
-    });
+  auto events = std::make_shared<std::string>();
+  cmd->add_option("FILE", *file, kFileHelp)->required();
+  AddEventsOption(cmd, *events);
+  SetAction(cmd, options, Needs::kHost, [&options, file, events] {
+    auto desired = std::make_shared<rapidjson::Document>(LoadDesired(*file));
+    auto result = std::make_shared<HoxConfigManager::ComplianceResult>();
+    HoxConfigManager::CheckCompliance(*desired, *result, MakeTask(options, *events));
+    Print(options, {[result, desired] {
+                      const auto& report = result->document;
+                      if (result->compliant) return std::string("compliant\n");
+                      const std::size_t count =
+                          report["ADDS"].Size() + report["DELETES"].Size() + report["SETS"].Size();
+                      return "not compliant: " + Plural(count, "difference") + "\n" +
+                             FormatList("ADDS", report["ADDS"], ComparedRoot(*desired)) +
+                             FormatList("DELETES", report["DELETES"], ComparedRoot(*desired)) +
+                             FormatList("SETS", report["SETS"], ComparedRoot(*desired));
+                    },
+                    [result] {
+                      rapidjson::Document out;
+                      out.CopyFrom(result->document, out.GetAllocator());
+                      return out;
+                    }});
+    return result->compliant ? kExitOk : kExitNegative;
   });
 }
 
 void RegisterDrift(CLI::App& app, GlobalOptions& options) {
-  auto* cmd = app.add_subcommand("drift", "List the apply tasks a desired document would generate")->fallthrough();
+  auto* cmd = AddCommand(app, "drift", "List the apply tasks a desired document would generate",
+                         {{kExitOk, "no tasks: the host has no drift from FILE (with --boot: always)"},
+                          {kExitNegative, "tasks were found"},
+                          {kExitUsage, kUsageStatus}});
   auto file = std::make_shared<std::string>();
   auto boot = std::make_shared<bool>(false);
-  auto json = std::make_shared<bool>(false);
-  cmd->add_option("FILE", *file, "Desired configuration document")->required();
-  cmd->add_flag("--boot", *boot, "The tasks of a boot-time apply (no comparison)");
-  cmd->add_flag("--json", *json, "Print the tasks as a JSON array");
-  cmd->callback([&options, file, boot, json] {
-    Run(options, [&] {
-      rapidjson::Document desired = LoadDocument(*file);
-      const std::vector<HoxConfigManager::DesiredConfigInput> tasks =
-          *boot ? HoxConfigManager::GenerateBootTimeTasks(desired) : HoxConfigManager::GenerateApplyTasks(desired);
-      rapidjson::Document out(rapidjson::kArrayType);
-      auto& alloc = out.GetAllocator();
-      std::string text;
-      for (const auto& task : tasks) {
-        const auto& id = task.object->GetConfigStoreObjectId();
-        const std::string path = "/" + id.component + "/" + id.group + "/" + id.key;
-        if (*json) {
-          rapidjson::Value entry(rapidjson::kObjectType);
-          entry.AddMember("action", rapidjson::Value(task.action, alloc), alloc);
-          entry.AddMember("object", rapidjson::Value(id.toString(), alloc), alloc);
-          entry.AddMember("instance", rapidjson::Value(id.instanceId, alloc), alloc);
-          entry.AddMember("path", rapidjson::Value(path, alloc), alloc);
-          out.PushBack(entry, alloc);
-        } else {
-          std::string action = task.action;
-          action.resize(7, ' ');
-          text += action + path + (id.instanceId.empty() ? "" : "  [" + id.instanceId + "]") + "\n";
-        }
-      }
-      if (*json) {
-        text = FormatJson(out, options);
-      } else if (tasks.empty()) {
-        text = "no tasks\n";
-      }
-      std::cout << text << std::flush;
-      return kExitOk;
-    });
+  cmd->add_option("FILE", *file, kFileHelp)->required();
+  cmd->add_flag("--boot", *boot, "The tasks of a boot-time apply: every item, without comparison");
+  SetAction(cmd, options, Needs::kHost, [&options, file, boot] {
+    rapidjson::Document desired = LoadDesired(*file);
+    auto tasks = std::make_shared<std::vector<HoxConfigManager::DesiredConfigInput>>(
+        *boot ? HoxConfigManager::GenerateBootTimeTasks(desired) : HoxConfigManager::GenerateApplyTasks(desired));
+    Print(options, {[tasks] {
+                      if (tasks->empty()) return std::string("no tasks\n");
+                      Table table({"ACTION", "ITEM"});
+                      for (const auto& task : *tasks) {
+                        const auto& id = task.object->GetConfigStoreObjectId();
+                        table.Add({task.action, ItemName(id.component, id.group, id.key, id.instanceId)});
+                      }
+                      return table.Render();
+                    },
+                    [tasks] {
+                      rapidjson::Document out(rapidjson::kObjectType);
+                      auto& a = out.GetAllocator();
+                      rapidjson::Value list(rapidjson::kArrayType);
+                      for (const auto& task : *tasks) {
+                        const auto& id = task.object->GetConfigStoreObjectId();
+                        rapidjson::Value entry(rapidjson::kObjectType);
+                        entry.AddMember("action", rapidjson::Value(task.action, a), a);
+                        entry.AddMember("item", rapidjson::Value(ItemName(id.component, id.group, id.key, id.instanceId), a), a);
+                        entry.AddMember("path", rapidjson::Value(ItemName(id.component, id.group, id.key), a), a);
+                        entry.AddMember("instance", rapidjson::Value(id.instanceId, a), a);
+                        list.PushBack(entry, a);
+                      }
+                      out.AddMember("tasks", list, a);
+                      return out;
+                    }});
+    return *boot || tasks->empty() ? kExitOk : kExitNegative;
   });
 }
 

@@ -7,10 +7,11 @@
 #include <memory>
 
 #include <hoxcm/host.h>
+#include <hoxcm/documents.h>
 #include <hoxcm/plugins.h>
 
 #include "hoxcfg/commands.h"
-#include "hoxcfg/common.h"
+#include "hoxcfg/cli.h"
 
 namespace hoxcfg {
 namespace {
@@ -49,7 +50,7 @@ rapidjson::Document ListPlugins() {
     if (!p->GetModule().empty()) entry.AddMember("module", rapidjson::Value(p->GetModule(), a), a);
     entry.AddMember("manifest", rapidjson::Value(HoxPlatform::StripHostRoot(p->GetPath()), a), a);
     std::vector<std::string> owns;
-    for (const auto& id : p->GetCSOIdList()) owns.push_back(id.component + ":" + id.group + ":" + id.key);
+    for (const auto& id : p->GetCSOIdList()) owns.push_back(ItemName(id.component, id.group, id.key));
     entry.AddMember("accepts", Strings(owns, a), a);
     std::vector<std::string> kinds;
     if (p->HasApplySupport()) kinds.push_back("apply");
@@ -82,28 +83,78 @@ rapidjson::Document ListPlugins() {
   return out;
 }
 
+std::string Joined(const rapidjson::Value& list, const char* separator) {
+  std::string text;
+  for (const auto& item : list.GetArray()) text += (text.empty() ? "" : separator) + std::string(item.GetString());
+  return text;
+}
+
+std::string PluginTable(const rapidjson::Document& registry) {
+  Table table({"PLUGIN", "VERSION", "RUNNER", "RUNS", "APPLY GROUP", "ITEMS"});
+  for (const auto& p : registry["plugins"].GetArray()) {
+    table.Add({p["id"].GetString(), std::to_string(p["version"].GetInt64()), p["type"].GetString(),
+               Joined(p["supports"], ","), p.HasMember("applyGroup") ? p["applyGroup"].GetString() : "-",
+               Joined(p["accepts"], " ")});
+  }
+  return table.Render() + "\napply order: " + Joined(registry["order"], " -> ") + "\n";
+}
+
+// A finding of the manifest check: a text, or a validator finding.
+std::string ManifestFinding(const rapidjson::Value& finding) {
+  if (finding.IsString()) return finding.GetString();
+  if (finding.IsObject() && finding.HasMember("field") && finding.HasMember("error")) {
+    const std::string field = finding["field"].GetString();
+    return (field.empty() ? "" : field + ": ") + finding["error"].GetString();
+  }
+  return HoxConfigManager::JsonToString(finding);
+}
+
 }  // namespace
 
 void RegisterPluginCommands(CLI::App& app, GlobalOptions& options) {
-  auto* plugins = app.add_subcommand("plugins", "Installed plugins")->require_subcommand(1);
-  plugins->add_subcommand("list", "Show the registry and the order of apply operations")
-      ->fallthrough()
-      ->callback([&options] {
-        Run(options, [&] {
-          std::cout << FormatJson(ListPlugins(), options) << std::flush;
-          return kExitOk;
-        });
-      });
-  plugins->add_subcommand("check", "Check every manifest against its manifest schema")
-      ->fallthrough()
-      ->callback([&options] {
-        Run(options, [&] {
-          rapidjson::Document report;
-          ValidateAllPlugins(PluginDirectory(), PluginSchemaDirectory(), report);
-          std::cout << FormatJson(report, options) << std::flush;
-          return report.Empty() ? kExitOk : kExitNegative;
-        });
-      });
+  auto* plugins = AddCommand(app, "plugins", "Installed plugins: their registry and the check of their manifests");
+  plugins->require_subcommand(1);
+  auto* list = AddCommand(*plugins, "list", "Show the installed plugins and the order of their apply operations",
+                          {{kExitOk, "listed"}, {kExitUsage, kUsageStatus}});
+  SetAction(list, options, Needs::kHost, [&options] {
+    auto registry = std::make_shared<rapidjson::Document>(ListPlugins());
+    Print(options, {[registry] { return PluginTable(*registry); },
+                    [registry] {
+                      rapidjson::Document out;
+                      out.CopyFrom(*registry, out.GetAllocator());
+                      return out;
+                    },
+                    /*list=*/true});
+    return kExitOk;
+  });
+  auto* check = AddCommand(*plugins, "check", "Check every manifest against the manifest schema of its version",
+                           {{kExitOk, "every manifest is valid"},
+                            {kExitNegative, "some are not: each finding is listed"},
+                            {kExitUsage, kUsageStatus}});
+  SetAction(check, options, Needs::kHost, [&options] {
+    auto report = std::make_shared<rapidjson::Document>();
+    ValidateAllPlugins(PluginDirectory(), PluginSchemaDirectory(), *report);
+    Print(options, {[report] {
+                      if (report->Empty()) return std::string("every manifest agrees with its manifest schema\n");
+                      std::string text;
+                      for (const auto& entry : report->GetArray()) {
+                        const std::string file = HoxPlatform::StripHostRoot(entry["file"].GetString());
+                        for (const auto& finding : entry["validation_errors"].GetArray()) {
+                          text += file + ": " + ManifestFinding(finding) + "\n";
+                        }
+                      }
+                      return text;
+                    },
+                    [report] {
+                      rapidjson::Document out(rapidjson::kObjectType);
+                      rapidjson::Value failures;
+                      failures.CopyFrom(*report, out.GetAllocator());
+                      out.AddMember("valid", report->Empty(), out.GetAllocator());
+                      out.AddMember("failures", failures, out.GetAllocator());
+                      return out;
+                    }});
+    return report->Empty() ? kExitOk : kExitNegative;
+  });
 }
 
 }  // namespace hoxcfg

@@ -2,83 +2,142 @@
 // and listing the installed key schemas.
 #include <memory>
 #include <string>
+#include <vector>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
+#include "hoxcfg/cli.h"
 #include "hoxcfg/commands.h"
-#include "hoxcfg/common.h"
 
 namespace hoxcfg {
 namespace {
 
-// Findings of the validator: exit 0 when there are none, 1 when there are;
-// a schema the validator cannot use is unusable input.
-int Report(const rapidjson::Document& errors, const GlobalOptions& options) {
-  for (const auto& e : errors.GetArray()) {
-    if (e["errId"].GetInt() == JsonValidator::VALIDATION_ERR_SCHEMA_INVALID) {
-      throw CommandError{JsonValidator::VALIDATION_ERR_SCHEMA_INVALID, e["error"].GetString()};
+// The validator's findings as the answer: exit 0 when there are none, 1
+// when there are; a schema the validator cannot use is unusable input.
+int Report(const GlobalOptions& options, std::shared_ptr<rapidjson::Document> findings, const std::string& document,
+           const std::string& schema) {
+  for (const auto& f : findings->GetArray()) {
+    if (f["errId"].GetInt() == JsonValidator::VALIDATION_ERR_SCHEMA_INVALID) {
+      throw Failure(f["error"].GetString(), "", kExitUsage, InFile(schema));
     }
   }
-  WriteOutput(FormatJson(errors, options), "");
-  return errors.Empty() ? kExitOk : kExitNegative;
+  Print(options, {[findings, document] {
+                    if (findings->Empty()) return DisplayName(document) + ": valid\n";
+                    std::string text;
+                    for (const auto& f : findings->GetArray()) {
+                      text += FormatWhere(Where{document, 0, 0, f["field"].GetString()}) + ": " +
+                              f["error"].GetString() + "\n";
+                    }
+                    return text;
+                  },
+                  [findings] {
+                    rapidjson::Document out(rapidjson::kObjectType);
+                    rapidjson::Value list;
+                    list.CopyFrom(*findings, out.GetAllocator());
+                    out.AddMember("valid", findings->Empty(), out.GetAllocator());
+                    out.AddMember("findings", list, out.GetAllocator());
+                    return out;
+                  }});
+  return findings->Empty() ? kExitOk : kExitNegative;
 }
 
 void RegisterSchemaCheck(CLI::App& app, GlobalOptions& options) {
-  auto* cmd = app.add_subcommand("schema-check",
-                                 "Validate DOCUMENT against the JSON schema SCHEMA, or with --host against the "
-                                 "installed key schemas; prints the errors as JSON")
-                  ->fallthrough();
+  auto* cmd = AddCommand(app, "schema-check",
+                         "Check DOCUMENT against the JSON schema SCHEMA, or with --host against the installed key "
+                         "schemas",
+                         {{kExitOk, "DOCUMENT is valid"},
+                          {kExitNegative, "it is not: each finding is listed"},
+                          {kExitUsage, kUsageStatus + std::string(" (also: an unusable schema)")}});
   auto files = std::make_shared<std::vector<std::string>>();
   auto host = std::make_shared<bool>(false);
-  cmd->add_flag("--host", *host, "DOCUMENT is a host document: check it against the installed schemas");
-  cmd->add_option("files", *files, "SCHEMA DOCUMENT, or DOCUMENT with --host")->required()->expected(1, 2);
-  cmd->callback([&options, files, host] {
-    Run(options, [&] {
-      if (files->size() != (*host ? 1u : 2u)) {
-        throw CommandError{kExitError, *host ? "--host takes one DOCUMENT" : "expected SCHEMA DOCUMENT"};
-      }
-      rapidjson::Document document;
-      HoxConfigManager::CreateDocumentFromFile(files->back().c_str(), document);
+  cmd->add_flag("--host", *host, "DOCUMENT is a configuration document: check it against the installed schemas");
+  cmd->add_option("files", *files, "SCHEMA DOCUMENT, or DOCUMENT with --host ('-': standard input)")
+      ->required()
+      ->expected(1, 2)
+      ->type_name("FILE");
+  SetAction(cmd, options, Needs::kNothing, [&options, files, host] {
+    if (files->size() != (*host ? 1u : 2u)) {
+      throw Failure(*host ? "--host takes one DOCUMENT" : "expected SCHEMA DOCUMENT",
+                    "see `hoxcfg schema-check --help`");
+    }
+    const std::string& documentPath = files->back();
+    auto findings = std::make_shared<rapidjson::Document>();
+    if (*host) {
+      RequireHost();
+      const rapidjson::Document document = ReadConfigurationDocument(documentPath);
       rapidjson::Document schema;
-      rapidjson::Document errors;
-      if (!*host) {
-        HoxConfigManager::CreateDocumentFromFile(files->front().c_str(), schema);
-        JsonValidator::Validate(schema, document, errors, {}, "");
-        return Report(errors, options);
+      if (!HoxConfigManager::GenerateHostDocumentSchema(document, schema)) {
+        findings->Swap(schema);  // the keys without schema
+        return Report(options, findings, documentPath, "");
       }
-      if (!document.IsObject()) throw CommandError{kExitError, "a host document must be a JSON object"};
-      if (!HoxConfigManager::GenerateHostDocumentSchema(document, schema)) return Report(schema, options);
       const rapidjson::Value& root = HoxConfigManager::DocumentShape::Unwrap(document);
-      JsonValidator::ValidateCMDocument(schema, root, errors, {}, "");
-      return Report(errors, options);
-    });
+      JsonValidator::ValidateCMDocument(schema, root, *findings, {}, "");
+      return Report(options, findings, documentPath, "");
+    }
+    const std::string& schemaPath = files->front();
+    const rapidjson::Document schema = ReadJsonArgument(schemaPath);
+    const rapidjson::Document document = ReadJsonArgument(documentPath);
+    // A schema holds keywords; a configuration document holds components,
+    // which the validator would ignore as unknown keywords and call valid.
+    if (!schema.IsObject() || (!schema.ObjectEmpty() && !LooksLikeJsonSchema(schema))) {
+      if (LooksLikeJsonSchema(document)) {
+        throw Failure("the schema comes first: " + DisplayName(documentPath) + " is the schema", 
+                      "run `hoxcfg schema-check SCHEMA DOCUMENT`");
+      }
+      throw Failure("this is not a JSON schema: it holds no schema keyword", "", kExitUsage, InFile(schemaPath));
+    }
+    JsonValidator::Validate(schema, document, *findings, {}, "");
+    return Report(options, findings, documentPath, schemaPath);
   });
 }
 
 void RegisterSchemas(CLI::App& app, GlobalOptions& options) {
-  auto* cmd =
-      app.add_subcommand("schemas", "List the installed key schemas and the files that failed to load")->fallthrough();
-  cmd->callback([&options] {
-    Run(options, [&] {
-      auto store = HoxSchemaStore::SchemaStore::GetStore();
-      if (!store) {
-        HoxConfigManager::ThrowException<HoxConfigManager::ConfigManagerException>(
-            HoxConfigManager::SchemaStoreAccessFailed);
-      }
-      rapidjson::Document out(rapidjson::kObjectType);
-      auto& a = out.GetAllocator();
-      rapidjson::Value keys(rapidjson::kArrayType);
-      for (const auto& id : store->ListKeys()) keys.PushBack(rapidjson::Value(id.toString(), a), a);
-      rapidjson::Value errors(rapidjson::kArrayType);
-      for (const auto& e : store->GetLoadErrors()) errors.PushBack(rapidjson::Value(e, a), a);
-      const bool clean = errors.Empty();
-      out.AddMember("keys", keys, a);
-      out.AddMember("errors", errors, a);
-      WriteOutput(FormatJson(out, options), "");
-      return clean ? kExitOk : kExitNegative;
-    });
+  auto* cmd = AddCommand(app, "schemas", "List the installed key schemas and the schema files that failed to load",
+                         {{kExitOk, "every schema file loaded"},
+                          {kExitNegative, "some failed to load: they are listed"},
+                          {kExitUsage, kUsageStatus}});
+  SetAction(cmd, options, Needs::kHost, [&options] {
+    auto store = HoxSchemaStore::SchemaStore::GetStore();
+    if (!store) {
+      HoxConfigManager::ThrowException<HoxConfigManager::ConfigManagerException>(
+          HoxConfigManager::SchemaStoreAccessFailed);
+    }
+    const std::vector<std::string> errors = store->GetLoadErrors();
+    Print(options, {[store, errors] {
+                      Table table({"ITEM", "INSTANCES", "IDENTITY"});
+                      for (const auto& id : store->ListKeys()) {
+                        const auto schema = store->Find(id.component, id.group, id.key);
+                        const bool multi = schema && schema->IsMultiInstance();
+                        table.Add({ItemName(id.component, id.group, id.key), multi ? "many" : "one",
+                                   multi ? schema->GetIdentityMember() : "-"});
+                      }
+                      std::string text = table.Render();
+                      if (!errors.empty()) text += "\nschema files that failed to load:\n";
+                      for (const std::string& e : errors) text += "  " + e + "\n";
+                      return text;
+                    },
+                    [store, errors] {
+                      rapidjson::Document out(rapidjson::kObjectType);
+                      auto& a = out.GetAllocator();
+                      rapidjson::Value keys(rapidjson::kArrayType);
+                      for (const auto& id : store->ListKeys()) {
+                        const auto schema = store->Find(id.component, id.group, id.key);
+                        rapidjson::Value key(rapidjson::kObjectType);
+                        key.AddMember("item", rapidjson::Value(ItemName(id.component, id.group, id.key), a), a);
+                        key.AddMember("multiInstance", schema && schema->IsMultiInstance(), a);
+                        key.AddMember("identity", rapidjson::Value(schema ? schema->GetIdentityMember() : "", a), a);
+                        keys.PushBack(key, a);
+                      }
+                      rapidjson::Value failed(rapidjson::kArrayType);
+                      for (const std::string& e : errors) failed.PushBack(rapidjson::Value(e, a), a);
+                      out.AddMember("keys", keys, a);
+                      out.AddMember("errors", failed, a);
+                      return out;
+                    },
+                    /*list=*/true});
+    return errors.empty() ? kExitOk : kExitNegative;
   });
 }
 

@@ -1,7 +1,8 @@
-// hoxcfg init, export, show and maintenance: setting up a host root and
-// reading its configuration out of the store.
-#include <cstdlib>
+// hoxcfg init, export, show and maintenance: setting up a host root,
+// reading its configuration out of the store, and its maintenance mode.
 #include <iostream>
+#include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -12,23 +13,13 @@
 #include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
+#include "hoxcfg/cli.h"
 #include "hoxcfg/commands.h"
-#include "hoxcfg/common.h"
 #include "hoxcfg/host_setup.h"
 
 namespace hoxcfg {
 namespace {
 
-
-// Reading commands must not create a store as a side effect: a mistyped
-// root is an error, not a new empty host.
-void RequireHostRoot() {
-  const std::string store = HoxPlatform::HostPath(HoxPlatform::HostPaths::kStore);
-  if (!HoxConfigManager::fileExists(store)) {
-    throw CommandError{HoxConfigManager::ConfigStoreConnectFailed,
-                       "Failed to connect to ConfigStore: no store at " + store + " (run hoxcfg init)"};
-  }
-}
 
 // Replaces every sensitive value of the items of `doc` (a host document,
 // possibly under "profile") by the mask of the store, so that what is shown
@@ -49,86 +40,116 @@ void RedactDocument(rapidjson::Document& doc) {
 }
 
 void RegisterInit(CLI::App& app, GlobalOptions& options) {
-  auto* cmd = app.add_subcommand("init", "Create a host root: store, schemas, manifest schemas, runners, plugins")
-                  ->fallthrough();
+  auto* cmd = AddCommand(app, "init", "Create a host root: store, schemas, manifest schemas, runners, plugins",
+                         {{kExitOk, "the host root is ready"}, {kExitUsage, kUsageStatus}});
   auto sample = std::make_shared<bool>(false);
   auto force = std::make_shared<bool>(false);
   cmd->add_flag("--sample", *sample, "Also load the sample host: configuration, host facts, SSH files");
   cmd->add_flag("--force", *force, "Allow initialising the real root /");
-  cmd->callback([&options, sample, force] {
-    Run(options, [&] {
-      const std::string root = HoxPlatform::HostRoot();
-      if ((root == "/" || root.empty()) && !*force) {
-        throw CommandError{kExitError, "refusing to initialise the real root /; pass --root DIR (or --force)"};
-      }
-      const std::vector<std::string> report = InitHostRoot(LocateProductFiles(), *sample);
-      std::string text;
-      for (const std::string& line : report) text += line + "\n";
-      std::cout << text << std::flush;
-      return kExitOk;
-    });
+  SetAction(cmd, options, Needs::kNothing, [&options, sample, force] {
+    const std::string root = HoxPlatform::HostRoot();
+    if (root == "/" && !*force) {
+      throw Failure("refusing to initialise the real root /", "pass --root DIR, or --force to mean it");
+    }
+    auto steps = std::make_shared<std::vector<std::string>>(InitHostRoot(LocateProductFiles(), *sample));
+    AuditChange(*sample ? "host root initialised with the sample host" : "host root initialised");
+    Print(options, {[steps] {
+                      std::string text;
+                      for (const std::string& line : *steps) text += line + "\n";
+                      return text;
+                    },
+                    [steps, root] {
+                      rapidjson::Document out(rapidjson::kObjectType);
+                      auto& a = out.GetAllocator();
+                      rapidjson::Value list(rapidjson::kArrayType);
+                      for (const std::string& line : *steps) list.PushBack(rapidjson::Value(line, a), a);
+                      out.AddMember("root", rapidjson::Value(root, a), a);
+                      out.AddMember("steps", list, a);
+                      return out;
+                    }});
+    return kExitOk;
   });
 }
 
 void RegisterExport(CLI::App& app, GlobalOptions& options) {
-  auto* cmd = app.add_subcommand("export", "Print the exported host document")->fallthrough();
+  auto* cmd = AddCommand(app, "export",
+                         "Print the host's configuration as a document to apply to another host (secrets in clear)",
+                         {{kExitOk, "exported"}, {kExitUsage, kUsageStatus}});
   auto output = std::make_shared<std::string>();
-  cmd->add_option("--output,-o", *output, "Write the document to FILE (mode 0600) instead of stdout");
-  cmd->callback([&options, output] {
-    Run(options, [&] {
-      RequireHostRoot();
-      const rapidjson::Document doc = HoxConfigManager::ExportDocument();
-      // The export carries secrets in clear (it must be applicable to another
-      // host), so a file is readable by its owner only.
-      WritePrivateOutput(FormatJson(doc, options), *output);
-      return kExitOk;
-    });
+  cmd->add_option("--output,-o", *output, "Write the document to FILE (mode 0600, replaced atomically)")
+      ->type_name("FILE");
+  SetAction(cmd, options, Needs::kHost, [&options, output] {
+    // Indented, to be read and edited; the export carries secrets in clear
+    // (it must be applicable to another host), so a file is its owner's only.
+    WriteOutput(JsonText(HoxConfigManager::ExportDocument(), options), *output);
+    return kExitOk;
   });
 }
 
 void RegisterShow(CLI::App& app, GlobalOptions& options) {
-  auto* cmd =
-      app.add_subcommand("show", "Print an extracted configuration (sensitive values masked)")->fallthrough();
+  auto* cmd = AddCommand(app, "show", "Print an extracted configuration (sensitive values masked)",
+                         {{kExitOk, "shown"}, {kExitUsage, kUsageStatus}});
   auto which = std::make_shared<std::string>("current");
   cmd->add_option("what", *which, "current (default), user, desired or smartnic")
       ->check(CLI::IsMember({"current", "user", "desired", "smartnic"}));
-  cmd->callback([&options, which] {
-    Run(options, [&] {
-      RequireHostRoot();
-      rapidjson::Document doc;
-      if (*which == "current") {
-        doc = HoxConfigManager::ExtractCurrentConfiguration();
-      } else if (*which == "user") {
-        doc = HoxConfigManager::ExtractUserConfiguration(true);
-      } else if (*which == "desired") {
-        doc = HoxConfigManager::ExtractDesiredConfiguration();
-      } else {
-        doc = HoxConfigManager::ExtractSmartnicConfiguration();
-      }
-      RedactDocument(doc);
-      std::cout << FormatJson(doc, options) << std::flush;
-      return kExitOk;
-    });
+  SetAction(cmd, options, Needs::kHost, [&options, which] {
+    rapidjson::Document doc;
+    if (*which == "current") {
+      doc = HoxConfigManager::ExtractCurrentConfiguration();
+    } else if (*which == "user") {
+      doc = HoxConfigManager::ExtractUserConfiguration(true);
+    } else if (*which == "desired") {
+      doc = HoxConfigManager::ExtractDesiredConfiguration();
+    } else {
+      doc = HoxConfigManager::ExtractSmartnicConfiguration();
+    }
+    RedactDocument(doc);
+    std::cout << JsonText(doc, options) << std::flush;
+    return kExitOk;
   });
 }
 
+Answer MaintenanceAnswer(bool enabled, std::optional<bool> changed) {
+  return {[enabled, changed] {
+            return std::string("maintenance mode: ") + (enabled ? "on" : "off") +
+                   (changed.has_value() && !*changed ? " (unchanged)" : "") + "\n";
+          },
+          [enabled, changed] {
+            rapidjson::Document out(rapidjson::kObjectType);
+            out.AddMember("maintenanceMode", enabled, out.GetAllocator());
+            if (changed.has_value()) out.AddMember("changed", *changed, out.GetAllocator());
+            return out;
+          }};
+}
+
 void RegisterMaintenance(CLI::App& app, GlobalOptions& options) {
-  auto* cmd = app.add_subcommand("maintenance", "Enter, exit or show the host's maintenance mode")->fallthrough();
+  auto* cmd = AddCommand(app, "maintenance", "Enter, exit or show the host's maintenance mode");
   cmd->require_subcommand(1);
-  auto add = [&](const char* name, const char* help, int action) {
-    cmd->add_subcommand(name, help)->fallthrough()->callback([&options, action] {
-      Run(options, [&] {
-        RequireHostRoot();
-        if (action >= 0) HoxConfigStore::SetMaintenanceMode(action == 1);
-        const bool enabled = HoxConfigManager::IsMaintenanceModeEnabled();
-        std::cout << (enabled ? "maintenance mode: entered\n" : "maintenance mode: not entered\n") << std::flush;
-        return kExitOk;
-      });
+  for (const bool enter : {true, false}) {
+    auto* change = AddCommand(*cmd, enter ? "enter" : "exit",
+                              enter ? "Put the host into maintenance mode" : "Take the host out of maintenance mode",
+                              {{kExitOk, enter ? "the host is in maintenance mode" : "the host is not in maintenance mode"},
+                               {kExitUsage, kUsageStatus}});
+    SetAction(change, options, Needs::kHost, [&options, enter] {
+      const bool changed = HoxConfigManager::IsMaintenanceModeEnabled() != enter;
+      if (changed) {
+        Confirm(options, enter ? "put the host into maintenance mode" : "take the host out of maintenance mode");
+        HoxConfigStore::SetMaintenanceMode(enter);
+        AuditChange(enter ? "maintenance mode entered" : "maintenance mode exited");
+      }
+      Print(options, MaintenanceAnswer(HoxConfigManager::IsMaintenanceModeEnabled(), changed));
+      return kExitOk;
     });
-  };
-  add("enter", "Put the host into maintenance mode", 1);
-  add("exit", "Take the host out of maintenance mode", 0);
-  add("status", "Print whether the host is in maintenance mode", -1);
+  }
+  auto* status = AddCommand(*cmd, "status", "Tell whether the host is in maintenance mode",
+                            {{kExitOk, "the host is in maintenance mode"},
+                             {kExitNegative, "it is not"},
+                             {kExitUsage, kUsageStatus}});
+  SetAction(status, options, Needs::kHost, [&options] {
+    const bool enabled = HoxConfigManager::IsMaintenanceModeEnabled();
+    Print(options, MaintenanceAnswer(enabled, std::nullopt));
+    return enabled ? kExitOk : kExitNegative;
+  });
 }
 
 }  // namespace

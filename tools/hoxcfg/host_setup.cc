@@ -1,7 +1,6 @@
 #include "hoxcfg/host_setup.h"
 
 #include <filesystem>
-#include <iostream>
 #include <string_view>
 #include <system_error>
 
@@ -12,7 +11,7 @@
 #include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
-#include "hoxcfg/common.h"
+#include "hoxcfg/cli.h"
 
 namespace fs = std::filesystem;
 
@@ -33,7 +32,7 @@ auto Checked(F&& step) {
   try {
     return step();
   } catch (const HoxPlatform::FileError& e) {
-    throw CommandError{kExitError, e.what()};
+    throw Failure(e.reason(), "", kExitUsage, InFile(e.path()));
   }
 }
 
@@ -58,7 +57,7 @@ int CopyTree(const std::string& from, const std::string& to, mode_t mode, FileKi
   const HoxPlatform::DirectoryListing listing = HoxPlatform::ListFiles(from);
   if (!listing.problems.empty()) {
     const auto& problem = listing.problems.front();
-    throw CommandError{kExitError, "cannot copy " + problem.path + ": " + problem.reason};
+    throw Failure("cannot copy " + problem.path + ": " + problem.reason);
   }
   for (const std::string& file : listing.files) {
     CopyFile(file, (fs::path(to) / fs::path(file).lexically_relative(from)).string(), mode, kind);
@@ -151,7 +150,7 @@ ProductFiles LocateProductFiles() {
 std::vector<std::string> InitHostRoot(const ProductFiles& files, bool sample) {
   const std::string sampleDir = files.dataDir + "/sample-host";
   if (sample && !IsDir(sampleDir)) {
-    throw CommandError{kExitError, "the sample host is not shipped (looked in " + sampleDir + ")"};
+    throw Failure("the sample host is not shipped (looked in " + sampleDir + ")");
   }
   std::vector<std::string> report;
   report.push_back("host root " + HoxPlatform::HostRoot() + " (product files from " +
@@ -185,22 +184,13 @@ std::vector<std::string> InitHostRoot(const ProductFiles& files, bool sample) {
   report.push_back(InstallSamplePlugins(files));
 
   const auto db = HoxConfigStore::GetDBStore(0, true);
-  if (!db) throw CommandError{kExitError, "cannot create the configuration store"};
+  if (!db) throw Failure("cannot create the configuration store");
   report.push_back("configuration store " + db->GetPath());
 
   if (sample) {
     for (std::string& line : InstallSampleHost(sampleDir)) report.push_back(std::move(line));
   }
   return report;
-}
-
-void WritePrivateOutput(const std::string& text, const std::string& path) {
-  if (path.empty() || path == "-") {
-    std::cout << text << std::flush;
-    return;
-  }
-  // The export carries sensitive values in clear: only the owner may read it.
-  Checked([&] { HoxPlatform::WriteFileAtomically(path, text, kPrivate, HoxPlatform::Durability::kDurable); });
 }
 
 }  // namespace hoxcfg

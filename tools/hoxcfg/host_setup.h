@@ -25,10 +25,7 @@ ProductFiles LocateProductFiles();
 // the manifest schemas, the runners and the sample plugins found in `files`;
 // with `sample`, also the sample host's facts, DMI uuid, SSH files and its
 // user and default configuration. Returns one line per step, naming what it
-// skipped. Throws CommandError or the library's exceptions on failure.
+// skipped. Throws Failure or the library's exceptions on failure.
 std::vector<std::string> InitHostRoot(const ProductFiles& files, bool sample);
-
-// Writes `text` to stdout, or to `path` (replaced atomically, mode 0600).
-void WritePrivateOutput(const std::string& text, const std::string& path);
 
 }  // namespace hoxcfg
