@@ -30,17 +30,26 @@ const CLI::App* RootOf(const CLI::App* app) {
 // help: they are accepted anywhere on the line.
 class HelpFormatter final : public CLI::Formatter {
  public:
+  // A positional whose option text is set shows that text in the usage
+  // line ("[SCHEMA] DOCUMENT" rather than "FILES(1x)").
+  std::string make_option_usage(const CLI::Option* opt) const override {
+    return opt->get_option_text().empty() ? CLI::Formatter::make_option_usage(opt) : opt->get_option_text();
+  }
   std::string make_help(const CLI::App* app, std::string name, CLI::AppFormatMode mode) const override {
     if (mode == CLI::AppFormatMode::Sub) return make_expanded(app);
     std::ostringstream out;
     out << make_description(app) << make_usage(app, name) << make_positionals(app) << make_groups(app, mode)
         << make_subcommands(app, mode);
     if (app->get_parent() != nullptr) {
+      // Named here, described once in the help of hoxcfg itself.
       const CLI::App* root = RootOf(app);
-      const auto globals = root->get_options([root](const CLI::Option* o) {
-        return o->get_group() == kGlobalGroup && o != root->get_help_ptr() && o != root->get_option_no_throw("--version");
-      });
-      out << make_group(kGlobalGroup, false, globals);
+      std::string names;
+      for (const CLI::Option* o : root->get_options([](const CLI::Option* o) { return o->get_group() == kGlobalGroup; })) {
+        if (o == root->get_help_ptr() || o->check_name("--version")) continue;
+        names += (names.empty() ? "" : ", ") + o->get_name(false, true) +
+                 (o->get_expected_min() > 0 ? " " + o->get_type_name() : std::string());
+      }
+      out << "\n" << kGlobalGroup << " (see hoxcfg --help):\n  " << names << "\n";
     }
     out << '\n' << make_footer(app);
     return out.str();
@@ -84,7 +93,7 @@ const CLI::App* FindUnknownCommand(const CLI::App& app, int argc, char** argv, s
     if (arg == "--") return nullptr;
     if (arg.size() > 1 && arg[0] == '-') {
       const CLI::Option* option = FindOption(level, arg.substr(0, arg.find('=')));
-      if (option != nullptr && option->get_type_size() > 0 && arg.find('=') == std::string::npos) ++i;
+      if (option != nullptr && option->get_expected_min() > 0 && arg.find('=') == std::string::npos) ++i;
       continue;
     }
     const auto subs = level->get_subcommands([&arg](const CLI::App* s) { return s->check_name(arg); });
@@ -176,7 +185,9 @@ std::string DisplayName(const std::string& path) { return path == "-" ? "<stdin>
 
 std::string FormatWhere(const Where& where) {
   std::string text = where.file.empty() ? std::string() : DisplayName(where.file);
-  if (where.line > 0) {
+  // A position in a text that came from no file (a store row) means nothing
+  // to the reader; the reason still says what is wrong.
+  if (where.line > 0 && !text.empty()) {
     text += ":" + std::to_string(where.line) + ":" + std::to_string(where.column);
   } else if (!where.documentPath.empty()) {
     text += (text.empty() ? "" : ": ") + where.documentPath;

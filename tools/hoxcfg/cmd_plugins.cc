@@ -134,11 +134,15 @@ void RegisterPluginCommands(CLI::App& app, GlobalOptions& options) {
   SetAction(check, options, Needs::kHost, [&options] {
     auto report = std::make_shared<rapidjson::Document>();
     ValidateAllPlugins(PluginDirectory(), PluginSchemaDirectory(), *report);
+    // Host paths, as everywhere else in the output.
+    for (auto& entry : report->GetArray()) {
+      entry["file"].SetString(HoxPlatform::StripHostRoot(entry["file"].GetString()), report->GetAllocator());
+    }
     Print(options, {[report] {
                       if (report->Empty()) return std::string("every manifest agrees with its manifest schema\n");
                       std::string text;
                       for (const auto& entry : report->GetArray()) {
-                        const std::string file = HoxPlatform::StripHostRoot(entry["file"].GetString());
+                        const std::string file = entry["file"].GetString();
                         for (const auto& finding : entry["validation_errors"].GetArray()) {
                           text += file + ": " + ManifestFinding(finding) + "\n";
                         }

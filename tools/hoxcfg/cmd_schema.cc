@@ -53,10 +53,10 @@ void RegisterSchemaCheck(CLI::App& app, GlobalOptions& options) {
   auto files = std::make_shared<std::vector<std::string>>();
   auto host = std::make_shared<bool>(false);
   cmd->add_flag("--host", *host, "DOCUMENT is a configuration document: check it against the installed schemas");
-  cmd->add_option("files", *files, "SCHEMA DOCUMENT, or DOCUMENT with --host ('-': standard input)")
+  cmd->add_option("FILES", *files, "SCHEMA DOCUMENT, or DOCUMENT with --host ('-': standard input)")
       ->required()
       ->expected(1, 2)
-      ->type_name("FILE");
+      ->option_text("[SCHEMA] DOCUMENT");
   SetAction(cmd, options, Needs::kNothing, [&options, files, host] {
     if (files->size() != (*host ? 1u : 2u)) {
       throw Failure(*host ? "--host takes one DOCUMENT" : "expected SCHEMA DOCUMENT",
