@@ -39,12 +39,17 @@ else
 fi
 export HOX_ROOT="$root"
 
+# Runs one command; exit 1 is an answer ("not compliant", "not in
+# maintenance mode") and is shown, anything above ends the demo.
 step() {
   echo
   echo "== $1"
   shift
   echo "\$ hoxcfg $*"
-  "$hoxcfg" "$@"
+  local rc=0
+  "$hoxcfg" "$@" || rc=$?
+  [ "$rc" -eq 0 ] || echo "(exit $rc)"
+  [ "$rc" -le 1 ] || exit "$rc"
 }
 
 step "Create a sample host under $root" init --sample
@@ -63,7 +68,10 @@ echo "== The current configuration as the drift walk sees it (secrets masked; th
 echo "\$ hoxcfg show current"
 "$hoxcfg" show current >"$root/current.json"
 grep -n '\*\*\*\*\*\*' <(python3 -m json.tool "$root/current.json")
-step "Maintenance mode" maintenance status
+step "Maintenance mode: the exit status answers too (0 on, 1 off)" maintenance status
+step "Enter it (without a terminal to ask, --yes confirms; the change is logged to the system log)" \
+  maintenance enter --yes
+step "Leave it again" maintenance exit --yes
 
 step "Is the host compliant with its own export? (exit 0: compliant)" compliance "$root/exported-host.json"
 
@@ -72,13 +80,27 @@ step "Is the host compliant with its own export? (exit 0: compliant)" compliance
 scripts/demo-drift.sh "$hoxcfg" "$root"
 
 echo
-echo "== The installed plugins and their dependency order"
-echo "\$ hoxcfg plugins list"
-"$hoxcfg" plugins list | python3 -m json.tool > "$root/plugins.json"
-head -n 40 "$root/plugins.json"
-echo "... ($(wc -l < "$root/plugins.json") lines; the order:)"
-python3 -c 'import json,sys; print(" -> ".join(json.load(open(sys.argv[1]))["order"]))' "$root/plugins.json" 2>/dev/null || true
-step "Every installed manifest checked against its manifest schema (an empty report: all valid)" plugins check
+echo "== The installed plugins and their dependency order (a table on a terminal, JSON in a pipe)"
+echo "\$ hoxcfg plugins list | ..."
+"$hoxcfg" plugins list > "$root/plugins.json"
+python3 - "$root/plugins.json" <<'PY'
+import json, sys
+registry = json.load(open(sys.argv[1]))
+for p in registry["plugins"]:
+    print("%-18s v%d %-7s %-28s %s" % (p["id"], p["version"], p["type"], ",".join(p["supports"]), " ".join(p["accepts"])))
+print("apply order:", " -> ".join(registry["order"]))
+PY
+step "Every installed manifest checked against its manifest schema" plugins check
+
+echo
+echo "== Errors say what, where and what to do"
+printf '{\n  "profile": {\n    "network": {"dns": {"config": {"servers": ["10.0.0.1",]}}}\n  }\n}\n' > "$root/broken.json"
+for args in "compliance $root/broken.json" "compliance $root/missing.json" "--root $root/nohost drift $root/exported-host.json" \
+            "complaince $root/exported-host.json"; do
+  echo "\$ hoxcfg $args"
+  # shellcheck disable=SC2086
+  "$hoxcfg" $args 2>&1 || echo "(exit $?)"
+done
 
 echo
 echo "The furthest-along real operations are the compliance check and the apply-task"
