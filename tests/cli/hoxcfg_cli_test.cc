@@ -81,7 +81,7 @@ TEST_F(HoxcfgCliTest, FileProblemsNameTheFileTheReasonAndThePosition) {
       {"compliance " + r + "/broken.json", "hoxcfg: " + r + "/broken.json" + parseFault},
       {"drift - < " + r + "/broken.json", "hoxcfg: <stdin>" + parseFault},
       {"compliance " + r + "/missing.json", "hoxcfg: " + r + "/missing.json: No such file or directory\n"},
-      {"drift " + r, "hoxcfg: " + r + ": Is a directory\n"},
+      {"drift " + r, "hoxcfg: " + r + ": not a regular file (a directory)\n"},
       {"compliance " + r + "/array.json", "hoxcfg: " + r + "/array.json: a configuration document is a JSON object, "
                                           "this is an array: its members are components, or one member \"profile\" "
                                           "holding them\n"},
