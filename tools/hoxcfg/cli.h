@@ -24,7 +24,9 @@
 //     nothing and lets the exit status answer. Tables align columns; an item
 //     is always spelled ItemName(): "/component/group/key[identity]".
 //   - Input: ReadJsonArgument / ReadConfigurationDocument read a file or
-//     "-" (standard input) and report faults with their location.
+//     "-" (standard input) and report faults with their location; work on
+//     the document runs inside InDocument(path, ...), so that the library's
+//     faults in it are reported in that file.
 //   - Changes of host state: Confirm() first (asks on a terminal, requires
 //     --yes without one, exit 2 when refused), AuditChange() after, which
 //     writes "WHAT by USER" to the host's system log.
@@ -49,6 +51,7 @@
 
 #include <CLI/CLI.hpp>
 
+#include <hoxcm/errors.h>
 #include <hoxcm/json.h>
 #include <hoxcm/task.h>
 
@@ -155,6 +158,10 @@ struct Answer {
 // JSON with --json (or for a list when stdout is not a terminal), else the
 // text; nothing with --quiet.
 void Print(const GlobalOptions& options, const Answer& answer);
+// A copy of `value` as a document of its own (for Answer::json).
+rapidjson::Document CopyOf(const rapidjson::Value& value);
+// The shape of every check: {"valid": <`findings` is empty>, NAME: findings}.
+rapidjson::Document CheckShape(const char* name, const rapidjson::Value& findings);
 // JSON text, indented by two spaces unless --compact; ends with '\n'.
 std::string JsonText(const rapidjson::Value& value, const GlobalOptions& options);
 // Writes `text` to stdout, or to `path` (replaced atomically, mode 0600:
@@ -196,6 +203,19 @@ std::string ReportPathToItemName(const std::string& path, const rapidjson::Value
 rapidjson::Document ReadJsonArgument(const std::string& path);
 // A configuration document: a JSON object that is not a JSON schema.
 rapidjson::Document ReadConfigurationDocument(const std::string& path);
+// Runs `work` on the document read from `path`: a library error about the
+// document that names no file (a wrong type somewhere in it, a document
+// path) is reported in that file.
+void AttachDocumentFile(HoxConfigStore::ConfigStoreException& error, const std::string& path);
+template <typename F>
+auto InDocument(const std::string& path, F&& work) {
+  try {
+    return work();
+  } catch (HoxConfigStore::ConfigStoreException& error) {
+    AttachDocumentFile(error, path);
+    throw;
+  }
+}
 // True for a JSON schema rather than a document: "$schema", or a "type"
 // that is a string or array (a document's top-level members are objects),
 // or no member but schema keywords.

@@ -142,7 +142,7 @@ void PrintUsageError(const CLI::App& app, const CLI::ParseError& error, int argc
 std::string RemedyFor(int code) {
   switch (code) {
     case HoxConfigStore::ConfigStoreException::kConfigStoreError:
-      return "a value in the document has the wrong type (components hold groups, groups hold keys)";
+      return "a value has the wrong type; `hoxcfg schema-check --host` on the document says which";
     case HoxConfigManager::SchemaStoreAccessFailed:
       return "check the schemas with `hoxcfg schemas`";
     case HoxConfigManager::HostNotInMaintenanceMode:

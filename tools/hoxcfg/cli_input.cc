@@ -55,13 +55,17 @@ rapidjson::Document ReadJsonArgument(const std::string& path) {
   try {
     HoxConfigManager::ParseDocument(text, doc);
   } catch (HoxConfigStore::ConfigStoreException& e) {
-    // The parser knows the position; the name of the file is ours.
-    HostCtl::Lib::ErrorLocation location = e.GetLocation() ? *e.GetLocation() : HostCtl::Lib::ErrorLocation{};
-    location.file = path;
-    e.SetLocation(std::move(location));
+    AttachDocumentFile(e, path);  // the parser knows the position, the name of the file is ours
     throw;
   }
   return doc;
+}
+
+void AttachDocumentFile(HoxConfigStore::ConfigStoreException& error, const std::string& path) {
+  HostCtl::Lib::ErrorLocation location = error.GetLocation() ? *error.GetLocation() : HostCtl::Lib::ErrorLocation{};
+  if (!location.file.empty()) return;  // a fault in another file (a manifest, a schema)
+  location.file = path;
+  error.SetLocation(std::move(location));
 }
 
 bool LooksLikeJsonSchema(const rapidjson::Value& value) {

@@ -30,6 +30,20 @@ std::string JsonText(const rapidjson::Value& value, const GlobalOptions& options
   return std::string(buffer.GetString(), buffer.GetSize()) + "\n";
 }
 
+rapidjson::Document CopyOf(const rapidjson::Value& value) {
+  rapidjson::Document copy;
+  copy.CopyFrom(value, copy.GetAllocator());
+  return copy;
+}
+
+rapidjson::Document CheckShape(const char* name, const rapidjson::Value& findings) {
+  rapidjson::Document out(rapidjson::kObjectType);
+  auto& a = out.GetAllocator();
+  out.AddMember("valid", findings.IsArray() && findings.Empty(), a);
+  out.AddMember(rapidjson::StringRef(name), rapidjson::Value(findings, a), a);
+  return out;
+}
+
 void Print(const GlobalOptions& options, const Answer& answer) {
   if (options.quiet) return;
   const bool json = options.json || (answer.list && !StdoutIsTerminal());

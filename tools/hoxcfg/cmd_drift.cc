@@ -21,7 +21,7 @@ constexpr const char* kFileHelp = "Desired configuration document ('-': standard
 rapidjson::Document LoadDesired(const std::string& path) {
   const rapidjson::Document file = ReadConfigurationDocument(path);
   rapidjson::Document doc;
-  HoxConfigManager::CreateMergedDocument(file, doc);
+  InDocument(path, [&] { HoxConfigManager::CreateMergedDocument(file, doc); });
   return doc;
 }
 
@@ -61,7 +61,7 @@ void RegisterCompliance(CLI::App& app, GlobalOptions& options) {
   SetAction(cmd, options, Needs::kHost, [&options, file, events] {
     auto desired = std::make_shared<rapidjson::Document>(LoadDesired(*file));
     auto result = std::make_shared<HoxConfigManager::ComplianceResult>();
-    HoxConfigManager::CheckCompliance(*desired, *result, MakeTask(options, *events));
+    InDocument(*file, [&] { HoxConfigManager::CheckCompliance(*desired, *result, MakeTask(options, *events)); });
     Print(options, {[result, desired] {
                       const auto& report = result->document;
                       if (result->compliant) return std::string("compliant\n");
@@ -72,11 +72,7 @@ void RegisterCompliance(CLI::App& app, GlobalOptions& options) {
                              FormatList("DELETES", report["DELETES"], ComparedRoot(*desired)) +
                              FormatList("SETS", report["SETS"], ComparedRoot(*desired));
                     },
-                    [result] {
-                      rapidjson::Document out;
-                      out.CopyFrom(result->document, out.GetAllocator());
-                      return out;
-                    }});
+                    [result] { return CopyOf(result->document); }});
     return result->compliant ? kExitOk : kExitNegative;
   });
 }
@@ -92,8 +88,9 @@ void RegisterDrift(CLI::App& app, GlobalOptions& options) {
   cmd->add_flag("--boot", *boot, "The tasks of a boot-time apply: every item, without comparison");
   SetAction(cmd, options, Needs::kHost, [&options, file, boot] {
     rapidjson::Document desired = LoadDesired(*file);
-    auto tasks = std::make_shared<std::vector<HoxConfigManager::DesiredConfigInput>>(
-        *boot ? HoxConfigManager::GenerateBootTimeTasks(desired) : HoxConfigManager::GenerateApplyTasks(desired));
+    auto tasks = std::make_shared<std::vector<HoxConfigManager::DesiredConfigInput>>(InDocument(*file, [&] {
+      return *boot ? HoxConfigManager::GenerateBootTimeTasks(desired) : HoxConfigManager::GenerateApplyTasks(desired);
+    }));
     Print(options, {[tasks] {
                       if (tasks->empty()) return std::string("no tasks\n");
                       Table table({"ACTION", "ITEM"});

@@ -118,12 +118,7 @@ void RegisterPluginCommands(CLI::App& app, GlobalOptions& options) {
                           {{kExitOk, "listed"}, {kExitUsage, kUsageStatus}});
   SetAction(list, options, Needs::kHost, [&options] {
     auto registry = std::make_shared<rapidjson::Document>(ListPlugins());
-    Print(options, {[registry] { return PluginTable(*registry); },
-                    [registry] {
-                      rapidjson::Document out;
-                      out.CopyFrom(*registry, out.GetAllocator());
-                      return out;
-                    },
+    Print(options, {[registry] { return PluginTable(*registry); }, [registry] { return CopyOf(*registry); },
                     /*list=*/true});
     return kExitOk;
   });
@@ -149,14 +144,7 @@ void RegisterPluginCommands(CLI::App& app, GlobalOptions& options) {
                       }
                       return text;
                     },
-                    [report] {
-                      rapidjson::Document out(rapidjson::kObjectType);
-                      rapidjson::Value failures;
-                      failures.CopyFrom(*report, out.GetAllocator());
-                      out.AddMember("valid", report->Empty(), out.GetAllocator());
-                      out.AddMember("failures", failures, out.GetAllocator());
-                      return out;
-                    }});
+                    [report] { return CheckShape("failures", *report); }});
     return report->Empty() ? kExitOk : kExitNegative;
   });
 }

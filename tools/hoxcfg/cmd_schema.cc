@@ -32,14 +32,7 @@ int Report(const GlobalOptions& options, std::shared_ptr<rapidjson::Document> fi
                     }
                     return text;
                   },
-                  [findings] {
-                    rapidjson::Document out(rapidjson::kObjectType);
-                    rapidjson::Value list;
-                    list.CopyFrom(*findings, out.GetAllocator());
-                    out.AddMember("valid", findings->Empty(), out.GetAllocator());
-                    out.AddMember("findings", list, out.GetAllocator());
-                    return out;
-                  }});
+                  [findings] { return CheckShape("findings", *findings); }});
   return findings->Empty() ? kExitOk : kExitNegative;
 }
 
@@ -68,7 +61,7 @@ void RegisterSchemaCheck(CLI::App& app, GlobalOptions& options) {
       RequireHost();
       const rapidjson::Document document = ReadConfigurationDocument(documentPath);
       rapidjson::Document schema;
-      if (!HoxConfigManager::GenerateHostDocumentSchema(document, schema)) {
+      if (!InDocument(documentPath, [&] { return HoxConfigManager::GenerateHostDocumentSchema(document, schema); })) {
         findings->Swap(schema);  // the keys without schema
         return Report(options, findings, documentPath, "");
       }
