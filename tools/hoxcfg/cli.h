@@ -11,7 +11,7 @@
 //     (drift, invalid, failed, "no"), kExitUsage (unusable input, no host,
 //     refused), and the documented extras kExitStaged and kExitAborted.
 //   - Errors: throw Failure(what, todo) with a Where for what is wrong where
-//     and what to do, or let a library exception through: PrintError writes
+//     and what to do, or let a library exception through: PrintCurrentError writes
 //     "hoxcfg: WHERE: WHAT: TODO", where WHERE is FILE:LINE:COLUMN for a
 //     parse fault and "FILE: /document/path" for a value in a document, and
 //     library codes appear as "error 2080: <the library's text>". Usage
@@ -33,7 +33,26 @@
 //   - Long work: MakeTask() gives the library a TaskHandle that shows progress
 //     and plugin notifications on a terminal's stderr (not with --json or
 //     --quiet), or writes them as JSON lines to --events FILE
-//     (AddEventsOption), and reports Ctrl-C as an abort (exit kExitAborted).
+//     (AddEventsOption). A command whose work can be aborted holds an
+//     InterruptWatch while it runs: Ctrl-C then makes the task report an
+//     abort, and the command returns kExitAborted when Interrupted().
+//
+// A new command, for example:
+//
+//   auto* cmd = AddCommand(app, "validate", "Validate a desired document",
+//                          {{kExitOk, "FILE is valid"}, {kExitNegative, "it is not: each finding is listed"},
+//                           {kExitUsage, kUsageStatus}});
+//   auto file = std::make_shared<std::string>();
+//   cmd->add_option("FILE", *file, "Desired configuration document ('-': standard input)")->required();
+//   SetAction(cmd, options, Needs::kHost, [&options, file] {
+//     const rapidjson::Document desired = ReadConfigurationDocument(*file);
+//     auto result = ...;  // the library call, inside InDocument(*file, [&] { ... })
+//     Print(options, {[result] { return text; }, [result] { return CheckShape("findings", ...); }});
+//     return valid ? kExitOk : kExitNegative;
+//   });
+//
+// plus its section "## hoxcfg validate" in docs/cli.md (help block, JSON
+// example), which the docs test requires.
 //
 // Everything here runs on the command's thread, except that the library may
 // ask a task's IsAborted() from a plugin run's monitor thread.
