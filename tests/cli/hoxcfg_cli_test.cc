@@ -13,6 +13,7 @@
 #include <vector>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/host_documents.h>
 
 #include "support/run_hoxcfg.h"
 

@@ -7,6 +7,7 @@
 
 #include <hoxcm/documents.h>
 #include <hoxcm/files.h>
+#include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
 #include "hoxcfg/cli.h"
@@ -79,8 +80,7 @@ std::string Table::Render() const {
 
 std::string ItemName(std::string_view component, std::string_view group, std::string_view key,
                      std::string_view instance) {
-  std::string name = "/";
-  name.append(component).append("/").append(group).append("/").append(key);
+  std::string name = HoxConfigManager::DocumentShape::ItemPath(component, group, key);
   if (!instance.empty()) name.append("[").append(instance).append("]");
   return name;
 }

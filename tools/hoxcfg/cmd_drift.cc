@@ -25,13 +25,6 @@ rapidjson::Document LoadDesired(const std::string& path) {
   return doc;
 }
 
-// The part of a desired document the drift walk compares: its "profile"
-// when it has one.
-const rapidjson::Value& ComparedRoot(const rapidjson::Document& desired) {
-  const auto profile = desired.FindMember("profile");
-  return profile != desired.MemberEnd() ? profile->value : desired;
-}
-
 std::string Plural(std::size_t n, const char* word) {
   return std::to_string(n) + " " + word + (n == 1 ? "" : "s");
 }
@@ -64,13 +57,14 @@ void RegisterCompliance(CLI::App& app, GlobalOptions& options) {
     InDocument(*file, [&] { HoxConfigManager::CheckCompliance(*desired, *result, MakeTask(options, *events)); });
     Print(options, {[result, desired] {
                       const auto& report = result->document;
+                      const rapidjson::Value& compared = HoxConfigManager::DocumentShape::Unwrap(*desired);
                       if (result->compliant) return std::string("compliant\n");
                       const std::size_t count =
                           report["ADDS"].Size() + report["DELETES"].Size() + report["SETS"].Size();
                       return "not compliant: " + Plural(count, "difference") + "\n" +
-                             FormatList("ADDS", report["ADDS"], ComparedRoot(*desired)) +
-                             FormatList("DELETES", report["DELETES"], ComparedRoot(*desired)) +
-                             FormatList("SETS", report["SETS"], ComparedRoot(*desired));
+                             FormatList("ADDS", report["ADDS"], compared) +
+                             FormatList("DELETES", report["DELETES"], compared) +
+                             FormatList("SETS", report["SETS"], compared);
                     },
                     [result] { return CopyOf(result->document); }});
     return result->compliant ? kExitOk : kExitNegative;
