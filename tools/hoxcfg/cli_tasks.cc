@@ -4,11 +4,13 @@
 #include <signal.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <cmath>
 #include <cstring>
 #include <iostream>
+#include <list>
 #include <mutex>
 
 #include <hoxcm/host.h>
