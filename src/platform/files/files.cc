@@ -12,6 +12,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <memory>
 #include <set>
 #include <utility>
 
@@ -126,58 +127,78 @@ class TemporaryFile {
   std::string path_;
 };
 
+// Walks a tree through descriptors of open directories: every entry is
+// opened or examined relative to its directory (no walk of the full path
+// for each entry), and entries whose kind the directory reports are not
+// examined at all. A large schema tree lists several times faster so.
 class Lister {
  public:
   Lister(const ListOptions& options, DirectoryListing& out) : options_(options), out_(out) {}
 
-  void List(const std::string& directory, int depth) {
+  // Lists `path`, opened relative to `parent` (AT_FDCWD for the top).
+  void List(int parent, const std::string& name, const std::string& path, int depth) {
+    const int fd = ::openat(parent, name.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    if (fd < 0) {
+      out_.problems.push_back({path, ErrorText(errno)});
+      return;
+    }
+    // Owned by `dir` from here on; closed with it.
+    std::unique_ptr<DIR, int (*)(DIR*)> dir(::fdopendir(fd), &::closedir);
+    if (!dir) {
+      const int error = errno;
+      ::close(fd);
+      out_.problems.push_back({path, ErrorText(error)});
+      return;
+    }
     struct stat st {};
-    if (::stat(directory.c_str(), &st) != 0) {
-      out_.problems.push_back({directory, ErrorText(errno)});
+    if (::fstat(fd, &st) != 0) {
+      out_.problems.push_back({path, ErrorText(errno)});
       return;
     }
     // A directory reached again through a link is not walked twice.
     if (!visited_.insert({st.st_dev, st.st_ino}).second) return;
-    std::unique_ptr<DIR, int (*)(DIR*)> dir(::opendir(directory.c_str()), &::closedir);
-    if (!dir) {
-      out_.problems.push_back({directory, ErrorText(errno)});
-      return;
-    }
-    std::vector<std::string> names;
+    std::vector<std::pair<std::string, unsigned char>> entries;
     for (;;) {
       errno = 0;
       const dirent* entry = ::readdir(dir.get());
       if (entry == nullptr) {
-        if (errno != 0) out_.problems.push_back({directory, ErrorText(errno)});
+        if (errno != 0) out_.problems.push_back({path, ErrorText(errno)});
         break;
       }
-      const std::string_view name = entry->d_name;
-      if (name != "." && name != "..") names.emplace_back(name);
+      const std::string_view entryName = entry->d_name;
+      if (entryName != "." && entryName != "..") entries.emplace_back(entryName, entry->d_type);
     }
-    std::sort(names.begin(), names.end());
-    const std::string prefix = !directory.empty() && directory.back() == '/' ? directory : directory + "/";
-    for (const std::string& name : names) Visit(prefix + name, name, depth + 1);
+    std::sort(entries.begin(), entries.end());
+    const std::string prefix = !path.empty() && path.back() == '/' ? path : path + "/";
+    for (const auto& [entryName, type] : entries) Visit(fd, prefix + entryName, entryName, type, depth + 1);
   }
 
  private:
-  void Visit(const std::string& path, const std::string& name, int depth) {
-    struct stat link {};
-    if (::lstat(path.c_str(), &link) != 0) {
-      out_.problems.push_back({path, ErrorText(errno)});
-      return;
+  void Visit(int directory, const std::string& path, const std::string& name, unsigned char type, int depth) {
+    // The directory's word is taken for plain files and directories; links
+    // and file systems that do not say are asked.
+    mode_t mode = type == DT_REG ? S_IFREG : type == DT_DIR ? S_IFDIR : 0;
+    bool link = false;
+    if (mode == 0) {
+      struct stat st {};
+      if (::fstatat(directory, name.c_str(), &st, AT_SYMLINK_NOFOLLOW) != 0) {
+        out_.problems.push_back({path, ErrorText(errno)});
+        return;
+      }
+      link = S_ISLNK(st.st_mode);
+      if (link && ::fstatat(directory, name.c_str(), &st, 0) != 0) {
+        out_.problems.push_back({path, ErrorText(errno)});
+        return;
+      }
+      mode = st.st_mode;
     }
-    struct stat st = link;
-    if (S_ISLNK(link.st_mode) && ::stat(path.c_str(), &st) != 0) {
-      out_.problems.push_back({path, ErrorText(errno)});
-      return;
-    }
-    if (S_ISDIR(st.st_mode)) {
-      if (S_ISLNK(link.st_mode) && !options_.followDirectoryLinks) return;
+    if (S_ISDIR(mode)) {
+      if (link && !options_.followDirectoryLinks) return;
       if (options_.maxDepth > 0 && depth >= options_.maxDepth) {
         out_.notEntered.push_back(path);
         return;
       }
-      List(path, depth);
+      List(directory, name, path, depth);
       return;
     }
     if (!options_.suffix.empty() &&
@@ -185,10 +206,10 @@ class Lister {
          name.compare(name.size() - options_.suffix.size(), options_.suffix.size(), options_.suffix) != 0)) {
       return;
     }
-    if (S_ISREG(st.st_mode)) {
+    if (S_ISREG(mode)) {
       out_.files.push_back(path);
     } else {
-      out_.problems.push_back({path, std::string("not a regular file (") + KindOf(st.st_mode) + ")"});
+      out_.problems.push_back({path, std::string("not a regular file (") + KindOf(mode) + ")"});
     }
   }
 
@@ -280,7 +301,7 @@ void CreateDirectories(const std::string& directory, mode_t mode) {
 
 DirectoryListing ListFiles(const std::string& directory, const ListOptions& options) {
   DirectoryListing listing;
-  Lister(options, listing).List(directory, 0);
+  Lister(options, listing).List(AT_FDCWD, directory, directory, 0);
   std::sort(listing.files.begin(), listing.files.end());
   std::sort(listing.notEntered.begin(), listing.notEntered.end());
   return listing;
