@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <latch>
 #include <string>
 #include <thread>
 #include <vector>
@@ -178,6 +179,73 @@ TEST(SchemaStoreTest, StoresAreCachedPerRoot) {
   ASSERT_TRUE(second);
   EXPECT_NE(second, first);
   EXPECT_FALSE(second->Find("late", "x", "key"));
+}
+
+TEST(SchemaStoreTest, KeyFilesAreReadWhenTheirKeyIsFirstLookedUp) {
+  // Given a store whose index was built, files changed afterwards should be
+  // seen as they are at the key's first lookup (a file turned bad is refused
+  // with its path and hides nothing else), and as they were from then on.
+  hoxcm_test::TempRoot root;
+  root.InstallSampleSchemas();
+  const std::string singleton = R"({"multiInstance": false, "schema": {"type": "object"}})";
+  root.WriteFile(SchemaPath("late/x/turns_bad"), singleton);
+  root.WriteFile(SchemaPath("late/x/removed"), singleton);
+  root.WriteFile(SchemaPath("late/x/changed"), singleton);
+  auto store = SchemaStore::GetStore();
+  ASSERT_TRUE(store);
+  ASSERT_TRUE(store->Find("network", "dns", "config"));
+
+  root.WriteFile(SchemaPath("late/x/turns_bad"), R"({"multiInstance": false, "schema": {"type": "object", )");
+  std::filesystem::remove(root.Path(SchemaPath("late/x/removed")));
+  root.WriteFile(SchemaPath("late/x/changed"), R"({"multiInstance": false, "hostSpecific": true,
+                                                  "schema": {"type": "object"}})");
+  root.WriteFile(SchemaPath("network/dns/config"), "not a schema");
+
+  EXPECT_FALSE(store->Find("late", "x", "turns_bad"));
+  EXPECT_EQ(hoxcm_test::ThrownBy([&] { store->GetSchemaInfo("late", "x", "turns_bad"); }).code, 2021);
+  EXPECT_FALSE(store->Find("late", "x", "removed"));
+  auto changed = store->Find("late", "x", "changed");
+  ASSERT_TRUE(changed);
+  EXPECT_TRUE(changed->IsHostSpecific());
+  EXPECT_TRUE(store->Find("network", "dns", "config")) << "loaded before the change";
+
+  const auto errors = store->GetLoadErrors();
+  ASSERT_EQ(errors.size(), 2u);
+  EXPECT_EQ(errors[0].rfind(root.Path(SchemaPath("late/x/removed")) + ": ", 0), 0u) << errors[0];
+  EXPECT_EQ(errors[1].rfind(root.Path(SchemaPath("late/x/turns_bad")) + ": not valid JSON", 0), 0u) << errors[1];
+  EXPECT_EQ(store->ListKeys().size(), 17u);
+  EXPECT_FALSE(store->Find("late", "x", "turns_bad")) << "a refusal is kept too";
+}
+
+TEST(SchemaStoreTest, ThreadsAskingForTheSameKeyAtOnceShareOneLoad) {
+  // Given threads released together, all asking for the same keys, each
+  // should get the one schema object of a good key, and nothing for a bad
+  // key, which is reported once.
+  hoxcm_test::TempRoot root;
+  root.InstallSampleSchemas();
+  root.WriteFile(SchemaPath("bad/x/key"), R"({"multiInstance": false})");
+  auto store = SchemaStore::GetStore();
+  ASSERT_TRUE(store);
+  constexpr int kThreads = 16;
+  const char* const keys[][3] = {{"security", "accounts", "users"}, {"network", "dns", "config"}, {"bad", "x", "key"}};
+  std::vector<std::vector<std::shared_ptr<HoxSchemaStore::SchemaObject>>> seen(kThreads);
+  std::latch start(kThreads);
+  std::vector<std::thread> threads;
+  for (auto& slot : seen) {
+    threads.emplace_back([&] {
+      start.arrive_and_wait();
+      for (const auto& k : keys) slot.push_back(store->Find(k[0], k[1], k[2]));
+    });
+  }
+  for (auto& t : threads) t.join();
+  for (const auto& slot : seen) {
+    ASSERT_EQ(slot.size(), 3u);
+    EXPECT_TRUE(slot[0]);
+    EXPECT_EQ(slot[0], seen.front()[0]);
+    EXPECT_EQ(slot[1], seen.front()[1]);
+    EXPECT_FALSE(slot[2]);
+  }
+  EXPECT_EQ(store->GetLoadErrors().size(), 1u);
 }
 
 TEST(SchemaStoreTest, HostDocumentSchemaCoversKnownKeysAndNamesOrRefusesTheRest) {

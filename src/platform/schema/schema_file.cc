@@ -2,8 +2,11 @@
 
 #include <algorithm>
 #include <initializer_list>
+#include <mutex>
 #include <regex>
 #include <set>
+#include <string_view>
+#include <unordered_set>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/files.h>
@@ -19,6 +22,9 @@ namespace {
 
 namespace Shape = HoxConfigManager::DocumentShape;
 
+// Room beyond the file's size in a key's pool: the wrapper of a
+// multi-instance schema and the generated-identity property.
+constexpr std::size_t kPoolSlack = 256;
 
 // Thrown inside this file only, turned into the load error text.
 struct SchemaFileError {
@@ -72,37 +78,90 @@ std::vector<std::string> GetOperations(const rapidjson::Value& root, const char*
   return ops;
 }
 
-void CheckRegex(const std::string& pattern, const std::string& where) {
+// The patterns that compiled, for the life of the process. Schemas share
+// their patterns (addresses, names, identifiers), and compiling one costs
+// more than reading and checking the rest of a schema file; a refused
+// pattern is not remembered, so every file that holds it is refused.
+class CompiledPatterns {
+ public:
+  bool Contains(const std::string& pattern) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    return patterns_.count(pattern) != 0;
+  }
+  void Add(const std::string& pattern) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    patterns_.insert(pattern);
+  }
+
+ private:
+  std::mutex mutex_;
+  std::unordered_set<std::string> patterns_;
+};
+
+CompiledPatterns& KnownPatterns() {
+  static CompiledPatterns patterns;
+  return patterns;
+}
+
+// Where a subschema sits ("#/properties/a/items"). The text is built only
+// for a message: building it for every node of every file cost more than
+// the checks themselves.
+class Location {
+ public:
+  Location() = default;  // the root, "#"
+  Location(const Location& parent, std::string_view keyword, std::string_view name = {}, int index = -1)
+      : parent_(&parent), keyword_(keyword), name_(name), index_(index) {}
+
+  std::string Text() const {
+    if (parent_ == nullptr) return "#";
+    std::string text = parent_->Text() + "/" + std::string(keyword_);
+    if (!name_.empty()) text += "/" + std::string(name_);
+    if (index_ >= 0) text += "/" + std::to_string(index_);
+    return text;
+  }
+
+ private:
+  const Location* parent_ = nullptr;
+  std::string_view keyword_;
+  std::string_view name_;
+  int index_ = -1;
+};
+
+std::string_view NameOf(const rapidjson::Value& name) { return {name.GetString(), name.GetStringLength()}; }
+
+void CheckRegex(const std::string& pattern, const Location& where) {
   if (pattern.size() > JsonValidator::detail::kMaxPatternLength) {
-    Fail("regular expression at " + where + " is longer than " +
+    Fail("regular expression at " + where.Text() + " is longer than " +
          std::to_string(JsonValidator::detail::kMaxPatternLength) + " bytes");
   }
+  if (KnownPatterns().Contains(pattern)) return;
   try {
     std::regex compiled(pattern);
   } catch (const std::regex_error& e) {
-    Fail("invalid regular expression at " + where + ": " + e.what());
+    Fail("invalid regular expression at " + where.Text() + ": " + e.what());
   }
+  KnownPatterns().Add(pattern);
 }
 
 // Applies `visit` to every subschema of `node` reachable through the draft-4
 // keywords, depth first; `where` is a readable location for messages.
 template <typename Visit>
-void ForEachSubschema(const rapidjson::Value& node, const std::string& where, bool propertyNode, Visit& visit) {
-  if (!node.IsObject()) Fail("schema at " + where + " is not an object");
+void ForEachSubschema(const rapidjson::Value& node, const Location& where, bool propertyNode, Visit& visit) {
+  if (!node.IsObject()) Fail("schema at " + where.Text() + " is not an object");
   visit(node, where, propertyNode);
   auto members = [&](const char* keyword, bool properties) {
     auto it = node.FindMember(keyword);
     if (it == node.MemberEnd()) return;
-    if (!it->value.IsObject()) Fail("\"" + std::string(keyword) + "\" at " + where + " is not an object");
+    if (!it->value.IsObject()) Fail("\"" + std::string(keyword) + "\" at " + where.Text() + " is not an object");
     for (const auto& m : it->value.GetObject()) {
-      ForEachSubschema(m.value, where + "/" + keyword + "/" + m.name.GetString(), properties, visit);
+      ForEachSubschema(m.value, Location(where, keyword, NameOf(m.name)), properties, visit);
     }
   };
   auto elements = [&](const char* keyword) {
     auto it = node.FindMember(keyword);
     if (it == node.MemberEnd() || !it->value.IsArray()) return;
     for (rapidjson::SizeType i = 0; i < it->value.Size(); ++i) {
-      ForEachSubschema(it->value[i], where + "/" + keyword + "/" + std::to_string(i), propertyNode, visit);
+      ForEachSubschema(it->value[i], Location(where, keyword, {}, static_cast<int>(i)), propertyNode, visit);
     }
   };
   members("properties", true);
@@ -111,12 +170,12 @@ void ForEachSubschema(const rapidjson::Value& node, const std::string& where, bo
   for (const char* keyword : {"additionalProperties", "additionalItems", "not"}) {
     auto it = node.FindMember(keyword);
     if (it != node.MemberEnd() && it->value.IsObject()) {
-      ForEachSubschema(it->value, where + "/" + keyword, keyword != std::string("not"), visit);
+      ForEachSubschema(it->value, Location(where, keyword), keyword != std::string("not"), visit);
     }
   }
   auto items = node.FindMember("items");
   if (items != node.MemberEnd() && items->value.IsObject()) {
-    ForEachSubschema(items->value, where + "/items", propertyNode, visit);
+    ForEachSubschema(items->value, Location(where, "items"), propertyNode, visit);
   }
   elements("items");
   elements("allOf");
@@ -126,15 +185,15 @@ void ForEachSubschema(const rapidjson::Value& node, const std::string& where, bo
 
 // The valijson compilation and the regular expressions of a JSON schema.
 void CheckCompiles(const rapidjson::Value& schema) {
-  auto visit = [](const rapidjson::Value& node, const std::string& where, bool) {
+  auto visit = [](const rapidjson::Value& node, const Location& where, bool) {
     auto pattern = node.FindMember("pattern");
     if (pattern != node.MemberEnd() && pattern->value.IsString()) CheckRegex(pattern->value.GetString(), where);
     auto pp = node.FindMember("patternProperties");
     if (pp != node.MemberEnd() && pp->value.IsObject()) {
-      for (const auto& m : pp->value.GetObject()) CheckRegex(m.name.GetString(), where + "/patternProperties");
+      for (const auto& m : pp->value.GetObject()) CheckRegex(m.name.GetString(), Location(where, "patternProperties"));
     }
   };
-  ForEachSubschema(schema, "#", false, visit);
+  ForEachSubschema(schema, Location(), false, visit);
   if (std::string loop = JsonValidator::detail::FindReferenceLoop(schema); !loop.empty()) Fail(loop);
   try {
     valijson::Schema compiled;
@@ -150,41 +209,45 @@ void CheckCompiles(const rapidjson::Value& schema) {
 
 // Trigger values are compared with a changed value by the property's single
 // "type"; each one must be of that type.
-void CheckTriggers(const rapidjson::Value& property, const rapidjson::Value& triggers, const std::string& where) {
+void CheckTriggers(const rapidjson::Value& property, const rapidjson::Value& triggers, const char* keyword,
+                   const Location& where) {
   auto type = property.FindMember("type");
   if (type == property.MemberEnd() || !type->value.IsString()) {
-    Fail(where + ": a property with trigger values needs a single \"type\"");
+    Fail(std::string(keyword) + " at " + where.Text() + ": a property with trigger values needs a single \"type\"");
   }
   const std::string kind = type->value.GetString();
   for (const auto& v : triggers.GetArray()) {
     const bool ok = (kind == "integer" && v.IsInt64()) || (kind == "number" && v.IsNumber()) ||
                     (kind == "boolean" && v.IsBool()) || (kind == "string" && v.IsString());
-    if (!ok) Fail(where + ": trigger values must be of the property's type \"" + kind + "\"");
+    if (!ok) {
+      Fail(std::string(keyword) + " at " + where.Text() + ": trigger values must be of the property's type \"" + kind +
+           "\"");
+    }
   }
 }
 
 // Checks the impact and sensitivity annotations of the instance schema and
 // tells whether any property declares reboot / maintenance-mode triggers.
 void CheckAnnotations(const rapidjson::Value& instance, KeySchema::Definition& def) {
-  auto visit = [&def](const rapidjson::Value& node, const std::string& where, bool propertyNode) {
+  auto visit = [&def](const rapidjson::Value& node, const Location& where, bool propertyNode) {
     for (const char* keyword : {"rebootRequired", "maintenanceModeRequired"}) {
       auto it = node.FindMember(keyword);
       if (it == node.MemberEnd()) continue;
-      if (!propertyNode) Fail("\"" + std::string(keyword) + "\" at " + where + " is not on a property");
+      if (!propertyNode) Fail("\"" + std::string(keyword) + "\" at " + where.Text() + " is not on a property");
       const rapidjson::Value& v = it->value;
       auto set = v.IsObject() ? v.FindMember("SET") : rapidjson::Value::ConstMemberIterator();
       if (!v.IsObject() || set == v.MemberEnd() || !set->value.IsArray() || v.MemberCount() != 1) {
-        Fail("\"" + std::string(keyword) + "\" at " + where + " must be {\"SET\": [trigger values]}");
+        Fail("\"" + std::string(keyword) + "\" at " + where.Text() + " must be {\"SET\": [trigger values]}");
       }
-      CheckTriggers(node, set->value, std::string(keyword) + " at " + where);
+      CheckTriggers(node, set->value, keyword, where);
       (keyword == std::string("rebootRequired") ? def.rebootPropertyLevel : def.maintenanceModePropertyLevel) = true;
     }
     auto sensitive = node.FindMember("sensitive");
     if (sensitive != node.MemberEnd() && !sensitive->value.IsBool()) {
-      Fail("\"sensitive\" at " + where + " must be true or false");
+      Fail("\"sensitive\" at " + where.Text() + " must be true or false");
     }
   };
-  ForEachSubschema(instance, "#", false, visit);
+  ForEachSubschema(instance, Location(), false, visit);
 }
 
 bool ListsString(const rapidjson::Value& array, const std::string& s) {
@@ -227,7 +290,7 @@ void CheckIdentity(rapidjson::Value& instance, const std::string& identity, rapi
   }
 }
 
-KeySchema::Definition ReadDefinition(const rapidjson::Value& root, const SchemaObjectId& id, const std::string& path) {
+KeySchema::Definition ReadDefinition(const rapidjson::Value& root, const SchemaObjectId& id) {
   static const std::set<std::string> kMembers = {"formatVersion",
                                                  "description",
                                                  "multiInstance",
@@ -255,7 +318,6 @@ KeySchema::Definition ReadDefinition(const rapidjson::Value& root, const SchemaO
 
   KeySchema::Definition def;
   def.id = id;
-  def.file = path;
   def.multiInstance = multi->value.GetBool();
   auto identity = root.FindMember("identity");
   if (def.multiInstance) {
@@ -282,14 +344,16 @@ KeySchema::Definition ReadDefinition(const rapidjson::Value& root, const SchemaO
 
 }  // namespace
 
-KeySchema::KeySchema(Definition definition, const rapidjson::Value& instanceSchema) : def_(std::move(definition)) {
-  auto& a = schema_.GetAllocator();
+KeySchema::KeySchema(Definition definition, std::unique_ptr<Pool> pool, rapidjson::Value& instanceSchema)
+    : def_(std::move(definition)), pool_(std::move(pool)) {
   if (def_.multiInstance) {
     schema_.SetObject();
-    schema_.AddMember("type", "array", a);
-    schema_.AddMember("items", rapidjson::Value(instanceSchema, a), a);
+    schema_.AddMember("type", "array", *pool_);
+    schema_.AddMember("items", instanceSchema, *pool_);
+    instance_ = &schema_.FindMember("items")->value;
   } else {
-    schema_.CopyFrom(instanceSchema, a);
+    schema_ = instanceSchema;
+    instance_ = &schema_;
   }
 }
 
@@ -308,14 +372,18 @@ int KeySchema::GetMaintenanceModeOperations(std::vector<std::string>& operations
 std::shared_ptr<KeySchema> LoadSchemaFile(const std::string& path, const SchemaObjectId& id, std::string& error) {
   std::string content;
   if (!ReadFile(path, content, error)) return nullptr;
-  rapidjson::Document root;
+  // The parsed file is what the key keeps. Its text is mostly names and
+  // indentation, so a pool of the file's size usually holds it in one chunk
+  // (a default pool would set 64 KB aside for every key).
+  auto pool = std::make_unique<KeySchema::Pool>(content.size() + kPoolSlack);
+  rapidjson::Document root(pool.get());
   std::string parseError;
   if (!HoxConfigManager::detail::ParseJson(content.data(), content.size(), root, &parseError)) {
     error = "not valid JSON: " + parseError;
     return nullptr;
   }
   try {
-    KeySchema::Definition def = ReadDefinition(root, id, path);
+    KeySchema::Definition def = ReadDefinition(root, id);
     auto schema = root.FindMember("schema");
     if (schema == root.MemberEnd() || !schema->value.IsObject()) Fail("\"schema\" must be a JSON schema object");
     rapidjson::Value& instance = schema->value;
@@ -326,7 +394,7 @@ std::shared_ptr<KeySchema> LoadSchemaFile(const std::string& path, const SchemaO
     }
     if (def.multiInstance) CheckIdentity(instance, def.identity, root.GetAllocator());
     CheckAnnotations(instance, def);
-    auto key = std::make_shared<KeySchema>(std::move(def), instance);
+    auto key = std::make_shared<KeySchema>(std::move(def), std::move(pool), instance);
     CheckCompiles(key->GetJsonSchema());
     return key;
   } catch (const SchemaFileError& e) {

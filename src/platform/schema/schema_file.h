@@ -18,7 +18,6 @@ class KeySchema final : public SchemaObject {
   // Everything a schema file declares, already checked.
   struct Definition {
     SchemaObjectId id;
-    std::string file;  // host path of the file, for GetSchemaInfo
     bool multiInstance = false;
     std::string identity;
     bool defaultUserConfig = false;
@@ -32,8 +31,12 @@ class KeySchema final : public SchemaObject {
     bool maintenanceModePropertyLevel = false;
   };
 
-  // `instanceSchema` is the schema of one instance (of the singleton).
-  KeySchema(Definition definition, const rapidjson::Value& instanceSchema);
+  using Pool = rapidjson::MemoryPoolAllocator<>;
+
+  // `instanceSchema`, the schema of one instance (of the singleton), is
+  // moved into the key's JSON schema; it and every value it holds live in
+  // `pool`, which the key keeps: nothing is copied.
+  KeySchema(Definition definition, std::unique_ptr<Pool> pool, rapidjson::Value& instanceSchema);
   KeySchema(const KeySchema&) = delete;
   KeySchema& operator=(const KeySchema&) = delete;
 
@@ -47,9 +50,7 @@ class KeySchema final : public SchemaObject {
   int GetRebootOperations(std::vector<std::string>& operations, bool& propertyLevel) const override;
   int GetMaintenanceModeOperations(std::vector<std::string>& operations, bool& propertyLevel) const override;
   const rapidjson::Value& GetJsonSchema() const override { return schema_; }
-  const rapidjson::Value& GetInstanceSchema() const override {
-    return def_.multiInstance ? schema_["items"] : static_cast<const rapidjson::Value&>(schema_);
-  }
+  const rapidjson::Value& GetInstanceSchema() const override { return *instance_; }
 
   bool IsHostSpecific() const override { return def_.hostSpecific; }
 
@@ -57,7 +58,10 @@ class KeySchema final : public SchemaObject {
 
  private:
   const Definition def_;
-  rapidjson::Document schema_;
+  // Sized to the file, so that a small key holds a small pool.
+  const std::unique_ptr<Pool> pool_;
+  rapidjson::Value schema_;
+  const rapidjson::Value* instance_;
 };
 
 // Reads and checks the schema file at `path` for the key `id`. Null with a

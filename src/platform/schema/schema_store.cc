@@ -1,6 +1,7 @@
 #include <algorithm>
-#include <filesystem>
+#include <cstdint>
 #include <mutex>
+#include <string_view>
 #include <tuple>
 #include <unordered_map>
 
@@ -10,8 +11,6 @@
 #include <hoxcm/json.h>
 
 #include "platform/schema/schema_store_impl.h"
-
-namespace fs = std::filesystem;
 
 namespace HoxSchemaStore {
 
@@ -73,6 +72,8 @@ RootEntry GetRootEntry() {
   return entry;
 }
 
+constexpr std::string_view kSchemaSuffix = ".json";
+
 bool ValidName(const std::string& name) { return !name.empty() && name.front() != '.'; }
 
 }  // namespace
@@ -87,53 +88,90 @@ std::shared_ptr<DirectorySchemaStore> LoadStore(const std::string& directory) {
   return std::make_shared<DirectorySchemaStore>(directory);
 }
 
-DirectorySchemaStore::DirectorySchemaStore(const std::string& directory) {
+DirectorySchemaStore::DirectorySchemaStore(const std::string& directory) : directory_(directory) {
   HoxPlatform::ListOptions options;
-  options.suffix = ".json";
+  options.suffix = std::string(kSchemaSuffix);
   options.followDirectoryLinks = true;
   // Keys are files of a group directory (<component>/<group>/<key>.json):
   // nothing deeper is a schema.
   options.maxDepth = 3;
   const HoxPlatform::DirectoryListing listing = HoxPlatform::ListFiles(directory, options);
   for (const std::string& deeper : listing.notEntered) {
-    loadErrors_.push_back(deeper + ": not at <component>/<group>/<key>.json");
+    layoutErrors_.push_back(deeper + ": not at <component>/<group>/<key>.json");
   }
-  for (const auto& problem : listing.problems) loadErrors_.push_back(problem.path + ": " + problem.reason);
+  for (const auto& problem : listing.problems) layoutErrors_.push_back(problem.path + ": " + problem.reason);
+  index_.reserve(listing.files.size());
+  const std::size_t prefix = directory.size() + (directory.empty() || directory.back() != '/' ? 1 : 0);
   for (const std::string& name : listing.files) {
-    const fs::path file(name);
-    const fs::path relative = file.lexically_relative(directory);
-    std::vector<std::string> parts;
-    for (const auto& part : relative) parts.push_back(part.string());
+    // The listing's paths are <directory>/<relative path>; the key's names
+    // are the parts of the relative path, the file name without ".json".
+    std::vector<std::string_view> parts;
+    std::string_view rest = std::string_view(name).substr(std::min(prefix, name.size()));
+    for (std::size_t slash; (slash = rest.find('/')) != std::string_view::npos; rest.remove_prefix(slash + 1)) {
+      parts.push_back(rest.substr(0, slash));
+    }
+    parts.push_back(rest.substr(0, rest.size() - kSchemaSuffix.size()));
     std::string error;
-    std::shared_ptr<KeySchema> key;
     if (parts.size() != 3) {
       error = "not at <component>/<group>/<key>.json";
     } else {
-      SchemaObjectId id(parts[0], parts[1], fs::path(parts[2]).stem().string());
-      if (!ValidName(id.component) || !ValidName(id.group) || !ValidName(id.key)) {
-        error = "component, group and key names must not be empty or start with '.'";
-      } else {
-        key = LoadSchemaFile(file.string(), id, error);
+      SchemaObjectId id{std::string(parts[0]), std::string(parts[1]), std::string(parts[2])};
+      if (ValidName(id.component) && ValidName(id.group) && ValidName(id.key)) {
+        index_.try_emplace(std::move(id));
+        continue;
       }
+      error = "component, group and key names must not be empty or start with '.'";
     }
-    if (key) {
-      keys_.emplace(key->GetId(), key);
-    } else {
-      CSLogger::Log(CSLogger::kError, "Schema file %s was not loaded: %s", file.c_str(), error.c_str());
-      loadErrors_.push_back(file.string() + ": " + error);
-    }
+    CSLogger::Log(CSLogger::kError, "Schema file %s was not loaded: %s", name.c_str(), error.c_str());
+    layoutErrors_.push_back(name + ": " + error);
   }
-  CSLogger::Log(CSLogger::kDetail, "Loaded %zu schemas from %s", keys_.size(), directory.c_str());
+  CSLogger::Log(CSLogger::kDetail, "Indexed %zu schema files in %s", index_.size(), directory.c_str());
+}
+
+std::string DirectorySchemaStore::FilePath(const SchemaObjectId& id) const {
+  return directory_ + "/" + id.component + "/" + id.group + "/" + id.key + std::string(kSchemaSuffix);
+}
+
+const DirectorySchemaStore::Entry& DirectorySchemaStore::Loaded(const SchemaObjectId& id, const Entry& entry) const {
+  if (entry.loaded.load(std::memory_order_acquire)) return entry;
+  const auto stripe = reinterpret_cast<std::uintptr_t>(&entry) / alignof(Entry) % kLockStripes;
+  std::lock_guard<std::mutex> lock(loadLocks_[stripe]);
+  if (entry.loaded.load(std::memory_order_relaxed)) return entry;
+  const std::string path = FilePath(id);
+  std::string reason;
+  entry.schema = LoadSchemaFile(path, id, reason);
+  if (!entry.schema) {
+    CSLogger::Log(CSLogger::kError, "Schema file %s was not loaded: %s", path.c_str(), reason.c_str());
+    entry.error = path + ": " + reason;
+  }
+  entry.loaded.store(true, std::memory_order_release);
+  return entry;
 }
 
 std::shared_ptr<KeySchema> DirectorySchemaStore::FindKey(const SchemaObjectId& id) const {
-  auto it = keys_.find(id);
-  return it == keys_.end() ? nullptr : it->second;
+  auto it = index_.find(id);
+  return it == index_.end() ? nullptr : Loaded(it->first, it->second).schema;
 }
 
 std::shared_ptr<SchemaObject> DirectorySchemaStore::Find(const std::string& component, const std::string& group,
                                                          const std::string& key) const {
   return FindKey(SchemaObjectId(component, group, key));
+}
+
+bool DirectorySchemaStore::CheckAll() const {
+  bool clean = layoutErrors_.empty();
+  for (const auto& [id, entry] : index_) clean = Loaded(id, entry).schema != nullptr && clean;
+  return clean;
+}
+
+std::vector<std::string> DirectorySchemaStore::GetLoadErrors() const {
+  CheckAll();
+  std::vector<std::string> errors = layoutErrors_;
+  for (const auto& [id, entry] : index_) {
+    if (!entry.error.empty()) errors.push_back(entry.error);
+  }
+  std::sort(errors.begin(), errors.end());
+  return errors;
 }
 
 std::string DirectorySchemaStore::GetSchemaInfo(const std::string& component, const std::string& group,
@@ -144,34 +182,37 @@ std::string DirectorySchemaStore::GetSchemaInfo(const std::string& component, co
     HoxConfigManager::ThrowException<HoxConfigManager::SchemaNotFound>(HoxConfigManager::SchemaObjectNotFound,
                                                                        id.toString());
   }
-  const auto& def = schema->definition();
   rapidjson::StringBuffer buffer;
   rapidjson::Writer<rapidjson::StringBuffer> writer(buffer);
   writer.StartObject();
   writer.Key("id");
   writer.String(id.toString());
   writer.Key("file");
-  writer.String(HoxPlatform::StripHostRoot(def.file));
+  writer.String(HoxPlatform::StripHostRoot(FilePath(id)));
   writer.Key("multiInstance");
-  writer.Bool(def.multiInstance);
+  writer.Bool(schema->IsMultiInstance());
   writer.Key("identity");
-  writer.String(def.identity);
+  writer.String(schema->GetIdentityMember());
   writer.EndObject();
   return buffer.GetString();
 }
 
 std::set<SchemaObjectId> DirectorySchemaStore::GetMutableDefaultIds() const {
   std::set<SchemaObjectId> ids;
-  for (const auto& [id, schema] : keys_) {
-    if (schema->IsMutableDefault()) ids.insert(id);
+  for (const auto& [id, entry] : index_) {
+    const auto& schema = Loaded(id, entry).schema;
+    if (schema && schema->IsMutableDefault()) ids.insert(id);
   }
   return ids;
 }
 
 std::vector<SchemaObjectId> DirectorySchemaStore::ListKeys() const {
   std::vector<SchemaObjectId> ids;
-  ids.reserve(keys_.size());
-  for (const auto& entry : keys_) ids.push_back(entry.first);
+  ids.reserve(index_.size());
+  for (const auto& [id, entry] : index_) {
+    if (Loaded(id, entry).schema) ids.push_back(id);
+  }
+  std::sort(ids.begin(), ids.end());
   return ids;
 }
 
