@@ -120,7 +120,8 @@ const Value* PatternPropertySchema(const Value& schema, std::string_view name, P
       std::optional<std::regex>* compiled = &local;
       bool fresh = true;
       if (cache != nullptr) {
-        auto [slot, inserted] = cache->try_emplace(&it->name);
+        auto [slot, inserted] =
+            cache->try_emplace(std::string_view(it->name.GetString(), it->name.GetStringLength()));
         compiled = &slot->second;
         fresh = inserted;
       }

@@ -128,9 +128,10 @@ class MemberIndex {
 // whose pattern cannot be compiled, or that would be applied to a name too
 // long to match safely, is taken to match, so that a secret is never shown
 // for want of a usable pattern.
-// `cache`, when given, keeps the compiled patterns (keyed by the pattern's
-// name value, so it must not outlive the schema).
-using PatternCache = std::unordered_map<const rapidjson::Value*, std::optional<std::regex>>;
+// `cache`, when given, keeps the compiled patterns, keyed by their text so
+// that keys sharing a pattern compile it once (the keys view the schemas'
+// names: the cache must not outlive them).
+using PatternCache = std::unordered_map<std::string_view, std::optional<std::regex>>;
 const rapidjson::Value* PatternPropertySchema(const rapidjson::Value& schema, std::string_view name,
                                               PatternCache* cache = nullptr);
 
