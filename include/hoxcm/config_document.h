@@ -51,6 +51,12 @@ class HOXCM_API ConfigStoreDocument {
   static void AddObject(rapidjson::Document& doc, const std::string& component, const std::string& group,
                         const std::string& key, const std::string& identifier, rapidjson::Value& value,
                         rapidjson::MemoryPoolAllocator<>& allocator);
+  // The same into `items`, the component tree of a document (the document
+  // itself or its "profile") that the caller found once: a document built
+  // row by row would otherwise search every component for every row.
+  static void AddItem(rapidjson::Value& items, const std::string& component, const std::string& group,
+                      const std::string& key, const std::string& identifier, rapidjson::Value& value,
+                      rapidjson::MemoryPoolAllocator<>& allocator);
   // Adds an empty "profile" object to the document (an object).
   static void AddProfile(rapidjson::Document& doc);
   static void CleanupObject(rapidjson::Value& value, const rapidjson::Value& schema,

@@ -10,6 +10,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -95,6 +96,25 @@ HOXCM_API ConfigMapList GetSmartnicConfiguration(const std::shared_ptr<DBStore>&
 HOXCM_API ConfigMapList GetDesiredSmartnicConfiguration(const std::shared_ptr<DBStore>& db);
 // The rows of any configuration kind, in the same order.
 HOXCM_API ConfigMapList GetConfigContents(const std::shared_ptr<DBStore>& db, ConfigKind kind);
+// One row of configuration contents as ForEachConfigRow hands it over: the
+// columns of a ConfigMap. The visitor gets the same object for every row.
+struct HOXCM_API ConfigRow {
+  std::string component;
+  std::string group;
+  std::string key;
+  std::string identifier;
+  std::string value;
+  bool hasAutoConfValue = false;
+  std::string autoConfValue;
+};
+// Visits the rows of `kind` one at a time, in the order of the contents
+// lists, so that a large host's rows need not all be held at once. An
+// exception of the visitor ends the visit and propagates.
+HOXCM_API void ForEachConfigRow(const std::shared_ptr<DBStore>& db, ConfigKind kind,
+                                const std::function<void(const ConfigRow&)>& visit);
+// The rows of one key (the id's component, group and key) of `kind`.
+HOXCM_API ConfigMapList GetConfigMapList(const std::shared_ptr<DBStore>& db, ConfigKind kind,
+                                         const ConfigStoreObjectId& id);
 // Default user configuration rows of one object (all instances of the key
 // when the id has no instance).
 HOXCM_API ConfigMapList GetDefaultUserConfigMapList(const ConfigStoreObjectId& id,

@@ -1,10 +1,8 @@
 // Configuration extraction: the store's user, current, desired and SmartNIC
 // configuration as host documents, and the exported host document.
-#include <algorithm>
 #include <exception>
 #include <set>
 #include <string>
-#include <tuple>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
@@ -49,38 +47,11 @@ std::shared_ptr<HoxConfigStore::DBStore> DatabaseOrThrow() {
   return db;
 }
 
-using KeyColumns = std::tuple<const std::string&, const std::string&, const std::string&>;
-
-KeyColumns KeyOf(const HoxConfigStore::ConfigMap& row) {
-  return {Column(row, RowColumn::kComponent), Column(row, RowColumn::kGroup), Column(row, RowColumn::kKey)};
-}
-
-// The rows of one key. The store returns rows ordered by component, group
-// and key, so a binary search finds them; when it finds none, a full scan
-// confirms, since a wrong "no rows" verdict would refuse a whole extraction.
-ConfigMapList RowsOfKey(const ConfigMapList& contents, const SchemaObjectId& id) {
-  const KeyColumns wanted{id.component, id.group, id.key};
-  auto before = [](const auto& row, const KeyColumns& key) { return row && KeyOf(*row) < key; };
-  auto after = [](const KeyColumns& key, const auto& row) { return !row || key < KeyOf(*row); };
-  auto first = std::lower_bound(contents.begin(), contents.end(), wanted, before);
-  auto last = std::upper_bound(first, contents.end(), wanted, after);
-  ConfigMapList rows;
-  for (auto it = first; it != last; ++it) {
-    if (*it && KeyOf(**it) == wanted) rows.push_back(*it);
-  }
-  if (!rows.empty()) return rows;
-  for (const auto& row : contents) {
-    if (row && KeyOf(*row) == wanted) rows.push_back(row);
-  }
-  return rows;
-}
-
 // Reports, for every key whose default may be changed but not deleted,
 // whether the user configuration still equals the shipped default. The
 // extraction itself keeps every item either way, so that an exported
 // document states the whole configuration.
-void ProcessMutableDefaultConfig(const ConfigMapList& contents,
-                                 const std::shared_ptr<HoxSchemaStore::SchemaStore>& schemaStore,
+void ProcessMutableDefaultConfig(const std::shared_ptr<HoxSchemaStore::SchemaStore>& schemaStore,
                                  const std::shared_ptr<HoxConfigStore::DBStore>& db) {
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "ProcessMutableDefaultConfig");
   for (const SchemaObjectId& id : schemaStore->GetMutableDefaultIds()) {
@@ -89,15 +60,16 @@ void ProcessMutableDefaultConfig(const ConfigMapList& contents,
                   name.c_str());
     auto schema = schemaStore->Find(id.component, id.group, id.key);
     if (!schema) continue;
-    const ConfigMapList userRows = FilterSolutionUserInstances(RowsOfKey(contents, id), schema);
+    const HoxConfigStore::ConfigStoreObjectId objectId(id.component, id.group, id.key);
+    const ConfigMapList userRows = FilterSolutionUserInstances(
+        HoxConfigStore::GetConfigMapList(db, HoxConfigStore::ConfigKind::User, objectId), schema);
     if (userRows.empty()) continue;  // the delete check reports this case
     CSLogger::Log(CSLogger::kError, "Configuration found for mutableDefaultConfig schema %s", name.c_str());
 
     Document user;
     CreateDocumentFromMap(userRows, schema, user);
     Document defaults;
-    GetExternalDefaultUserConfig(HoxConfigStore::ConfigStoreObjectId(id.component, id.group, id.key), db, schema,
-                                 defaults);
+    GetExternalDefaultUserConfig(objectId, db, schema, defaults);
     if (ConfigStoreDocument::IsEqualValue(user, defaults, schema->GetJsonSchema())) {
       CSLogger::Log(CSLogger::kInfo, "User configuration is same as default for mutableDefaultConfig schema %s ",
                     name.c_str());
@@ -108,16 +80,33 @@ void ProcessMutableDefaultConfig(const ConfigMapList& contents,
   }
 }
 
+// The rows of `kind` as a document of `type`, read from the store one at a
+// time.
+void ProcessStoredRows(Document& result, const std::shared_ptr<HoxConfigStore::DBStore>& db,
+                       HoxConfigStore::ConfigKind kind,
+                       const std::shared_ptr<HoxSchemaStore::SchemaStore>& schemaStore, DocumentType type) {
+  detail::RowProcessor rows(result, schemaStore, type);
+  HoxConfigStore::ForEachConfigRow(db, kind, [&rows](const HoxConfigStore::ConfigRow& row) { rows.Add(row); });
+}
+
 // A key whose default may not be deleted but has no user configuration left
 // was deleted behind the library's back: refuse to extract a current
-// configuration that would silently lack it.
-void ProcessMutableDefaultDeletes(Document& result, const ConfigMapList& contents,
+// configuration that would silently lack it. The keys are ticked off while
+// the rows are turned into the document, so the rows are read once.
+void ProcessMutableDefaultDeletes(Document& result, const std::shared_ptr<HoxConfigStore::DBStore>& db,
                                   const std::shared_ptr<HoxSchemaStore::SchemaStore>& schemaStore) {
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "ProcessMutableDefaultDeletes");
-  std::set<SchemaObjectId> missing;
-  for (const SchemaObjectId& id : schemaStore->GetMutableDefaultIds()) {
-    if (RowsOfKey(contents, id).empty()) missing.insert(id);
-  }
+  std::set<SchemaObjectId> missing = schemaStore->GetMutableDefaultIds();
+  detail::RowProcessor rows(result, schemaStore, DOCUMENT_CURRENT);
+  SchemaObjectId previous;
+  HoxConfigStore::ForEachConfigRow(db, HoxConfigStore::ConfigKind::User, [&](const HoxConfigStore::ConfigRow& row) {
+    if (!missing.empty() && (row.key != previous.key || row.group != previous.group ||
+                             row.component != previous.component)) {
+      previous = SchemaObjectId(row.component, row.group, row.key);
+      missing.erase(previous);
+    }
+    rows.Add(row);
+  });
   if (!missing.empty()) {
     std::string joined;
     for (const SchemaObjectId& id : missing) {
@@ -126,7 +115,6 @@ void ProcessMutableDefaultDeletes(Document& result, const ConfigMapList& content
     }
     ThrowException<ConfigManagerException>(DeleteDefaultNotSupported, joined);
   }
-  ProcessConfigMapList(result, contents, schemaStore, DOCUMENT_CURRENT);
 }
 
 Document EmptyDocument() {
@@ -140,9 +128,8 @@ Document EmptyDocument() {
 Document ExtractDesiredConfiguration() {
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "ExtractDesiredConfiguration");
   auto db = DatabaseOrThrow();
-  const ConfigMapList contents = HoxConfigStore::GetDesiredUserConfigContents(db);
   Document result = EmptyDocument();
-  ProcessConfigMapList(result, contents, SchemaStoreOrThrow(), DOCUMENT_DESIRED);
+  ProcessStoredRows(result, db, HoxConfigStore::ConfigKind::Desired, SchemaStoreOrThrow(), DOCUMENT_DESIRED);
   return result;
 }
 
@@ -151,10 +138,10 @@ Document ExtractUserConfiguration(bool withProfile) {
   detail::SyncSshConfiguration();
   auto db = DatabaseOrThrow();
   auto schemaStore = SchemaStoreOrThrow();
-  const ConfigMapList contents = HoxConfigStore::GetUserConfigContents(db);
-  ProcessMutableDefaultConfig(contents, schemaStore, db);
+  ProcessMutableDefaultConfig(schemaStore, db);
   Document result = EmptyDocument();
-  ProcessConfigMapList(result, contents, schemaStore, withProfile ? DOCUMENT_PROFILE : DOCUMENT_CURRENT);
+  ProcessStoredRows(result, db, HoxConfigStore::ConfigKind::User, schemaStore,
+                    withProfile ? DOCUMENT_PROFILE : DOCUMENT_CURRENT);
   return result;
 }
 
@@ -163,9 +150,8 @@ Document ExtractCurrentConfiguration() {
   detail::SyncSshConfiguration();
   auto db = DatabaseOrThrow();
   auto schemaStore = SchemaStoreOrThrow();
-  const ConfigMapList contents = HoxConfigStore::GetUserConfigContents(db);
   Document result = EmptyDocument();
-  ProcessMutableDefaultDeletes(result, contents, schemaStore);
+  ProcessMutableDefaultDeletes(result, db, schemaStore);
   return result;
 }
 

@@ -87,6 +87,13 @@ struct RowColumns {
   const std::string* value = &Empty();
   const std::string* autoConf = nullptr;
 
+  explicit RowColumns(const HoxConfigStore::ConfigRow& row)
+      : component(&row.component),
+        group(&row.group),
+        key(&row.key),
+        identifier(&row.identifier),
+        value(&row.value),
+        autoConf(row.hasAutoConfValue ? &row.autoConfValue : nullptr) {}
   explicit RowColumns(const ConfigMap& row) {
     for (const auto& [name, text] : row) {
       const std::string_view column(name);
@@ -168,91 +175,125 @@ void ProcessAutoConfig(Value& value, const Value& schema, const std::string& aut
   }
 }
 
-void ProcessConfigMapList(Document& result, const HoxConfigStore::ConfigMapList& contents,
-                          const std::shared_ptr<HoxSchemaStore::SchemaStore>& schemaStore, DocumentType type) {
-  CSLogger::Log(CSLogger::kDetail, "%s invoked with DocumentType=%d", "ProcessConfigMapList", static_cast<int>(type));
-  if (!schemaStore) ThrowException<ConfigManagerException>(SchemaStoreAccessFailed);
-  if (!result.IsObject()) result.SetObject();
-  if (type == DOCUMENT_PROFILE) ConfigStoreDocument::AddProfile(result);
+namespace detail {
 
-  Allocator& allocator = result.GetAllocator();
-  const std::vector<HoxConfigStore::CLEANUP_ACTIONS>& cleanup = CleanupActions(type);
-  const bool onlyNulls = cleanup.size() == 1 && cleanup.front() == HoxConfigStore::CLEANUP_REMOVE_NULLS;
-  SchemaLookup schemas(schemaStore);
+// Everything a run of rows shares: the target, the clean-up, the schema of
+// the current key, the parser.
+struct RowProcessor::State {
+  State(Document& result, const std::shared_ptr<HoxSchemaStore::SchemaStore>& store, DocumentType type)
+      : items(DocumentShape::Unwrap(result)),
+        allocator(result.GetAllocator()),
+        cleanup(CleanupActions(type)),
+        onlyNulls(cleanup.size() == 1 && cleanup.front() == HoxConfigStore::CLEANUP_REMOVE_NULLS),
+        schemas(store),
+        parsed(&allocator),
+        logItems(CSLogger::IsEnabled(CSLogger::kInfo)) {}
+
+  Value& items;
+  Allocator& allocator;
+  const std::vector<HoxConfigStore::CLEANUP_ACTIONS>& cleanup;
+  const bool onlyNulls;
+  SchemaLookup schemas;
   // Read once, and only when a quorlet row shows up.
   std::optional<std::set<SchemaObjectId>> dspExcluded;
   // One parser reused for every row: its stack keeps its capacity, and the
   // parsed values land directly in the result's pool.
-  Document parsed(&allocator);
-  // The per-item lines are the bulk of the log; skip formatting them when the
-  // threshold hides them anyway.
-  const bool logItems = CSLogger::IsEnabled(CSLogger::kInfo);
+  Document parsed;
+  // The per-item lines are the bulk of the log; skip formatting them when
+  // the threshold hides them anyway.
+  const bool logItems;
 
-  for (const auto& rowPtr : contents) {
-    RAPIDJSON_ASSERT(rowPtr != nullptr);
-    const ConfigMap& row = *rowPtr;
-    const RowColumns columns(row);
-    const std::string& key = *columns.key;
-    const std::string& component = *columns.component;
-    const std::string& group = *columns.group;
-    const std::string& identifier = *columns.identifier;
-    if (logItems) {
-      CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was found.", component.c_str(),
+  void Add(const RowColumns& columns);
+};
+
+RowProcessor::RowProcessor(Document& result, const std::shared_ptr<HoxSchemaStore::SchemaStore>& schemaStore,
+                           DocumentType type)
+    : schemaStore_(schemaStore) {
+  CSLogger::Log(CSLogger::kDetail, "%s invoked with DocumentType=%d", "ProcessConfigMapList", static_cast<int>(type));
+  if (!schemaStore_) ThrowException<ConfigManagerException>(SchemaStoreAccessFailed);
+  if (!result.IsObject()) result.SetObject();
+  if (type == DOCUMENT_PROFILE) ConfigStoreDocument::AddProfile(result);
+  state_ = std::make_unique<State>(result, schemaStore_, type);
+}
+
+RowProcessor::~RowProcessor() = default;
+
+void RowProcessor::Add(const HoxConfigStore::ConfigRow& row) { state_->Add(RowColumns(row)); }
+
+void RowProcessor::Add(const ConfigMap& row) { state_->Add(RowColumns(row)); }
+
+void RowProcessor::State::Add(const RowColumns& columns) {
+  State& st = *this;
+  const std::string& key = *columns.key;
+  const std::string& component = *columns.component;
+  const std::string& group = *columns.group;
+  const std::string& identifier = *columns.identifier;
+  if (st.logItems) {
+    CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was found.", component.c_str(), group.c_str(),
+                  key.c_str(), identifier.c_str());
+  }
+
+  const std::string& text = *columns.value;
+  if (text == DocumentShape::kDeleteDefault) {
+    ThrowException<ConfigManagerException>(DeleteDefaultNotSupported,
+                                           SchemaObjectId(component, group, key).toString());
+  }
+
+  if (IsQuorlet(component, group, key)) {
+    if (!st.dspExcluded) st.dspExcluded = detail::DspExcludedObjects();
+    if (st.dspExcluded->count(detail::QuorletObjectId()) != 0) {
+      CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s} was not extracted, since dspIntegrated=False,",
+                    component.c_str(), group.c_str(), key.c_str());
+      return;
+    }
+  }
+
+  ParseDocument(text, st.parsed);
+  Value value;
+  value.Swap(st.parsed);
+  RAPIDJSON_ASSERT(value.IsObject());
+
+  const SchemaObject& schema = st.schemas.Find(component, group, key);
+  // An instance row of a singleton key, or an instance without identifier,
+  // would give the key the wrong shape in the document.
+  if (schema.IsMultiInstance() == identifier.empty()) {
+    ThrowException<ConfigManagerException>(InvalidKeyValue, "/" + component + "/" + group + "/" + key);
+  }
+  if (columns.autoConf != nullptr) {
+    ProcessAutoConfig(value, schema.GetInstanceSchema(), *columns.autoConf, st.allocator);
+  }
+
+  if (schema.GetIdentityMember() != DocumentShape::kGeneratedId) {
+    const std::vector<std::string>& solutionIds = schema.GetSolutionInstanceIds();
+    if (!identifier.empty() && std::find(solutionIds.begin(), solutionIds.end(), identifier) != solutionIds.end()) {
+      CSLogger::Log(CSLogger::kInfo,
+                    "Configuration for {%s/%s/%s/%s} was not extracted, since instance is created by a solution.",
+                    component.c_str(), group.c_str(), key.c_str(), identifier.c_str());
+      return;
+    }
+  }
+
+  if (!st.onlyNulls || ContainsNull(value)) {
+    ConfigStoreDocument::CleanupObject(value, schema.GetInstanceSchema(), st.cleanup, st.allocator);
+  }
+  if (value.ObjectEmpty()) {
+    if (st.logItems) {
+      CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was filtered out.", component.c_str(),
                     group.c_str(), key.c_str(), identifier.c_str());
     }
+    return;
+  }
+  ConfigStoreDocument::AddItem(st.items, component, group, key, identifier, value, st.allocator);
+}
 
-    const std::string& text = *columns.value;
-    if (text == DocumentShape::kDeleteDefault) {
-      ThrowException<ConfigManagerException>(DeleteDefaultNotSupported,
-                                             SchemaObjectId(component, group, key).toString());
-    }
+}  // namespace detail
 
-    if (IsQuorlet(component, group, key)) {
-      if (!dspExcluded) dspExcluded = detail::DspExcludedObjects();
-      if (dspExcluded->count(detail::QuorletObjectId()) != 0) {
-        CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s} was not extracted, since dspIntegrated=False,",
-                      component.c_str(), group.c_str(), key.c_str());
-        continue;
-      }
-    }
-
-    ParseDocument(text, parsed);
-    Value value;
-    value.Swap(parsed);
-    RAPIDJSON_ASSERT(value.IsObject());
-
-    const SchemaObject& schema = schemas.Find(component, group, key);
-    // An instance row of a singleton key, or an instance without identifier,
-    // would give the key the wrong shape in the document.
-    if (schema.IsMultiInstance() == identifier.empty()) {
-      ThrowException<ConfigManagerException>(InvalidKeyValue, "/" + component + "/" + group + "/" + key);
-    }
-    if (columns.autoConf != nullptr) {
-      ProcessAutoConfig(value, schema.GetInstanceSchema(), *columns.autoConf, allocator);
-    }
-
-    if (schema.GetIdentityMember() != DocumentShape::kGeneratedId) {
-      const std::vector<std::string>& solutionIds = schema.GetSolutionInstanceIds();
-      if (!identifier.empty() &&
-          std::find(solutionIds.begin(), solutionIds.end(), identifier) != solutionIds.end()) {
-        CSLogger::Log(CSLogger::kInfo,
-                      "Configuration for {%s/%s/%s/%s} was not extracted, since instance is created by a solution.",
-                      component.c_str(), group.c_str(), key.c_str(), identifier.c_str());
-        continue;
-      }
-    }
-
-    if (!onlyNulls || ContainsNull(value)) {
-      ConfigStoreDocument::CleanupObject(value, schema.GetInstanceSchema(), cleanup, allocator);
-    }
-    if (value.ObjectEmpty()) {
-      if (logItems) {
-        CSLogger::Log(CSLogger::kInfo, "Configuration for {%s/%s/%s/%s} was filtered out.", component.c_str(),
-                      group.c_str(), key.c_str(), identifier.c_str());
-      }
-      continue;
-    }
-    ConfigStoreDocument::AddObject(result, component, group, key, identifier, value, allocator);
+void ProcessConfigMapList(Document& result, const HoxConfigStore::ConfigMapList& contents,
+                          const std::shared_ptr<HoxSchemaStore::SchemaStore>& schemaStore, DocumentType type) {
+  detail::RowProcessor rows(result, schemaStore, type);
+  for (const auto& row : contents) {
+    RAPIDJSON_ASSERT(row != nullptr);
+    rows.Add(*row);
   }
 }
 

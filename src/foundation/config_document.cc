@@ -23,9 +23,19 @@ constexpr const char* kHostSpecific = "hostSpecific";
 std::string_view Name(const Value& name) { return {name.GetString(), name.GetStringLength()}; }
 
 // The object member `name` of `parent`, created empty when missing; an
-// existing member that is not an object is "Invalid JSON".
+// existing member that is not an object is "Invalid JSON". Documents are
+// built from rows ordered by component and group, so the member asked for
+// is nearly always the last one: it is tried before the search, which
+// would otherwise scan every component of a large host for every row.
 Value& ObjectMember(Value& parent, std::string_view name, Allocator& allocator) {
   RAPIDJSON_ASSERT(parent.IsObject());
+  if (!parent.ObjectEmpty()) {
+    Value::Member& last = *(parent.MemberEnd() - 1);
+    if (Name(last.name) == name) {
+      RAPIDJSON_ASSERT(last.value.IsObject());
+      return last.value;
+    }
+  }
   const Value key(rapidjson::StringRef(name.data(), name.size()));
   auto it = parent.FindMember(key);
   if (it == parent.MemberEnd()) {
@@ -272,7 +282,13 @@ void ConfigStoreDocument::AddObject(rapidjson::Document& doc, const std::string&
   if (doc.IsNull()) doc.SetObject();
   RAPIDJSON_ASSERT(doc.IsObject());
   Value& root = Shape::Unwrap(doc);
-  Value& groupValue = ObjectMember(ObjectMember(root, component, allocator), group, allocator);
+  AddItem(root, component, group, key, identifier, value, allocator);
+}
+
+void ConfigStoreDocument::AddItem(rapidjson::Value& items, const std::string& component, const std::string& group,
+                                  const std::string& key, const std::string& identifier, rapidjson::Value& value,
+                                  rapidjson::MemoryPoolAllocator<>& allocator) {
+  Value& groupValue = ObjectMember(ObjectMember(items, component, allocator), group, allocator);
   if (identifier.empty()) {
     SetMember(groupValue, key, value, allocator);
     return;

@@ -240,6 +240,38 @@ ConfigMapList GetDefaultUserConfigMapList(const ConfigStoreObjectId& id, const s
   return ReadKey(db, ConfigKind::Default, id);
 }
 
+ConfigMapList GetConfigMapList(const std::shared_ptr<DBStore>& db, ConfigKind kind, const ConfigStoreObjectId& id) {
+  return ReadKey(db, kind, ConfigStoreObjectId(id.component, id.group, id.key));
+}
+
+void ForEachConfigRow(const std::shared_ptr<DBStore>& db, ConfigKind kind,
+                      const std::function<void(const ConfigRow&)>& visit) {
+  detail::AsDatabase(db).Read([&](Database& conn) {
+    auto select = conn.Prepare(std::string(kSelectRows) + "WHERE kind = ?" + kRowOrder);
+    select.Bind(1, static_cast<int64_t>(kind));
+    // One row object for the whole visit: its strings keep their capacity.
+    ConfigRow row;
+    const auto text = [&select](int column, std::string& out) {
+      const std::string_view view = select.TextView(column);
+      out.assign(view.data() != nullptr ? view.data() : "", view.size());
+    };
+    while (select.Step()) {
+      text(0, row.component);
+      text(1, row.group);
+      text(2, row.key);
+      text(3, row.identifier);
+      text(4, row.value);
+      row.hasAutoConfValue = !select.IsNull(5);
+      if (row.hasAutoConfValue) {
+        text(5, row.autoConfValue);
+      } else {
+        row.autoConfValue.clear();
+      }
+      visit(row);
+    }
+  });
+}
+
 void SetDesiredUserConfig(rapidjson::Document& document) {
   ReplaceContents(ConfigKind::Desired, RowsFromDocument(document));
 }
