@@ -210,7 +210,9 @@ void GeneratePair(const GeneratorOptions& o, Document& host, Document& desired) 
       }
       const bool oneSided = desiredFill.Chance(o.oneSidedKeys);
       const bool hostOnly = oneSided && !k.defaults && (rng() & 1) != 0;
-      const bool desiredOnly = oneSided && !hostOnly;
+      // A host never lacks a key with a default configuration: one whose
+      // default may not be deleted would make the host unreadable.
+      const bool desiredOnly = oneSided && !k.defaults && !hostOnly;
       if (!desiredOnly) Slot(host, component, k.group).AddMember(Value(k.key, ha), hostItem, ha);
       if (!hostOnly) Slot(desired, component, k.group).AddMember(Value(k.key, da), desiredItem, da);
     }

@@ -25,7 +25,7 @@ struct GeneratorOptions {
   // document (of every multi-instance key).
   double instanceChurn = 0.005;
   // Share of keys present on one side only (half each way; keys with a
-  // default configuration are never left out of the desired document).
+  // default configuration are never one-sided).
   double oneSidedKeys = 0.01;
   // Share of multi-instance keys whose host instances are shuffled.
   double shuffledKeys = 0.2;
