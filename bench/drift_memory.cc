@@ -14,6 +14,7 @@
 
 #include <hoxcm/documents.h>
 #include <hoxcm/drift.h>
+#include <hoxcm/schema_store.h>
 
 #include "doc_generator.h"
 
@@ -70,6 +71,16 @@ int main(int argc, char** argv) {
   ::setenv("HOX_ROOT", root.c_str(), 1);
   ::setenv("HOX_LOG_LEVEL", "-1", 1);
   hoxcm_bench::InstallReplicatedSchemas(scale);
+  {
+    // What the schema store keeps: its index, then every key loaded.
+    const long long start = gCurrent.load();
+    auto store = HoxSchemaStore::SchemaStore::GetStore();
+    const long long indexed = gCurrent.load();
+    const std::size_t keys = store->ListKeys().size();  // loads every key; the list is gone below
+    const long long loaded = gCurrent.load();
+    std::printf("schema store: %zu keys, index %.0f bytes per key, %.0f bytes per loaded key\n", keys,
+                static_cast<double>(indexed - start) / keys, static_cast<double>(loaded - indexed) / keys);
+  }
   std::string hostText, desiredText;
   {
     hoxcm_bench::GeneratorOptions options;

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include <hoxcm/documents.h>
+#include <hoxcm/host_documents.h>
 
 int main(int argc, char** argv) {
   std::vector<HoxConfigManager::Document> documents(argc > 1 ? argc - 1 : 0);

@@ -5,6 +5,7 @@ HOXCM_DEBIAN_PACKAGES=(
   build-essential cmake pkg-config ccache python3
   rapidjson-dev libboost-filesystem-dev libboost-graph-dev libsqlite3-dev sqlite3
   libgtest-dev libgmock-dev libbenchmark-dev libcli11-dev json-schema-test-suite
+  time
 )
 
 hoxcm_install_deps() {
