@@ -35,6 +35,9 @@ class HOXCM_API ConfigStoreDocument {
   // (format: docs/platform.md).
   static void GetDocumentForHost(const rapidjson::Value& source, rapidjson::Document& result,
                                  const std::string& hostId);
+  // The same in place: `document` loses its host-specific sections and
+  // takes in the items of `hostId`'s. Nothing else is copied.
+  static void ReduceToHost(rapidjson::Document& document, const std::string& hostId);
   static bool ValueExists(const rapidjson::Value& object, const char* member);
   // Schema-aware equality of a desired and a host value (docs/drift.md).
   static bool IsEqualValue(const rapidjson::Value& desired, const rapidjson::Value& host,

@@ -32,6 +32,9 @@ HOXCM_API void CreateFileFromDocument(const char* path, const Document& doc);
 HOXCM_API std::string GetBIOSUUID();
 // The part of `source` that applies to this host.
 HOXCM_API void CreateMergedDocument(const Document& source, Document& result);
+// The same, taking `source` over instead of copying it (a large desired
+// document is then held once).
+HOXCM_API void CreateMergedDocument(Document&& source, Document& result);
 HOXCM_API bool IsMaintenanceModeEnabled();
 
 // The value of the identity member the key's schema names; empty when it

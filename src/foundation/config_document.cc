@@ -229,21 +229,21 @@ std::string ConfigStoreDocument::NormalizeHostId(const std::string& hostId) {
 void ConfigStoreDocument::GetDocumentForHost(const rapidjson::Value& source, rapidjson::Document& result,
                                              const std::string& hostId) {
   RAPIDJSON_ASSERT(source.IsObject());
-  result.SetObject();
-  Allocator& allocator = result.GetAllocator();
-  const Value* sections = nullptr;
-  for (const auto& member : source.GetObject()) {
-    if (Name(member.name) == kHostSpecific) {
-      sections = &member.value;
-      continue;
-    }
-    result.AddMember(Value(member.name, allocator), Value(member.value, allocator), allocator);
-  }
-  if (sections == nullptr) return;
-  RAPIDJSON_ASSERT(sections->IsObject());
-  Value& target = Shape::Unwrap(result);
+  result.CopyFrom(source, result.GetAllocator());
+  ReduceToHost(result, hostId);
+}
+
+void ConfigStoreDocument::ReduceToHost(rapidjson::Document& document, const std::string& hostId) {
+  RAPIDJSON_ASSERT(document.IsObject());
+  auto found = document.FindMember(kHostSpecific);
+  if (found == document.MemberEnd()) return;
+  Value sections(std::move(found->value));
+  document.EraseMember(found);
+  RAPIDJSON_ASSERT(sections.IsObject());
+  Allocator& allocator = document.GetAllocator();
+  Value& target = Shape::Unwrap(document);
   const std::string host = NormalizeHostId(hostId);
-  for (const auto& section : sections->GetObject()) {
+  for (const auto& section : sections.GetObject()) {
     RAPIDJSON_ASSERT(section.value.IsObject());
     if (NormalizeHostId(section.name.GetString()) != host) continue;
     MergeItems(target, section.value, allocator);

@@ -19,9 +19,9 @@ constexpr const char* kFileHelp = "Desired configuration document ('-': standard
 // The document as it applies to this host: host-specific sections (as an
 // export writes them) are reduced to this host's.
 rapidjson::Document LoadDesired(const std::string& path) {
-  const rapidjson::Document file = ReadConfigurationDocument(path);
+  rapidjson::Document file = ReadConfigurationDocument(path);
   rapidjson::Document doc;
-  InDocument(path, [&] { HoxConfigManager::CreateMergedDocument(file, doc); });
+  InDocument(path, [&] { HoxConfigManager::CreateMergedDocument(std::move(file), doc); });
   return doc;
 }
 

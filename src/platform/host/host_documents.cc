@@ -16,6 +16,12 @@ void CreateMergedDocument(const Document& source, Document& result) {
   HoxConfigStore::ConfigStoreDocument::GetDocumentForHost(source, result, GetBIOSUUID());
 }
 
+void CreateMergedDocument(Document&& source, Document& result) {
+  RAPIDJSON_ASSERT(source.IsObject());
+  HoxConfigStore::ConfigStoreDocument::ReduceToHost(source, GetBIOSUUID());
+  result.Swap(source);
+}
+
 bool IsMaintenanceModeEnabled() {
   CSLogger::Log(CSLogger::kInfo, "Checking if host is in maintenanceMode");
   // A host whose state cannot be read is treated as not in maintenance mode:
