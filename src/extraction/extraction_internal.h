@@ -7,7 +7,7 @@
 #include <string>
 
 #include <hoxcm/config_store.h>
-#include <hoxcm/operations.h>
+#include <hoxcm/extraction.h>
 #include <hoxcm/schema_store.h>
 
 namespace HoxConfigManager::detail {
