@@ -16,7 +16,7 @@ TEST(HoxcfgPluginsTest, ListsTheSamplePluginsAndReportsBadManifests) {
   ASSERT_EQ(list.exitCode, 0) << list.err;
   HoxConfigManager::Document doc;
   HoxConfigManager::ParseDocument(list.out, doc);
-  EXPECT_EQ(doc["plugins"].Size(), 9u);
+  EXPECT_EQ(doc["plugins"].Size(), 10u);
   EXPECT_STREQ(doc["order"][0].GetString(), "REMEDIATE:hox");
   EXPECT_STREQ(doc["order"][doc["order"].Size() - 1].GetString(), "system");
   // The sample plugins agree with the manifest schemas.

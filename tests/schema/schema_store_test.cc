@@ -34,7 +34,7 @@ TEST(SchemaStoreTest, SampleKeysAnswerEveryQueryAsTheirFilesDeclare) {
   auto store = SchemaStore::GetStore();
   ASSERT_TRUE(store);
   EXPECT_TRUE(store->GetLoadErrors().empty());
-  EXPECT_EQ(store->ListKeys().size(), 16u);
+  EXPECT_EQ(store->ListKeys().size(), 17u);
 
   // "single|multi identity defaults mutable reboot: OPS props|- mm: OPS props|-"
   const auto describe = [&](const char* c, const char* g, const char* k) {
@@ -59,7 +59,8 @@ TEST(SchemaStoreTest, SampleKeysAnswerEveryQueryAsTheirFilesDeclare) {
   EXPECT_EQ(describe("network", "dns", "config"), "single  10 reboot: - mm: -");
   EXPECT_EQ(describe("network", "interfaces", "vnic"), "multi name 00 reboot: - mm: SET props");
   EXPECT_EQ(describe("network", "firewall", "rules"), "multi name 00 reboot: - mm: ADD DELETE -");
-  EXPECT_EQ(describe("system", "kernel", "boot_options"), "single  00 reboot: SET props mm: -");
+  EXPECT_EQ(describe("network", "vswitch", "portgroups"), "multi name 00 reboot: - mm: DELETE -");
+  EXPECT_EQ(describe("system", "kernel", "boot_options"), "single  00 reboot: SET ADD DELETE props mm: -");
   EXPECT_EQ(describe("services", "time", "ntp"), "single  11 reboot: - mm: -");
 
   auto users = store->Find("security", "accounts", "users");
@@ -112,6 +113,8 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
       {"bad/x/trigger", withProperty(R"({"type": "integer", "rebootRequired": [1]})"), "must be {\"SET\""},
       {"bad/x/trigger_type", withProperty(R"({"type": "integer", "rebootRequired": {"SET": ["1"]}})"),
        "must be of the property's type \"integer\""},
+      {"bad/x/trigger_kind", withProperty(R"({"type": "array", "rebootRequired": {"SET": []}})"),
+       "need a property of type integer, number, boolean or string"},
       {"bad/x/regex", withProperty(R"({"type": "string", "pattern": "(["})"), "invalid regular expression"},
       {"bad/x/long_regex", withProperty(R"({"type": "string", "pattern": ")" + std::string(200000, 'a') + "\"}"),
        "longer than 4096 bytes"},
@@ -148,7 +151,7 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
   EXPECT_TRUE(store->Find("good", "x", "fine"));
   EXPECT_TRUE(store->Find("network", "dns", "config"));
   EXPECT_FALSE(store->Find("bad", "x", "unknown"));
-  EXPECT_EQ(store->ListKeys().size(), 17u);
+  EXPECT_EQ(store->ListKeys().size(), 18u);
 }
 
 TEST(SchemaStoreTest, StoresAreCachedPerRoot) {

@@ -1,14 +1,18 @@
 // The sample "network" plugin: owns DNS, vNICs, static routes and firewall
 // rules. Apply writes <root>/etc/resolv.conf and one file per vNIC under
 // <root>/etc/tarvik/network/; impact asks for maintenance mode when firewall
-// rules are added or removed; validate requires IPv4 DNS servers.
+// rules are added or removed; validate requires IPv4 DNS servers and vNICs
+// attached to port groups that the document defines (the port groups come
+// as references: the network:vswitch plugin owns them).
 #include <arpa/inet.h>
 
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <set>
 #include <string>
+#include <vector>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/files.h>
@@ -138,6 +142,39 @@ char* Impact(const char* requestText, const char*) {
   }
 }
 
+// One finding of a validation result: `field` and one error.
+void AddFinding(Value& findings, const std::string& field, const char* id, const std::vector<std::string>& args,
+                const std::string& message, Document::AllocatorType& a) {
+  Value error(rapidjson::kObjectType);
+  error.AddMember("id", Value(id, a), a);
+  Value list(rapidjson::kArrayType);
+  for (const std::string& arg : args) list.PushBack(Value(arg, a), a);
+  error.AddMember("args", list, a);
+  error.AddMember("message", Value(message, a), a);
+  Value errors(rapidjson::kArrayType);
+  errors.PushBack(error, a);
+  Value finding(rapidjson::kObjectType);
+  finding.AddMember("field", Value(field, a), a);
+  finding.AddMember("errors", errors, a);
+  findings.PushBack(finding, a);
+}
+
+std::string Text(const Value& v) { return v.IsString() ? v.GetString() : HoxConfigManager::JsonToString(v); }
+
+// The port groups the document defines: the plugin's references.
+std::set<std::string> PortGroups(const Value& request) {
+  std::set<std::string> names;
+  if (!request.HasMember("references")) return names;
+  for (const Value& ref : Member(request, "references").GetArray()) {
+    if (Str(ref, "group") != "vswitch" || Str(ref, "key") != "portgroups") continue;
+    const Document config = ConfigOf(ref);
+    if (config.IsObject() && config.HasMember("name") && config["name"].IsString()) {
+      names.insert(config["name"].GetString());
+    }
+  }
+  return names;
+}
+
 char* Validate(const char* requestText, const char*) {
   try {
     Document request;
@@ -145,28 +182,33 @@ char* Validate(const char* requestText, const char*) {
     Document result(rapidjson::kObjectType);
     auto& a = result.GetAllocator();
     Value findings(rapidjson::kArrayType);
+    const std::set<std::string> portGroups = PortGroups(request);
+    int vnicIndex = 0;
     for (const Value& item : Member(request, "data").GetArray()) {
-      if (Str(item, "group") != "dns" || Str(item, "key") != "config") continue;
       const Document config = ConfigOf(item);
+      if (Str(item, "group") == "interfaces" && Str(item, "key") == "vnic") {
+        // A vNIC attaches to a port group by name: the port group must exist.
+        const int index = vnicIndex++;
+        if (!config.IsObject() || !config.HasMember("portgroup") || !config["portgroup"].IsString()) continue;
+        const std::string portGroup = config["portgroup"].GetString();
+        if (portGroups.count(portGroup) != 0) continue;
+        const std::string vnic = config.HasMember("name") ? Text(config["name"]) : "#" + std::to_string(index);
+        AddFinding(findings, "/network/interfaces/vnic/" + std::to_string(index) + "/portgroup",
+                   "com.tarvik.hox.settings.network.vnic.unknown-portgroup", {vnic, portGroup},
+                   "vNIC " + vnic + " attaches to port group \"" + portGroup + "\", which the document does not define",
+                   a);
+        continue;
+      }
+      if (Str(item, "group") != "dns" || Str(item, "key") != "config") continue;
       if (!config.IsObject() || !config.HasMember("servers") || !config["servers"].IsArray()) continue;
       int index = 0;
       for (const Value& server : config["servers"].GetArray()) {
         in_addr address;
         const bool ok = server.IsString() && ::inet_pton(AF_INET, server.GetString(), &address) == 1;
         if (!ok) {
-          const std::string text = server.IsString() ? server.GetString() : HoxConfigManager::JsonToString(server);
-          Value error(rapidjson::kObjectType);
-          error.AddMember("id", "com.tarvik.hox.settings.network.dns.invalid-server", a);
-          Value args(rapidjson::kArrayType);
-          args.PushBack(Value(text, a), a);
-          error.AddMember("args", args, a);
-          error.AddMember("message", Value("not an IPv4 address: " + text, a), a);
-          Value errors(rapidjson::kArrayType);
-          errors.PushBack(error, a);
-          Value finding(rapidjson::kObjectType);
-          finding.AddMember("field", Value("/network/dns/config/servers/" + std::to_string(index), a), a);
-          finding.AddMember("errors", errors, a);
-          findings.PushBack(finding, a);
+          const std::string text = Text(server);
+          AddFinding(findings, "/network/dns/config/servers/" + std::to_string(index),
+                     "com.tarvik.hox.settings.network.dns.invalid-server", {text}, "not an IPv4 address: " + text, a);
         }
         ++index;
       }

@@ -216,6 +216,12 @@ void CheckTriggers(const rapidjson::Value& property, const rapidjson::Value& tri
     Fail(std::string(keyword) + " at " + where.Text() + ": a property with trigger values needs a single \"type\"");
   }
   const std::string kind = type->value.GetString();
+  // Triggers are matched against a changed scalar: on any other kind of
+  // property they would never fire.
+  if (kind != "integer" && kind != "number" && kind != "boolean" && kind != "string") {
+    Fail(where + ": trigger values need a property of type integer, number, boolean or string, not \"" + kind +
+         "\"");
+  }
   for (const auto& v : triggers.GetArray()) {
     const bool ok = (kind == "integer" && v.IsInt64()) || (kind == "number" && v.IsNumber()) ||
                     (kind == "boolean" && v.IsBool()) || (kind == "string" && v.IsString());
