@@ -145,6 +145,7 @@ class HOXCM_API PluginManager {
   std::vector<std::shared_ptr<Plugin>> Find(const HoxConfigStore::ConfigStoreObjectId& id);
   // "object key:manifest path", one per extension-table entry.
   std::vector<std::string> List();
+  // In manifest path order.
   std::vector<std::shared_ptr<Plugin>> GetPlugins();
   std::vector<std::string> GetDependencies();
   void BuildDependencies();

@@ -1,5 +1,6 @@
 // PluginManager: the registry of installed plugins and the order in which
 // apply operations run.
+#include <algorithm>
 #include <stdexcept>
 
 #include <boost/graph/adjacency_list.hpp>
@@ -91,8 +92,13 @@ std::vector<std::string> PluginManager::List() {
 }
 
 std::vector<std::shared_ptr<Plugin>> PluginManager::GetPlugins() {
+  // In manifest path order, the order they were loaded in: callers that run
+  // them one by one (validation) run them in the same order every time.
+  std::vector<const std::pair<const std::string, std::shared_ptr<Plugin>>*> sorted;
+  for (const auto& entry : plugins) sorted.push_back(&entry);
+  std::sort(sorted.begin(), sorted.end(), [](const auto* a, const auto* b) { return a->first < b->first; });
   std::vector<std::shared_ptr<Plugin>> result;
-  for (const auto& entry : plugins) result.push_back(entry.second);
+  for (const auto* entry : sorted) result.push_back(entry->second);
   return result;
 }
 

@@ -1,5 +1,8 @@
 # The workflow operations built on the drift engine and the plugin framework.
 list(APPEND HOXCM_SOURCES
+  src/workflow/impact.cc
+  src/workflow/impact_handler.cc
   src/workflow/remediation.cc
   src/workflow/remediation_plan.cc
+  src/workflow/validation.cc
 )

@@ -160,32 +160,7 @@ class SamplePluginsTest : public PluginTest {
     root.InstallRunners();
     root.InstallSamplePlugins();
   }
-  std::shared_ptr<Plugin> Owner(PluginType type, const ConfigStoreObjectId& id) {
-    const auto owners = PluginManager(type).Find(id);
-    EXPECT_EQ(owners.size(), 1u) << id.toString();
-    return owners.empty() ? nullptr : owners[0];
-  }
 };
-
-TEST_F(SamplePluginsTest, ImpactAndValidationVerdicts) {
-  const ConfigStoreObjectId rule("network", "firewall", "rules", "ssh");
-  const auto impact = Owner(IMPACT, rule)->Impact({{Object(rule, R"({"name":"ssh"})"), nullptr, "ADD"}}, "",
-                                                  PluginMonitor::Dummy());
-  ASSERT_EQ(impact.impacts.size(), 1u);
-  EXPECT_EQ(impact.impacts[0].impact, 1);
-
-  const ConfigStoreObjectId host("system", "identity", "hostname");
-  const std::pair<std::shared_ptr<HoxConfigStore::ConfigStoreObject>, const char*> cases[] = {
-      {Object(kDns, R"({"servers":["10.0.0.1","fe80::1"]})"), "/network/dns/config/servers/1"},
-      {Object(host, R"({"hostname":"-bad_name"})"), "/system/identity/hostname/hostname"},
-  };
-  for (const auto& [object, field] : cases) {
-    const auto verdict = Owner(VALIDATE, object->GetConfigStoreObjectId())->Validate({object}, {}, "",
-                                                                                     PluginMonitor::Dummy());
-    ASSERT_EQ(verdict.errors.size(), 1u) << field;
-    EXPECT_EQ(verdict.errors[0].field, field);
-  }
-}
 
 TEST_F(SamplePluginsTest, ApplyingADocumentMakesTheHostCompliantAndWritesItsFiles) {
   for (const auto& [kind, file] : {std::pair{HoxConfigStore::ConfigKind::Default, "default-config.json"},

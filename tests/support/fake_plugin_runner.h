@@ -27,6 +27,7 @@ class FakePluginRunner final : public HoxConfigManager::PluginRunner {
     std::string kind;  // "APPLY", "IMPACT" or "VALIDATE"
     std::string pluginId;
     std::vector<DesiredConfigInput> inputs;  // apply and impact
+    StoreObjects data, references;           // validate
     std::string context;
     std::string taskId;
   };
@@ -52,18 +53,19 @@ class FakePluginRunner final : public HoxConfigManager::PluginRunner {
                                               std::shared_ptr<PluginMonitor> monitor) override {
     return Run("IMPACT", p, inputs, context, monitor, impact);
   }
-  HoxConfigManager::ValidationPluginResult Validate(const Plugin& p, const StoreObjects&, const StoreObjects&,
-                                                    const std::string& context,
+  HoxConfigManager::ValidationPluginResult Validate(const Plugin& p, const StoreObjects& data,
+                                                    const StoreObjects& references, const std::string& context,
                                                     std::shared_ptr<PluginMonitor> monitor) override {
-    return Run("VALIDATE", p, {}, context, monitor, validate);
+    return Run("VALIDATE", p, {}, context, monitor, validate, data, references);
   }
 
  private:
   template <typename Result>
   Result Run(const char* kind, const Plugin& p, const std::vector<DesiredConfigInput>& inputs,
              const std::string& context, const std::shared_ptr<PluginMonitor>& monitor,
-             const std::map<std::string, Result>& results) {
-    calls.push_back({kind, p.GetId(), inputs, context, monitor ? monitor->GetTaskId() : ""});
+             const std::map<std::string, Result>& results, const StoreObjects& data = {},
+             const StoreObjects& references = {}) {
+    calls.push_back({kind, p.GetId(), inputs, data, references, context, monitor ? monitor->GetTaskId() : ""});
     if (during) during(calls.back());
     const auto it = results.find(p.GetId());
     return it == results.end() ? Result() : it->second;

@@ -1,0 +1,142 @@
+// Impact: the walk with the impact handler, then the impact plugins asked
+// one by one, folded into one ImpactResult.
+#include "workflow/impact.h"
+
+#include <algorithm>
+#include <functional>
+#include <tuple>
+
+#include <hoxcm/host.h>
+
+#include "workflow/impact_handler.h"
+
+namespace HoxConfigManager {
+namespace {
+
+constexpr const char* kStarted = "com.tarvik.hox.settings.impact.plugin.started";
+constexpr const char* kFinished = "com.tarvik.hox.settings.impact.plugin.finished";
+constexpr const char* kAborted = "com.tarvik.hox.settings.impact.plugin.aborted";
+
+const char* ImpactName(int impact) {
+  switch (impact) {
+    case IMPACT_NONE: return "none";
+    case IMPACT_MAINTENANCE_MODE_REQUIRED: return "maintenance mode";
+    case IMPACT_REBOOT_REQUIRED: return "reboot";
+    default: return "unknown";
+  }
+}
+
+// Adds a plugin's verdict to the reasons: to the one object of its run that
+// the verdict's key names, or to the key when the run held several (or none)
+// of its objects, since a verdict names no instance.
+void AddPluginReason(ImpactReasons& reasons, const TaskMap& run, const ImpactPluginInfo& verdict) {
+  const IMPACT_TYPE level = static_cast<IMPACT_TYPE>(verdict.impact);
+  ObjectImpact object;
+  object.id = HoxConfigStore::ConfigStoreObjectId(verdict.component, verdict.group, verdict.key);
+  int named = 0;
+  for (const DesiredConfigInput& input : run.inputs) {
+    const auto& id = input.object->GetConfigStoreObjectId();
+    if (id.component != verdict.component || id.group != verdict.group || id.key != verdict.key) continue;
+    if (++named == 1) {
+      object.id = id;
+      object.action = input.action;
+    }
+  }
+  if (named != 1) {
+    object.id.instanceId.clear();
+    object.action.clear();
+  }
+  ImpactReason reason;
+  reason.rule = ImpactReason::Rule::kPlugin;
+  reason.impact = level;
+  reason.plugin = run.plugin->GetId();
+  reason.reason = verdict.reason;
+  const auto same = std::find_if(reasons.objects.begin(), reasons.objects.end(), [&](const ObjectImpact& o) {
+    return o.id == object.id && o.action == object.action;
+  });
+  ObjectImpact& entry = same != reasons.objects.end() ? *same : reasons.objects.emplace_back(std::move(object));
+  entry.impact = std::max(entry.impact, level);
+  entry.reasons.push_back(std::move(reason));
+}
+
+}  // namespace
+
+std::size_t ImpactInfoHash::operator()(const ImpactInfo& info) const {
+  std::size_t h = std::hash<std::string>()(info.id);
+  for (const std::string& arg : info.args) h = h * 1000003u ^ std::hash<std::string>()(arg);
+  return h;
+}
+
+void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& result,
+            std::shared_ptr<TaskHandle> taskHandle, std::optional<Document> currentDocument, ImpactReasons* reasons) {
+  Impact(desiredDocument, taskId, result, std::move(taskHandle), std::move(currentDocument), reasons,
+         PluginRunner::Default());
+}
+
+void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& result,
+            std::shared_ptr<TaskHandle> taskHandle, std::optional<Document> currentDocument, ImpactReasons* reasons,
+            PluginRunner& runner) {
+  CSLogger::Log(CSLogger::kDetail, "%s invoked", "Impact");
+  std::shared_ptr<TaskHandle> task = taskHandle ? std::move(taskHandle) : TaskHandle::Dummy();
+  ImpactHandler handler(reasons != nullptr);
+  RAPIDJSON_ASSERT(desiredDocument.IsObject());
+  // The walk looks through a "profile" wrapper itself.
+  ComputeDrift(desiredDocument, desiredDocument.GetAllocator(), handler, std::move(currentDocument));
+  ImpactReasons why = handler.TakeReasons();
+
+  task->UpdateProgress(20.0f);
+  const std::unordered_map<std::string, TaskMap>& runs = handler.PluginMap();
+  const float step = runs.empty() ? 100.0f : 80.0f / static_cast<float>(runs.size());
+  float progress = 20.0f;
+  bool pluginReboot = false, pluginMaintenance = false;
+  const auto monitor = std::make_shared<TaskPluginMonitor>(task);
+  // In the order the walk met each plugin's first object.
+  for (const std::string& name : handler.GetPluginOrder()) {
+    const TaskMap& run = runs.at(name);
+    if (task->IsAborted()) {
+      CSLogger::Log(CSLogger::kInfo, "Impact aborted, returning...");
+      result.error = ErrorInfo(kAborted, {name}, "");
+      return;
+    }
+    CSLogger::Log(CSLogger::kInfo, "Invoking plugin: %s", name.c_str());
+    task->AddNotification()->PluginInfo(kStarted, {name});
+    const ImpactPluginResult verdicts = runner.Impact(*run.plugin, run.inputs, taskId, monitor);
+    if (!verdicts.error.id.empty()) {
+      CSLogger::Log(CSLogger::kError, "%s plugin failed to execute.", name.c_str());
+      task->AddNotification()->PluginError(verdicts.error);
+      result.error = verdicts.error;
+      return;
+    }
+    for (const ImpactPluginInfo& verdict : verdicts.impacts) {
+      CSLogger::Log(CSLogger::kInfo, "Impact: Plugin=%s, impact=%d (%s:%s:%s:%s)", name.c_str(), verdict.impact,
+                    verdict.component.c_str(), verdict.group.c_str(), verdict.key.c_str(), verdict.reason.c_str());
+      pluginReboot = pluginReboot || verdict.impact == IMPACT_REBOOT_REQUIRED;
+      pluginMaintenance = pluginMaintenance || verdict.impact == IMPACT_MAINTENANCE_MODE_REQUIRED;
+      if (reasons != nullptr && verdict.impact != IMPACT_NONE) AddPluginReason(why, run, verdict);
+    }
+    progress += step;
+    task->UpdateProgress(progress);
+    task->AddNotification()->PluginInfo(kFinished, {name});
+  }
+
+  result.compliant = handler.GetCompliant();
+  if (result.compliant) return;
+  // The statements in a stable order, so that equal verdicts read alike.
+  const auto statements = handler.GetImpactInfo();
+  result.impactInfo.assign(statements.begin(), statements.end());
+  std::sort(result.impactInfo.begin(), result.impactInfo.end(), [](const ImpactInfo& a, const ImpactInfo& b) {
+    return std::tie(a.args, a.id) < std::tie(b.args, b.id);
+  });
+  // Schema and plugins combined; reboot covers maintenance mode.
+  if (pluginReboot || handler.GetRebootRequired()) {
+    result.impact = IMPACT_REBOOT_REQUIRED;
+    result.impactInfo.insert(result.impactInfo.begin(), ImpactInfo{kImpactInfoReboot, {}});
+  } else if (pluginMaintenance || handler.GetMaintenanceModeRequired()) {
+    result.impact = IMPACT_MAINTENANCE_MODE_REQUIRED;
+    result.impactInfo.insert(result.impactInfo.begin(), ImpactInfo{kImpactInfoMaintenanceMode, {}});
+  }
+  CSLogger::Log(CSLogger::kDetail, "Impact of the desired configuration: %s", ImpactName(result.impact));
+  if (reasons != nullptr) *reasons = std::move(why);
+}
+
+}  // namespace HoxConfigManager

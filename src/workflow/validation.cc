@@ -1,0 +1,224 @@
+// Validate: the schema stage over the whole document, then the validation
+// plugins, findings merged per field.
+#include "workflow/validation.h"
+
+#include <algorithm>
+#include <charconv>
+#include <cstdint>
+#include <limits>
+#include <string_view>
+#include <unordered_map>
+#include <unordered_set>
+#include <utility>
+
+#include <hoxcm/documents.h>
+#include <hoxcm/host.h>
+#include <hoxcm/schema_store.h>
+
+#include "foundation/compare/value_compare.h"
+
+namespace HoxConfigManager {
+namespace {
+
+using HoxConfigStore::ConfigStoreObject;
+using HoxConfigStore::ConfigStoreObjectId;
+using HoxConfigStore::detail::FindByName;
+using HoxConfigStore::detail::NameOf;
+using StoreObjects = std::vector<std::shared_ptr<ConfigStoreObject>>;
+using FailedSet = std::unordered_set<ConfigStoreObjectId, CsoIdHash>;
+
+constexpr const char* kStarted = "com.tarvik.hox.settings.validation.plugin.started";
+constexpr const char* kFinished = "com.tarvik.hox.settings.validation.plugin.finished";
+constexpr const char* kAborted = "com.tarvik.hox.settings.validation.plugin.aborted";
+
+// The "/"-separated segments of a field ("/a/b/0" gives a, b, 0).
+std::vector<std::string_view> Segments(std::string_view field) {
+  std::vector<std::string_view> out;
+  if (!field.empty() && field.front() == '/') field.remove_prefix(1);
+  while (!field.empty()) {
+    const std::size_t slash = field.find('/');
+    out.push_back(field.substr(0, slash));
+    if (slash == std::string_view::npos) break;
+    field.remove_prefix(slash + 1);
+  }
+  return out;
+}
+
+// The object a finding's field belongs to, as the set of failed objects
+// holds it: the key whose item contains the field ("/c/g/k/..." gives
+// component c, group g, key k, no instance: plugins own whole keys). A field
+// above the key level ("/c", "/c/g") leaves the missing names empty, which
+// stands for every key below it.
+ConfigStoreObjectId FailedObjectOf(const std::string& field) {
+  const std::vector<std::string_view> s = Segments(field);
+  auto at = [&s](std::size_t i) { return i < s.size() ? std::string(s[i]) : std::string(); };
+  return ConfigStoreObjectId(at(0), at(1), at(2));
+}
+
+// A key of the plugin, or a component or group above it, failed the schema.
+bool Failed(const FailedSet& failed, const ConfigStoreObjectId& key) {
+  if (failed.empty()) return false;
+  return failed.count(ConfigStoreObjectId(key.component, key.group, key.key)) != 0 ||
+         failed.count(ConfigStoreObjectId(key.component, key.group, "")) != 0 ||
+         failed.count(ConfigStoreObjectId(key.component, "", "")) != 0 || failed.count(ConfigStoreObjectId()) != 0;
+}
+
+// The item of a key in the document, or null when the document has none
+// (also when a level above it is not an object: the schema stage reports
+// that).
+const Value* ItemOf(const Value& root, const ConfigStoreObjectId& key) {
+  const Value* level = &root;
+  for (const std::string* name : {&key.component, &key.group, &key.key}) {
+    if (!level->IsObject()) return nullptr;
+    level = FindByName(*level, *name);
+    if (level == nullptr) return nullptr;
+  }
+  return level;
+}
+
+bool IsDeleteDefault(const Value& v) { return v.IsString() && NameOf(v) == DocumentShape::kDeleteDefault; }
+
+// One store object per configured value of the keys: one for a singleton's
+// object, one per instance. The marker of a deleted default configuration
+// holds no configuration to validate and is left out.
+StoreObjects Gather(const Value& root, const std::vector<ConfigStoreObjectId>& keys,
+                    const std::shared_ptr<HoxSchemaStore::SchemaStore>& store) {
+  StoreObjects objects;
+  for (const ConfigStoreObjectId& key : keys) {
+    const Value* item = ItemOf(root, key);
+    if (item == nullptr) continue;
+    const auto schema = store ? store->Find(key.component, key.group, key.key) : nullptr;
+    const ConfigStoreObjectId id(key.component, key.group, key.key);
+    if (item->IsArray()) {
+      for (const Value& instance : item->GetArray()) {
+        if (!IsDeleteDefault(instance)) objects.push_back(HoxConfigStore::CreateObject(id, instance, schema));
+      }
+    } else if (!IsDeleteDefault(*item)) {
+      objects.push_back(HoxConfigStore::CreateObject(id, *item, schema));
+    }
+  }
+  return objects;
+}
+
+// Where a field lies in the document, as the positions of its segments;
+// a segment the document lacks (a missing member) sorts after its
+// siblings that exist.
+std::vector<std::uint32_t> DocumentPosition(const Value& root, const std::string& field) {
+  constexpr std::uint32_t kAbsent = std::numeric_limits<std::uint32_t>::max();
+  std::vector<std::uint32_t> position;
+  const Value* at = &root;
+  for (const std::string_view segment : Segments(field)) {
+    std::uint32_t index = kAbsent;
+    if (at != nullptr && at->IsObject()) {
+      for (auto it = at->MemberBegin(); it != at->MemberEnd(); ++it) {
+        if (NameOf(it->name) == segment) {
+          index = static_cast<std::uint32_t>(it - at->MemberBegin());
+          break;
+        }
+      }
+    } else if (at != nullptr && at->IsArray()) {
+      std::uint32_t i = 0;
+      const auto [end, error] = std::from_chars(segment.data(), segment.data() + segment.size(), i);
+      if (error == std::errc() && end == segment.data() + segment.size() && i < at->Size()) index = i;
+    }
+    position.push_back(index);
+    at = index == kAbsent ? nullptr : (at->IsObject() ? &at->MemberBegin()[index].value : &(*at)[index]);
+  }
+  return position;
+}
+
+}  // namespace
+
+std::size_t CsoIdHash::operator()(const ConfigStoreObjectId& id) const {
+  return std::hash<std::string>()(id.toString());
+}
+
+void Validate(const Document& desiredDocument, const Document& schemaDocument, const std::string& taskId,
+              ValidationResult& result, bool checkSchema, std::shared_ptr<TaskHandle> taskHandle) {
+  Validate(desiredDocument, schemaDocument, taskId, result, checkSchema, std::move(taskHandle),
+           PluginRunner::Default());
+}
+
+void Validate(const Document& desiredDocument, const Document& schemaDocument, const std::string& taskId,
+              ValidationResult& result, bool checkSchema, std::shared_ptr<TaskHandle> taskHandle,
+              PluginRunner& runner) {
+  CSLogger::Log(CSLogger::kInfo, "ConfigManager Validate API invoked");
+  std::shared_ptr<TaskHandle> task = taskHandle ? std::move(taskHandle) : TaskHandle::Dummy();
+  const Value& root = DocumentShape::Unwrap(desiredDocument);
+  // Each field once: the first finding for it wins.
+  std::unordered_map<std::string, ValidationErrorInfo> findings;
+  FailedSet failed;
+
+  if (checkSchema) {
+    Document output;
+    JsonValidator::ValidateCMDocument(schemaDocument, root, output, {}, "");
+    RAPIDJSON_ASSERT(output.IsArray());
+    for (const Value& finding : output.GetArray()) {
+      RAPIDJSON_ASSERT(finding.IsObject());
+      const Value& field = finding["field"];
+      const Value& code = finding["errId"];
+      const Value& args = finding["errArgs"];
+      RAPIDJSON_ASSERT(field.IsString() && code.IsInt() && args.IsArray());
+      ErrorInfo error(JsonValidator::ConvertErrorCodeToMsgId(code.GetInt()), {}, "");
+      for (const Value& arg : args.GetArray()) {
+        RAPIDJSON_ASSERT(arg.IsString());
+        error.args.emplace_back(arg.GetString(), arg.GetStringLength());
+      }
+      ValidationErrorInfo& entry = findings[field.GetString()];
+      entry.field = field.GetString();
+      entry.errors.push_back(std::move(error));
+      failed.insert(FailedObjectOf(entry.field));
+    }
+  }
+  task->UpdateProgress(20.0f);
+
+  PluginManager registry(VALIDATE);
+  const std::vector<std::shared_ptr<Plugin>> plugins = registry.GetPlugins();
+  const auto monitor = std::make_shared<TaskPluginMonitor>(task);
+  const auto store = plugins.empty() ? nullptr : HoxSchemaStore::SchemaStore::GetStore();
+  const float step = plugins.empty() ? 100.0f : 80.0f / static_cast<float>(plugins.size());
+  float progress = 20.0f;
+  for (const std::shared_ptr<Plugin>& plugin : plugins) {
+    const std::string id = plugin->GetId();
+    if (task->IsAborted()) {
+      CSLogger::Log(CSLogger::kInfo, "Validation aborted, returning...");
+      result.error = ErrorInfo(kAborted, {id}, "");
+      return;
+    }
+    const std::vector<ConfigStoreObjectId> keys = plugin->GetCSOIdList();
+    const bool skip = std::any_of(keys.begin(), keys.end(), [&failed](const auto& k) { return Failed(failed, k); });
+    if (skip) {
+      // Its objects are already known to be invalid.
+      CSLogger::Log(CSLogger::kInfo, "Validation plugin %s skipped: its configuration failed the schema check",
+                    id.c_str());
+    } else {
+      const StoreObjects objects = Gather(root, keys, store);
+      const StoreObjects references = Gather(root, plugin->GetReferences(), store);
+      task->AddNotification()->PluginInfo(kStarted, {id});
+      ValidationPluginResult outcome = runner.Validate(*plugin, objects, references, taskId, monitor);
+      task->AddNotification()->PluginInfo(kFinished, {id});
+      if (!outcome.error.message.empty()) {
+        result.error = std::move(outcome.error);
+        return;
+      }
+      for (ValidationErrorInfo& finding : outcome.errors) {
+        const std::string field = finding.field;
+        findings.try_emplace(field, std::move(finding));
+      }
+    }
+    progress += step;
+    task->UpdateProgress(progress);
+  }
+
+  // In document order; fields the document lacks after their siblings.
+  std::vector<std::pair<std::vector<std::uint32_t>, ValidationErrorInfo>> ordered;
+  ordered.reserve(findings.size());
+  for (auto& [field, entry] : findings) ordered.emplace_back(DocumentPosition(root, field), std::move(entry));
+  std::sort(ordered.begin(), ordered.end(), [](const auto& a, const auto& b) {
+    return std::tie(a.first, a.second.field) < std::tie(b.first, b.second.field);
+  });
+  result.errors.clear();
+  for (auto& [position, entry] : ordered) result.errors.push_back(std::move(entry));
+}
+
+}  // namespace HoxConfigManager

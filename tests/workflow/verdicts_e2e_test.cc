@@ -1,0 +1,152 @@
+// Impact and validation end to end, with real runner processes: the sample
+// plugins judging and validating a changed sample host in both runner
+// languages, and plugin runs that crash, answer garbage or hang until
+// aborted.
+#include <chrono>
+#include <filesystem>
+#include <thread>
+
+#include <hoxcm/host_documents.h>
+#include <hoxcm/operations.h>
+
+#include "plugins/plugin_fixture.h"
+#include "support/fake_plugin_runner.h"
+#include "support/json.h"
+
+namespace hoxcm_test {
+namespace {
+
+using namespace HoxConfigManager;
+
+// `text` with its first `from` replaced by `to`.
+std::string With(std::string text, const std::string& from, const std::string& to) {
+  return text.replace(text.find(from), from.size(), to);
+}
+
+class VerdictsEndToEndTest : public PluginTest {
+ protected:
+  VerdictsEndToEndTest() : host_(JsonToString(SampleDocument("user-config.json"))) { root.InstallRunners(); }
+
+  // Impact of `desired` against the sample host, its reasons as lines.
+  ImpactResult Judge(const std::string& desired, std::vector<std::string>* reasonLines = nullptr,
+                     std::shared_ptr<TaskHandle> task = TaskHandle::Dummy()) {
+    Document document = Parse(desired);
+    ImpactResult result;
+    ImpactReasons reasons;
+    Impact(document, "t", result, std::move(task), Parse(host_), &reasons);
+    for (const ObjectImpact& object : reasons.objects) {
+      if (reasonLines == nullptr) break;
+      reasonLines->push_back(object.id.toString() + " " + object.action);
+      for (const ImpactReason& r : object.reasons) {
+        reasonLines->push_back(r.rule == ImpactReason::Rule::kPlugin ? "  " + r.plugin + ": " + r.reason
+                                                                     : "  schema " + r.path);
+      }
+    }
+    return result;
+  }
+  std::vector<std::string> Check(const std::string& desired, bool checkSchema, ErrorInfo* error = nullptr) {
+    const Document document = Parse(desired);
+    Document schema;
+    EXPECT_TRUE(GenerateHostDocumentSchema(document, schema));
+    ValidationResult result;
+    Validate(document, schema, "t", result, checkSchema);
+    if (error != nullptr) *error = result.error;
+    std::vector<std::string> lines;
+    for (const ValidationErrorInfo& entry : result.errors) {
+      for (const ErrorInfo& e : entry.errors) lines.push_back(entry.field + " " + e.id);
+    }
+    return lines;
+  }
+
+  const std::string host_;
+};
+
+TEST_F(VerdictsEndToEndTest, TheSamplePluginsJudgeAndValidateInBothLanguages) {
+  root.InstallSamplePlugins();
+  // A firewall rule added (the C++ plugin) and the management port group
+  // retagged (the Python plugin): maintenance mode, each for its reason.
+  std::string desired = With(host_, R"({"name":"ssh-mgmt")",
+                             R"({"name":"web","action":"allow","protocol":"tcp","port":443},{"name":"ssh-mgmt")");
+  desired = With(desired, R"("vswitch":"vSwitch0","vlan":0)", R"("vswitch":"vSwitch0","vlan":10)");
+  std::vector<std::string> reasons;
+  const ImpactResult result = Judge(desired, &reasons);
+  EXPECT_EQ(result.error, ErrorInfo());
+  EXPECT_EQ(result.impact, IMPACT_MAINTENANCE_MODE_REQUIRED);
+  EXPECT_EQ(reasons, (std::vector<std::string>{
+                         "comp network grp firewall key rules id web ADD",
+                         "  schema /network/firewall/rules/0",
+                         "  network: firewall rules change",
+                         "comp network grp vswitch key portgroups id Management Network SET",
+                         "  network:vswitch: the management port group moves to VLAN 10: the host's management "
+                         "connection moves with it",
+                     }));
+
+  // With the schema stage: the vNIC key fails its schema, so the C++ plugin
+  // is skipped; the Python plugin finds the empty domain label.
+  std::string faulty = With(host_, R"("mtu":1500)", R"("mtu":100)");
+  faulty = With(faulty, R"("domain":"lab.example.com")", R"("domain":"lab..example.com")");
+  faulty = With(faulty, R"("10.20.0.11")", R"("10.20.0.311")");
+  EXPECT_EQ(Check(faulty, true), (std::vector<std::string>{
+                                     "/network/dns/config/servers/1 com.tarvik.hox.settings.validation.pattern",
+                                     "/network/interfaces/vnic/0/mtu com.tarvik.hox.settings.validation.minimum",
+                                     "/system/identity/hostname/domain "
+                                     "com.tarvik.hox.settings.system.identity.invalid-name",
+                                 }));
+  // Plugins only: the C++ plugin checks the DNS servers, and each vNIC's
+  // port group against the port groups it gets as references.
+  faulty = With(faulty, R"("portgroup":"Storage")", R"("portgroup":"Nowhere")");
+  EXPECT_EQ(Check(faulty, false), (std::vector<std::string>{
+                                      "/network/dns/config/servers/1 com.tarvik.hox.settings.network.dns.invalid-server",
+                                      "/network/interfaces/vnic/1/portgroup "
+                                      "com.tarvik.hox.settings.network.vnic.unknown-portgroup",
+                                      "/system/identity/hostname/domain "
+                                      "com.tarvik.hox.settings.system.identity.invalid-name",
+                                  }));
+  EXPECT_TRUE(Check(host_, true).empty());
+}
+
+TEST_F(VerdictsEndToEndTest, ARunThatCrashesAnswersGarbageOrHangsEndsTheVerdictWithItsError) {
+  // One plugin per key: the conformance plugin in both languages, and a
+  // Python plugin that sleeps.
+  const std::string impact = R"(,"impact":{"supports":true},"validation":{"supports":true})";
+  Manifest("py/plugin.json", V3Manifest("python", {"network:dns:config"}, "network", "REMEDIATE:py", {}, impact));
+  std::filesystem::copy_file(SourcePath("tests/plugins/conformance_plugin.py"), root.Path(kModules + "py/plugin.py"));
+  Manifest("cc/plugin.json", V3Manifest("c++", {"system:identity:hostname"}, "system", "REMEDIATE:cc", {}, impact));
+  std::filesystem::copy_file(BuildPath("tests/plugins/libconformance.so"), root.Path(kModules + "cc/libcc.so"));
+  Manifest("sleepy/plugin.json", V3Manifest("python", {"system:kernel:boot_options"}, "system", "REMEDIATE:sleepy",
+                                            {}, R"(,"impact":{"supports":true})"));
+  root.WriteFile(kModules + "sleepy/plugin.py", "import time\n\ndef impact(request, host):\n    time.sleep(60)\n");
+
+  const std::string unexpected = "com.tarvik.hox.settings.impact.plugin.unexpected.error";
+  struct Case {
+    const char* from;
+    const char* to;
+    const char* plugin;
+  } cases[] = {
+      {R"("servers":[)", R"("behaviour":"throw","servers":[)", "py"},          // an exception in the plugin
+      {R"("hostname":"hox-host-01")", R"("hostname":"h","behaviour":"garbage")", "cc"},  // a result that is not JSON
+      {R"("hostname":"hox-host-01")", R"("hostname":"h","impact":7)", "cc"},  // a verdict out of range
+  };
+  for (const Case& c : cases) {
+    const ImpactResult result = Judge(With(host_, c.from, c.to));
+    EXPECT_EQ(result.error.id + " " + result.error.args.at(0), unexpected + " " + c.plugin) << c.to;
+    EXPECT_FALSE(result.error.message.empty());
+    EXPECT_TRUE(result.impactInfo.empty());
+  }
+  ErrorInfo error;
+  Check(With(host_, R"("servers":[)", R"("behaviour":"garbage","servers":[)"), false, &error);
+  EXPECT_EQ(error.id + " " + error.args.at(0), "com.tarvik.hox.settings.validation.plugin.unexpected.error py");
+
+  // A plugin that hangs is stopped by the abort.
+  auto task = std::make_shared<RecordingTask>();
+  std::thread aborter([task] {
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    task->aborted = true;
+  });
+  const ImpactResult hung = Judge(With(host_, R"("hugepages":2048)", R"("hugepages":4096)"), nullptr, task);
+  aborter.join();
+  EXPECT_EQ(hung.error.id + " " + hung.error.args.at(0), "com.tarvik.hox.settings.impact.plugin.aborted sleepy");
+}
+
+}  // namespace
+}  // namespace hoxcm_test
