@@ -219,8 +219,8 @@ void CheckTriggers(const rapidjson::Value& property, const rapidjson::Value& tri
   // Triggers are matched against a changed scalar: on any other kind of
   // property they would never fire.
   if (kind != "integer" && kind != "number" && kind != "boolean" && kind != "string") {
-    Fail(where + ": trigger values need a property of type integer, number, boolean or string, not \"" + kind +
-         "\"");
+    Fail(std::string(keyword) + " at " + where.Text() +
+         ": trigger values need a property of type integer, number, boolean or string, not \"" + kind + "\"");
   }
   for (const auto& v : triggers.GetArray()) {
     const bool ok = (kind == "integer" && v.IsInt64()) || (kind == "number" && v.IsNumber()) ||
