@@ -20,16 +20,12 @@ namespace {
 
 using detail::HostMatcher;
 using detail::kNone;
+using compare::MemberIndex;
+using compare::NameOf;
+using compare::SameBytes;
 using HoxConfigStore::ConfigStoreObjectId;
-using HoxConfigStore::detail::IsContainer;
-using HoxConfigStore::detail::IsGeneratedId;
-using HoxConfigStore::detail::MemberIndex;
-using HoxConfigStore::detail::NameOf;
-using HoxConfigStore::detail::SameBytes;
-using HoxConfigStore::detail::SameScalar;
 using HoxSchemaStore::SchemaObject;
 using rapidjson::SizeType;
-
 
 const Value& NullValue() {
   static const Value null;
@@ -137,62 +133,44 @@ class DriftWalk {
 
   // Reports the differing members of two objects: first those of `d` in its
   // order (additions and changes, nested objects depth first), then those
-  // only `h` holds, in its order. True when anything differed.
+  // only `h` holds, in its order. True when anything differed. Which members
+  // count, and under which schema, is the comparer's member pass: the rule
+  // of equality itself.
   bool CompareMembers(const Value& d, const Value& h, const Value& schema, Value* record) {
-    MemberIndex hostIndex(h);
-    HoxConfigStore::detail::ValueComparer::Children children(cmp_, schema);
     bool differed = false;
-    SizeType found = 0;
-    for (auto it = d.MemberBegin(); it != d.MemberEnd(); ++it) {
-      const std::string_view name = NameOf(it->name);
-      const Value& dv = it->value;
-      const Value* hv = hostIndex.Find(name);
-      if (IsGeneratedId(it->name)) {
-        found += hv != nullptr;
-        continue;
-      }
-      if (hv != nullptr) {
-        ++found;
-        // The common case, an unchanged scalar, needs no schema.
-        if (!IsContainer(dv) && !IsContainer(*hv) && SameScalar(dv, *hv)) continue;
-      }
-      const Value& childSchema = children.Of(name, dv);
-      const bool hostUnset = hv == nullptr || cmp_.IsUnset(*hv, childSchema);
-      const bool desiredUnset = cmp_.IsUnset(dv, childSchema);
-      const PathSegment segment(path_, name);
-      if (hostUnset || desiredUnset) {
-        if (hostUnset && desiredUnset) continue;
-        Report(dv, hv != nullptr ? *hv : NullValue(), childSchema, hostUnset ? ADD : DELETE, record, name);
-        differed = true;
-      } else if (dv.IsObject() && hv->IsObject()) {
-        Value sub;
-        if (CompareMembers(dv, *hv, childSchema, record != nullptr ? &sub : nullptr)) {
+    cmp_.Members(
+        d, h, schema,
+        [&](std::string_view name, const Value& dv, const Value* hv, const Value& childSchema) {
+          const bool hostUnset = hv == nullptr || cmp_.IsUnset(*hv, childSchema);
+          const bool desiredUnset = cmp_.IsUnset(dv, childSchema);
+          if (hostUnset && desiredUnset) return true;
+          const PathSegment segment(path_, name);
+          if (hostUnset || desiredUnset) {
+            Report(dv, hv != nullptr ? *hv : NullValue(), childSchema, hostUnset ? ADD : DELETE, record, name);
+            differed = true;
+          } else if (dv.IsObject() && hv->IsObject()) {
+            Value sub;
+            if (CompareMembers(dv, *hv, childSchema, record != nullptr ? &sub : nullptr)) {
+              differed = true;
+              if (record != nullptr) Mark(record, name, sub.IsNull() ? NewRecord(SET) : std::move(sub));
+            }
+          } else if (dv.IsArray() && hv->IsArray() && cmp_.HoldsObjects(childSchema, dv, *hv)) {
+            if (CompareObjectArrays(dv, *hv, childSchema)) {
+              differed = true;
+              Mark(record, name, NewRecord(SET));
+            }
+          } else if (!cmp_.Equal(dv, *hv, childSchema)) {
+            Report(dv, *hv, childSchema, SET, record, name);
+            differed = true;
+          }
+          return true;
+        },
+        [&](std::string_view name, const Value& hv, const Value& childSchema) {
+          const PathSegment segment(path_, name);
+          Report(NullValue(), hv, childSchema, DELETE, record, name);
           differed = true;
-          if (record != nullptr) Mark(record, name, sub.IsNull() ? NewRecord(SET) : std::move(sub));
-        }
-      } else if (dv.IsArray() && hv->IsArray() && cmp_.HoldsObjects(childSchema, dv, *hv)) {
-        if (CompareObjectArrays(dv, *hv, childSchema)) {
-          differed = true;
-          Mark(record, name, NewRecord(SET));
-        }
-      } else if (!cmp_.Equal(dv, *hv, childSchema)) {
-        Report(dv, *hv, childSchema, SET, record, name);
-        differed = true;
-      }
-    }
-    if (found == h.MemberCount()) return differed;
-    MemberIndex desiredIndex(d);
-    HoxConfigStore::detail::ValueComparer::Children hostChildren(cmp_, schema);
-    for (auto it = h.MemberBegin(); it != h.MemberEnd(); ++it) {
-      if (IsGeneratedId(it->name)) continue;
-      const std::string_view name = NameOf(it->name);
-      if (desiredIndex.Find(name) != nullptr) continue;
-      const Value& childSchema = hostChildren.Of(name, it->value);
-      if (cmp_.IsUnset(it->value, childSchema)) continue;
-      const PathSegment segment(path_, name);
-      Report(NullValue(), it->value, childSchema, DELETE, record, name);
-      differed = true;
-    }
+          return true;
+        });
     return differed;
   }
 
@@ -243,7 +221,7 @@ class DriftWalk {
       for (const Value& instance : side->GetArray()) {
         RAPIDJSON_ASSERT(instance.IsObject());
         if (generated) continue;
-        const Value* member = HoxConfigStore::detail::FindByName(instance, identity);
+        const Value* member = compare::FindByName(instance, identity);
         RAPIDJSON_ASSERT(member != nullptr && member->IsString());
         ids->push_back(member);
       }
@@ -323,7 +301,7 @@ class DriftWalk {
   const bool consolidated_;
   const bool driftRecords_;
   const bool perProperty_;
-  HoxConfigStore::detail::ValueComparer cmp_;
+  compare::ValueComparer cmp_;
   // The path of what is being compared, grown and shrunk as the walk descends.
   std::string path_;
   const std::string* instanceId_ = nullptr;
@@ -331,7 +309,7 @@ class DriftWalk {
 
 const Value* FindIn(const Value* object, const Value& name) {
   if (object == nullptr || !object->IsObject()) return nullptr;
-  return HoxConfigStore::detail::FindByName(*object, NameOf(name));
+  return compare::FindByName(*object, NameOf(name));
 }
 
 // Lookups in the other document: wide levels (many components, groups or
@@ -339,7 +317,7 @@ const Value* FindIn(const Value* object, const Value& name) {
 class OtherLevel {
  public:
   explicit OtherLevel(const Value* object) : object_(object) {
-    if (object != nullptr && object->IsObject() && object->MemberCount() > HoxConfigStore::detail::kWideObject) {
+    if (object != nullptr && object->IsObject() && object->MemberCount() > compare::kWideObject) {
       index_ = std::make_unique<MemberIndex>(*object);
     }
   }

@@ -81,9 +81,9 @@ class PositionIndex {
     SizeType head = kNone;
     SizeType tail = kNone;
   };
-  static std::uint64_t HashOf(std::string_view key) { return HoxConfigStore::detail::HashBytes(key); }
-  static std::uint64_t HashOf(std::uint64_t key) { return HoxConfigStore::detail::Mix(key); }
-  static bool SameKey(std::string_view a, std::string_view b) { return HoxConfigStore::detail::SameBytes(a, b); }
+  static std::uint64_t HashOf(std::string_view key) { return compare::HashBytes(key); }
+  static std::uint64_t HashOf(std::uint64_t key) { return compare::Mix(key); }
+  static bool SameKey(std::string_view a, std::string_view b) { return compare::SameBytes(a, b); }
   static bool SameKey(std::uint64_t a, std::uint64_t b) { return a == b; }
 
   // The slot holding `key`, or the empty slot where it belongs. A group

@@ -11,9 +11,9 @@ namespace HoxConfigManager {
 namespace {
 
 using HoxConfigStore::ConfigStoreDocument;
-using HoxConfigStore::detail::FindByName;
-using HoxConfigStore::detail::IsGeneratedId;
-using HoxConfigStore::detail::NameOf;
+using compare::FindByName;
+using compare::IsGeneratedId;
+using compare::NameOf;
 
 constexpr const char* kInfoAdd = "com.tarvik.settings.impact.info.add";
 constexpr const char* kInfoSet = "com.tarvik.settings.impact.info.set";

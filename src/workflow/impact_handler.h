@@ -99,7 +99,7 @@ class ImpactHandler final : public DriftHandler {
   PluginManager registry_;
   std::unordered_map<std::string, TaskMap> pluginMap_;
   std::vector<std::string> pluginOrder_;
-  HoxConfigStore::detail::ValueComparer schemas_;  // finds the schema of a member as the walk does
+  compare::ValueComparer schemas_;  // finds the schema of a member as the walk does
 
   // What the last object analysis decided, for the reasons.
   struct ObjectVerdict {

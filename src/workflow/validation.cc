@@ -22,8 +22,8 @@ namespace {
 
 using HoxConfigStore::ConfigStoreObject;
 using HoxConfigStore::ConfigStoreObjectId;
-using HoxConfigStore::detail::FindByName;
-using HoxConfigStore::detail::NameOf;
+using compare::FindByName;
+using compare::NameOf;
 using StoreObjects = std::vector<std::shared_ptr<ConfigStoreObject>>;
 using FailedSet = std::unordered_set<ConfigStoreObjectId, CsoIdHash>;
 

@@ -133,7 +133,7 @@ TEST(RedactAndSerializeValueTest, MasksMembersMatchedBySensitivePatterns) {
     "sensitive": true}, "^opt": {"type": "integer"}}})");
   EXPECT_EQ(ConfigStoreDocument::RedactAndSerializeValue(plain, Parse(R"({"secretB":"b","optX":1,"z":2})")),
             R"({"secretB":"******","optX":1,"z":2})");
-  HoxConfigStore::detail::ValueComparer comparer;
+  HoxConfigManager::compare::ValueComparer comparer;
   const Document value = Parse(R"("v")");
   EXPECT_TRUE(comparer.Child(plain, "secretB", value).HasMember("sensitive"));
   EXPECT_EQ(comparer.Child(plain, "optX", value), plain["patternProperties"]["^opt"]);

@@ -9,6 +9,7 @@ namespace HoxConfigStore {
 
 namespace {
 
+namespace compare = HoxConfigManager::compare;
 using rapidjson::Value;
 using Writer = rapidjson::Writer<rapidjson::StringBuffer>;
 
@@ -36,7 +37,7 @@ const Value* PropertySchema(const Value& schema, std::string_view name) {
   const Value* props = Member(schema, "properties");
   if (props != nullptr && props->IsObject()) {
     for (auto it = props->MemberBegin(); it != props->MemberEnd(); ++it) {
-      if (detail::NameOf(it->name) == name) return &it->value;
+      if (compare::NameOf(it->name) == name) return &it->value;
     }
   }
   return nullptr;
@@ -57,7 +58,7 @@ const Value& ChildSchema(const Value& schema, std::string_view name) {
       if (child == nullptr) child = candidate;
     }
   }
-  if (const Value* pattern = detail::PatternPropertySchema(schema, name)) {
+  if (const Value* pattern = compare::PatternPropertySchema(schema, name)) {
     if (IsSensitive(*pattern) || child == nullptr) return *pattern;
   }
   if (child != nullptr) return *child;
@@ -78,7 +79,7 @@ void WriteRedacted(const Value& value, const Value& schemaIn, Writer& writer) {
     return;
   }
   // An instance passed with its key's array schema is described by "items".
-  if (!value.IsArray() && detail::SchemaType(*schema) == "array") {
+  if (!value.IsArray() && compare::SchemaType(*schema) == "array") {
     schema = &ItemsSchema(*schema);
     if (IsSensitive(*schema)) {
       writer.String(kMask);
@@ -89,7 +90,7 @@ void WriteRedacted(const Value& value, const Value& schemaIn, Writer& writer) {
     writer.StartObject();
     for (auto it = value.MemberBegin(); it != value.MemberEnd(); ++it) {
       writer.Key(it->name.GetString(), it->name.GetStringLength());
-      WriteRedacted(it->value, ChildSchema(*schema, detail::NameOf(it->name)), writer);
+      WriteRedacted(it->value, ChildSchema(*schema, compare::NameOf(it->name)), writer);
     }
     writer.EndObject();
   } else if (value.IsArray()) {

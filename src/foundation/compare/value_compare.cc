@@ -10,7 +10,7 @@
 
 #include "foundation/regex_limits.h"
 
-namespace HoxConfigStore::detail {
+namespace HoxConfigManager::compare {
 
 namespace {
 
@@ -301,38 +301,13 @@ bool ValueComparer::Same(const Value& d, const Value& h, const Value& schema) {
 }
 
 bool ValueComparer::EqualObjects(const Value& d, const Value& h, const Value& schema) {
-  MemberIndex hostIndex(h);
-  Children children(*this, schema);
-  SizeType found = 0;
-  for (auto it = d.MemberBegin(); it != d.MemberEnd(); ++it) {
-    const std::string_view name = NameOf(it->name);
-    const Value* hv = hostIndex.Find(name);
-    // Counted even when not compared, so that equal members on both sides
-    // spare the search for members only the host holds.
-    if (IsGeneratedId(it->name)) {
-      found += hv != nullptr;
-      continue;
-    }
-    if (hv != nullptr) {
-      ++found;
-      // Equal scalars need no schema.
-      if (!IsContainer(it->value) && !IsContainer(*hv) && SameScalar(it->value, *hv)) continue;
-      if (!Equal(it->value, *hv, children.Of(name, it->value))) return false;
-    } else if (!IsUnset(it->value, children.Of(name, it->value))) {
-      return false;
-    }
-  }
-  if (found == h.MemberCount()) return true;
-  // Members only the host holds must be unset.
-  MemberIndex desiredIndex(d);
-  Children hostChildren(*this, schema);
-  for (auto it = h.MemberBegin(); it != h.MemberEnd(); ++it) {
-    if (IsGeneratedId(it->name)) continue;
-    const std::string_view name = NameOf(it->name);
-    if (desiredIndex.Find(name) != nullptr) continue;
-    if (!IsUnset(it->value, hostChildren.Of(name, it->value))) return false;
-  }
-  return true;
+  return Members(
+      d, h, schema,
+      [this](std::string_view, const Value& dv, const Value* hv, const Value& memberSchema) {
+        return hv != nullptr ? Equal(dv, *hv, memberSchema) : IsUnset(dv, memberSchema);
+      },
+      // A set member only the host holds is a difference.
+      [](std::string_view, const Value&, const Value&) { return false; });
 }
 
 bool ValueComparer::EqualObjectArrays(const Value& d, const Value& h, const Value& schema) {
@@ -431,23 +406,23 @@ bool EqualPrimitiveArrays(const Value& a, const Value& b) {
   return true;
 }
 
-}  // namespace HoxConfigStore::detail
+}  // namespace HoxConfigManager::compare
 
 namespace HoxConfigStore {
 
 bool ConfigStoreDocument::IsEqualValue(const rapidjson::Value& desired, const rapidjson::Value& host,
                                        const rapidjson::Value& schema) {
-  detail::ValueComparer comparer;
+  HoxConfigManager::compare::ValueComparer comparer;
   return comparer.Equal(desired, host, schema);
 }
 
 std::size_t ConfigStoreDocument::HashValue(const rapidjson::Value& value, const rapidjson::Value& schema) {
-  detail::ValueComparer comparer;
+  HoxConfigManager::compare::ValueComparer comparer;
   return comparer.Hash(value, schema);
 }
 
 bool ConfigStoreDocument::IsEqualPrimitiveArray(const rapidjson::Value& a, const rapidjson::Value& b) {
-  return detail::EqualPrimitiveArrays(a, b);
+  return HoxConfigManager::compare::EqualPrimitiveArrays(a, b);
 }
 
 }  // namespace HoxConfigStore

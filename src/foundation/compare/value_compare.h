@@ -1,5 +1,8 @@
-// Schema-aware comparison and hashing of configuration values, shared by the
-// configuration store's static helpers and the drift walk.
+// Schema-aware comparison and hashing of configuration values: the one rule
+// of equality, used by the configuration store's static helpers
+// (ConfigStoreDocument::IsEqualValue, HashValue) and by the drift walk, which
+// reports differences through the same member pass (Members) that equality
+// uses. The names here are the module's interface to the walk.
 //
 // Two values are equal when they agree after "unset" members are dropped: a
 // member is unset when it is absent, null, the empty string, an object whose
@@ -26,7 +29,7 @@
 #include <hoxcm/documents.h>
 #include <hoxcm/json.h>
 
-namespace HoxConfigStore::detail {
+namespace HoxConfigManager::compare {
 
 // Objects with more members than this are searched through a hash index.
 constexpr rapidjson::SizeType kWideObject = 16;
@@ -46,7 +49,7 @@ inline bool SameBytes(std::string_view a, std::string_view b) {
   return true;
 }
 inline bool IsGeneratedId(const rapidjson::Value& name) {
-  return NameOf(name) == HoxConfigManager::DocumentShape::kGeneratedId;
+  return NameOf(name) == DocumentShape::kGeneratedId;
 }
 
 inline std::uint64_t Mix(std::uint64_t x) {
@@ -170,6 +173,20 @@ class ValueComparer {
     std::optional<MemberIndex> narrow_;
     MemberIndex* wide_ = nullptr;
   };
+  // The member pass of two objects, the one place that decides which members
+  // of `d` (desired) and `h` (host) are compared, and under which schema:
+  // - every member of `d`, in its order, that `h` lacks or holds with
+  //   another value (equal scalars are passed over):
+  //     onPair(name, desired value, host value or null, member schema);
+  // - then, unless `h` has no member that `d` lacks, every member only `h`
+  //   holds whose value is set, in host order:
+  //     onHostOnly(name, host value, member schema).
+  // "cs_generated_id" is passed over on both sides. A callback that returns
+  // false ends the pass, which then returns false; otherwise true.
+  template <typename OnPair, typename OnHostOnly>
+  bool Members(const rapidjson::Value& d, const rapidjson::Value& h, const rapidjson::Value& schema,
+               OnPair&& onPair, OnHostOnly&& onHostOnly);
+
   // The element schema of an array schema; SchemaForValue(element) otherwise.
   const rapidjson::Value& Items(const rapidjson::Value& schema, const rapidjson::Value& element);
   // True when arrays under `schema` hold objects (by schema, else by content).
@@ -216,4 +233,40 @@ inline bool IsContainer(const rapidjson::Value& v) { return v.IsObject() || v.Is
 // matches at most one element of `a`, by JSON type, then value.
 bool EqualPrimitiveArrays(const rapidjson::Value& a, const rapidjson::Value& b);
 
-}  // namespace HoxConfigStore::detail
+template <typename OnPair, typename OnHostOnly>
+bool ValueComparer::Members(const rapidjson::Value& d, const rapidjson::Value& h, const rapidjson::Value& schema,
+                            OnPair&& onPair, OnHostOnly&& onHostOnly) {
+  MemberIndex hostIndex(h);
+  Children children(*this, schema);
+  rapidjson::SizeType found = 0;
+  for (auto it = d.MemberBegin(); it != d.MemberEnd(); ++it) {
+    const std::string_view name = NameOf(it->name);
+    const rapidjson::Value* hv = hostIndex.Find(name);
+    // Counted even when not compared, so that equal members on both sides
+    // spare the search for members only the host holds.
+    if (IsGeneratedId(it->name)) {
+      found += hv != nullptr;
+      continue;
+    }
+    if (hv != nullptr) {
+      ++found;
+      // The common case, an unchanged scalar, needs no schema.
+      if (!IsContainer(it->value) && !IsContainer(*hv) && SameScalar(it->value, *hv)) continue;
+    }
+    if (!onPair(name, it->value, hv, children.Of(name, it->value))) return false;
+  }
+  if (found == h.MemberCount()) return true;
+  MemberIndex desiredIndex(d);
+  Children hostChildren(*this, schema);
+  for (auto it = h.MemberBegin(); it != h.MemberEnd(); ++it) {
+    if (IsGeneratedId(it->name)) continue;
+    const std::string_view name = NameOf(it->name);
+    if (desiredIndex.Find(name) != nullptr) continue;
+    const rapidjson::Value& memberSchema = hostChildren.Of(name, it->value);
+    if (IsUnset(it->value, memberSchema)) continue;
+    if (!onHostOnly(name, it->value, memberSchema)) return false;
+  }
+  return true;
+}
+
+}  // namespace HoxConfigManager::compare
