@@ -22,6 +22,12 @@ class FileDescriptor {
     fd_ = -1;
     return rc;
   }
+  // Gives the descriptor up without closing it (to a new owner).
+  int Release() {
+    const int fd = fd_;
+    fd_ = -1;
+    return fd;
+  }
 
  private:
   int fd_;

@@ -51,6 +51,10 @@ PluginRunner& PluginRunner::Default() {
 
 HoxPlatform::HostRunLock LaunchingRunner::LockHost() { return HoxPlatform::HostRunLock(RunLockPath()); }
 
+std::unique_ptr<HoxPlatform::HostRunLock> LaunchingRunner::LockHost(const HoxPlatform::HostRunLock::Waiting& waiting) {
+  return HoxPlatform::HostRunLock::Acquire(RunLockPath(), waiting);
+}
+
 // Everything a run does with the fixed files, under the host-wide lock so
 // that runs of different processes never interleave.
 template <typename Result, typename Reader>

@@ -57,6 +57,9 @@ class LaunchingRunner final : public PluginRunner {
 
   // The host run lock that serialises every plugin run on the host.
   static HoxPlatform::HostRunLock LockHost();
+  // The same for a caller that says when it must wait and may stop waiting
+  // (HostRunLock::Acquire): null when it gave up.
+  static std::unique_ptr<HoxPlatform::HostRunLock> LockHost(const HoxPlatform::HostRunLock::Waiting& waiting);
 
   ErrorInfo Apply(const Plugin& plugin, const std::vector<DesiredConfigInput>& inputs,
                   const std::string& clusterContext, std::shared_ptr<PluginMonitor> monitor) override;

@@ -56,7 +56,12 @@ ChildProcess ChildProcess::Spawn(const std::string& program, const std::vector<s
   sigfillset(&all);
   posix_spawnattr_setsigmask(&attributes.attributes, &empty);
   posix_spawnattr_setsigdefault(&attributes.attributes, &all);
-  posix_spawnattr_setflags(&attributes.attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
+  // The child leads a process group of its own: a Ctrl-C at the caller's
+  // terminal reaches the caller, which stops the run through its abort (and
+  // the watcher's SIGTERM), not the runner in the middle of a change.
+  posix_spawnattr_setpgroup(&attributes.attributes, 0);
+  posix_spawnattr_setflags(&attributes.attributes,
+                           POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETPGROUP);
 
   std::vector<char*> args;
   args.reserve(argv.size() + 1);

@@ -4,9 +4,11 @@
 #include <fcntl.h>
 #include <sys/file.h>
 
+#include <chrono>
 #include <cstring>
 #include <filesystem>
 #include <system_error>
+#include <thread>
 
 namespace HoxPlatform {
 namespace {
@@ -23,6 +25,10 @@ int OpenLockFile(const std::string& path) {
   return fd;
 }
 
+// How often a waiting caller is asked whether it still wants the lock: flock
+// has no timeout, so the wait is a series of attempts.
+constexpr std::chrono::milliseconds kWaitPoll{100};
+
 }  // namespace
 
 std::string ErrorText(int error) {
@@ -35,6 +41,26 @@ HostRunLock::HostRunLock(const std::string& path) : fd_(OpenLockFile(path)) {
   // Retried: a signal may interrupt the wait for another run.
   while (::flock(fd_.get(), LOCK_EX) != 0) {
     if (errno != EINTR) ThrowErrno(errno, "cannot lock " + path);
+  }
+}
+
+std::unique_ptr<HostRunLock> HostRunLock::Acquire(const std::string& path, const Waiting& waiting) {
+  FileDescriptor fd(OpenLockFile(path));
+  for (bool told = false;;) {
+    if (::flock(fd.get(), LOCK_EX | LOCK_NB) == 0) {
+      std::unique_ptr<HostRunLock> lock(new HostRunLock(Locked{}, fd.get()));
+      // The lock owns the descriptor now.
+      (void)fd.Release();
+      return lock;
+    }
+    if (errno == EINTR) continue;  // a signal interrupted the attempt
+    if (errno != EWOULDBLOCK) ThrowErrno(errno, "cannot lock " + path);
+    if (!told) {
+      told = true;
+      if (waiting.started) waiting.started();
+    }
+    if (waiting.giveUp && waiting.giveUp()) return nullptr;
+    std::this_thread::sleep_for(kWaitPoll);
   }
 }
 

@@ -5,6 +5,8 @@
 // HostRunLock object is owned by one thread.
 #pragma once
 
+#include <functional>
+#include <memory>
 #include <string>
 
 #include "platform/file_descriptor.h"
@@ -31,7 +33,19 @@ class HostRunLock final {
   HostRunLock(const HostRunLock&) = delete;
   HostRunLock& operator=(const HostRunLock&) = delete;
 
+  // What a caller does while another holder keeps the lock.
+  struct Waiting {
+    std::function<void()> started;  // called once, when the lock is first found held
+    std::function<bool()> giveUp;   // asked about every 100 ms while waiting; true ends the wait
+  };
+  // Takes the lock like the constructor, but tells `waiting` when it must
+  // wait and lets it end the wait: null when `giveUp` answered true first.
+  static std::unique_ptr<HostRunLock> Acquire(const std::string& path, const Waiting& waiting);
+
  private:
+  struct Locked {};
+  HostRunLock(Locked, int fd) : fd_(fd) {}
+
   // Closing the descriptor releases the lock.
   const FileDescriptor fd_;
 };
