@@ -1,8 +1,8 @@
 // The configuration store: an SQLite database under the host root
 // (<root>/var/lib/tarvik/configstore/configstore.db) holding the user, default,
 // desired and SmartNIC configuration of the host, the global namespace
-// objects, boot mode, the boot-apply record, boot-time restore failures and
-// the maintenance-mode state. docs/platform.md describes tables and semantics.
+// objects, boot mode, the boot-apply record, boot-time restore failures,
+// the maintenance-mode state and the apply history. docs/platform.md describes tables and semantics.
 //
 // Thread safety: a DBStore connection serialises its own use with a mutex, so
 // it may be shared between threads. Every writer is atomic: it runs in its own
@@ -158,6 +158,19 @@ HOXCM_API void ClearBootTimeRestoreFailures();
 
 HOXCM_API bool GetMaintenanceMode();
 HOXCM_API void SetMaintenanceMode(bool enabled);
+
+// The apply history: one record (JSON text, written and read by the
+// workflow) per apply or boot-time run, numbered by a sequence that only
+// grows, even after the oldest records are dropped.
+struct HOXCM_API ApplyHistoryRow {
+  int64_t sequence = 0;
+  std::string record;
+};
+// Appends `record` and drops the oldest rows beyond the `keep` newest (at
+// least the new one is kept), in one transaction. Returns its sequence.
+HOXCM_API int64_t AppendApplyHistoryRow(const std::string& record, std::size_t keep);
+// Every row, oldest first.
+HOXCM_API std::vector<ApplyHistoryRow> GetApplyHistoryRows();
 
 // A fresh instance identifier for "cs_generated_id" keys (a random UUID).
 HOXCM_API std::string GenerateInstanceId();

@@ -7,6 +7,7 @@
 #include <limits>
 #include <thread>
 
+#include "platform/store/database.h"
 #include "platform_store/store_fixture.h"
 
 namespace hoxcm_test {
@@ -20,7 +21,7 @@ TEST_F(StoreTest, MissingStoreIsCreatedPrivatelyInWalModeUnlessCreationIsRefused
 
   EXPECT_EQ(GetDBStore()->GetPath(), StorePath());
   EXPECT_EQ(StoreSql("SELECT version FROM schema_version; PRAGMA journal_mode"),
-            (std::vector<std::string>{"1|", "wal|"}));
+            (std::vector<std::string>{std::to_string(detail::kSchemaVersion) + "|", "wal|"}));
   // The store holds sensitive values in clear: nobody else may read it.
   SetBootMode(BOOTMODE_NORMAL);
   for (const char* suffix : {"", "-wal"}) {
@@ -39,7 +40,7 @@ TEST_F(StoreTest, CorruptForeignOrNewerStoresAreRefusedAndLeftUntouched) {
       {std::string(8192, '\xa5'), "", "not a readable"},
       {header, "", "not a readable"},
       {"", "DROP TABLE schema_version; CREATE TABLE other (x)", "not a configuration store"},
-      {"", "UPDATE schema_version SET version = 2", "newer"},
+      {"", "UPDATE schema_version SET version = " + std::to_string(detail::kSchemaVersion + 1), "newer"},
       // Damaged version rows: never taken as a step of the migration.
       {"", "UPDATE schema_version SET version = -3", "layout version \"-3\" is not valid"},
       {"", "UPDATE schema_version SET version = 0", "layout version \"0\" is not valid"},
@@ -68,6 +69,28 @@ TEST_F(StoreTest, CorruptForeignOrNewerStoresAreRefusedAndLeftUntouched) {
     EXPECT_TRUE(root.ReadFile(kStoreHostPath) == before) << "the refused file was changed";
     EXPECT_EQ(ConfigStore::GetStore(sGlobalNamespace), nullptr);
   }
+}
+
+TEST_F(StoreTest, AnOlderStoreIsMigratedKeepingItsContentsAndGainsABoundedApplyHistory) {
+  // Given a store of the first layout, with configuration in it.
+  const pid_t child = fork();
+  if (child == 0) {
+    ApplyUserConfigChanges({{"SET", {"system", "identity", "hostname"}, R"({"hostname":"a"})"}});
+    _exit(0);
+  }
+  ExitCodeOf(child);
+  StoreSql("DROP TABLE apply_history; UPDATE schema_version SET version = 1");
+  const auto before = StoreSql("SELECT component, name, value FROM config_item");
+
+  EXPECT_EQ(AppendApplyHistoryRow("r1", 2), 1);
+  EXPECT_EQ(StoreSql("SELECT version FROM schema_version"),
+            std::vector<std::string>{std::to_string(detail::kSchemaVersion) + "|"});
+  EXPECT_EQ(StoreSql("SELECT component, name, value FROM config_item"), before);
+  // Sequences keep growing after the oldest rows are dropped.
+  for (const char* record : {"r2", "r3"}) AppendApplyHistoryRow(record, 2);
+  std::vector<std::string> rows;
+  for (const ApplyHistoryRow& row : GetApplyHistoryRows()) rows.push_back(std::to_string(row.sequence) + row.record);
+  EXPECT_EQ(rows, (std::vector<std::string>{"2r2", "3r3"}));
 }
 
 TEST_F(StoreTest, TransactionCommitsOnlyWhenCommittedAndOthersWaitOrSeeNothingUntilThen) {

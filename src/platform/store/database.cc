@@ -60,6 +60,15 @@ CREATE TABLE restore_failure (
   name TEXT NOT NULL
 );
 )sql",
+    // 1 -> 2: the apply history, one JSON record per apply or boot-time
+    // run; AUTOINCREMENT, so that a sequence is never reused once the
+    // oldest records are dropped.
+    R"sql(
+CREATE TABLE apply_history (
+  seq INTEGER PRIMARY KEY AUTOINCREMENT,
+  record TEXT NOT NULL
+);
+)sql",
 };
 static_assert(sizeof(kMigrations) / sizeof(kMigrations[0]) == kSchemaVersion);
 

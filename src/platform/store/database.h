@@ -25,7 +25,7 @@ namespace HoxConfigStore::detail {
 
 // The layout version this build creates and understands; a store with a
 // higher version is refused.
-constexpr int kSchemaVersion = 1;
+constexpr int kSchemaVersion = 2;
 // How long a statement waits for another process's write lock.
 constexpr int kBusyTimeoutMs = 15000;
 
