@@ -9,6 +9,9 @@
 // impact plugins' verdicts; on request it also says why, object by object.
 // Validate (docs/validation.md) checks a desired document against the host
 // document schema and through the validation plugins.
+// CheckApply and Apply (docs/apply.md) change the host in two steps: a
+// verdict first, then the change, refused when the verdict no longer holds;
+// every Apply leaves a record in the apply history.
 //
 // Every operation runs on the caller's thread and blocks while its plugins
 // run, one after another. Results are plain values owned by the caller.
@@ -158,5 +161,146 @@ struct HOXCM_API ValidationResult {
 HOXCM_API void Validate(const Document& desiredDocument, const Document& schemaDocument, const std::string& taskId,
                         ValidationResult& result, bool checkSchema,
                         std::shared_ptr<TaskHandle> taskHandle = TaskHandle::Dummy());
+
+// ---- Check-apply and apply ------------------------------------------------
+
+enum QUICK_BOOT_STATUS : int32_t {
+  QUICK_BOOT_NOT_SUPPORTED = 0,
+  QUICK_BOOT_SUPPORTED = 1,
+  QUICK_BOOT_STM_SUPPORTED = 2,
+};
+
+// A verdict frozen with a private copy of its document. Made by CheckApply
+// and never changed afterwards: Apply only reads it (so one result may be
+// applied again; every Apply recomputes the verdict), and it may be shared
+// between threads.
+class HOXCM_API CheckApplyResult {
+ public:
+  // Fills the fields in order; `document` is deep-copied.
+  CheckApplyResult(IMPACT_TYPE impact, const Document& document, QUICK_BOOT_STATUS quickBootStatus,
+                   const std::string& operationContext);
+  CheckApplyResult(const CheckApplyResult&) = delete;
+  CheckApplyResult& operator=(const CheckApplyResult&) = delete;
+
+  const IMPACT_TYPE impact;
+  const Document document;
+  const std::string checkApplyId;  // when it was made: seconds since the epoch, in decimal
+  const QUICK_BOOT_STATUS quickBootStatus;
+  const std::string operationContext;  // handed to Impact and to every plugin run
+};
+
+enum ApplyStatus : int32_t {
+  APPLY_COMPLETED = 0,  // also: nothing had to be done, or a plugin failed (see errorInfo)
+  APPLY_PENDING_REBOOT = 1,
+  APPLY_COMPLETED_IN_MAINTENANCE_MODE = 2,
+};
+
+struct HOXCM_API ApplyResult {
+  ApplyStatus status = APPLY_COMPLETED;
+  // Empty on success; a plugin's failure, an abort
+  // ("com.tarvik.hox.settings.apply.plugin.aborted") or the recomputed
+  // impact's error.
+  ErrorInfo errorInfo;
+};
+
+// Posted (PluginInfo, no arguments) when CheckApply or Apply finds the host
+// taken by another apply and waits for it; an abort of the task ends the
+// wait.
+inline constexpr const char* kApplyWaitingForHost = "com.tarvik.hox.settings.apply.waiting";
+
+// Whether the host complies with `desired` and, if not, what applying it
+// costs: null when it complies, otherwise a result to hand to Apply. The
+// impact plugins run on `taskHandle`; with `reasons`, it also says why (see
+// ImpactReasons). Holds the host run lock while it judges, so that no other
+// apply changes the host under the verdict (it waits, see
+// kApplyWaitingForHost). Throws the impact's ErrorInfo itself when a plugin
+// failed or the task was aborted, and what Impact throws.
+HOXCM_API std::shared_ptr<CheckApplyResult> CheckApply(Document& desired, const std::string& operationContext,
+                                                       std::shared_ptr<TaskHandle> taskHandle,
+                                                       ImpactReasons* reasons = nullptr);
+
+// Applies a CheckApply result: recomputes the verdict, then stages a
+// reboot-requiring document for the next boot, or runs the plugins that own
+// the drift in their dependency order, stopping at the first failure (what
+// earlier plugins applied stays applied and recorded in the store). Holds the
+// host run lock from the recomputation to the last plugin run. Throws
+// ConfigManagerException 2024 for a null result, InvalidImpact 2025 when the
+// verdict changed to anything but "no impact", HostNotInMM 2026 when
+// maintenance mode is required and not entered. Appends one record to the
+// apply history whatever happens.
+HOXCM_API ApplyResult Apply(const std::shared_ptr<CheckApplyResult>& checkResult,
+                            std::shared_ptr<TaskHandle> taskHandle);
+
+// What Apply would run for `desired` against the host as it is now: the
+// plugin runs in order, the ones no dependency entry names (which never
+// run), and the changes no plugin owns. Nothing is changed and no plugin
+// process runs.
+struct HOXCM_API PlannedRun {
+  std::string key;  // action word and plugin id: "REMEDIATE:network"
+  std::string pluginId;
+  std::vector<DesiredConfigInput> inputs;
+};
+struct HOXCM_API ApplyPlan {
+  std::vector<PlannedRun> runs;
+  std::vector<PlannedRun> neverRun;
+  std::vector<DesiredConfigInput> unowned;
+};
+HOXCM_API ApplyPlan PlanApply(Document& desired);
+
+// ---- Apply history ---------------------------------------------------------
+
+// The history keeps the newest kApplyHistoryLimit records; each keeps at
+// most kApplyHistoryListLimit statements and objects with reasons.
+inline constexpr std::size_t kApplyHistoryLimit = 500;
+inline constexpr std::size_t kApplyHistoryListLimit = 100;
+
+// One plugin run of a recorded operation.
+struct HOXCM_API ApplyHistoryRun {
+  std::string key;
+  std::string pluginId;
+  std::size_t inputs = 0;  // objects handed to the plugin
+  ErrorInfo outcome;       // empty id: success
+  double seconds = 0;      // wall time
+};
+
+// What one apply (or boot-time run) did. Holds no configuration value: the
+// document is named by its digest, and the reasons' values are masked as
+// Impact masks them (and cut to 256 bytes).
+struct HOXCM_API ApplyHistoryRecord {
+  int64_t sequence = 0;  // given by the history; grows with every record
+  std::string kind;      // "apply" or "boot"
+  int64_t startedAt = 0;  // seconds since the epoch
+  double seconds = 0;     // wall time of the whole operation
+  std::string document;   // DocumentDigest of the applied document; empty without one
+  // The verdict it went by (Apply: its recomputation), when one was reached.
+  bool judged = false;
+  bool compliant = false;
+  IMPACT_TYPE impact = IMPACT_NONE;
+  std::vector<ImpactInfo> statements;
+  std::vector<ObjectImpact> reasons;
+  std::size_t statementsOmitted = 0;  // beyond kApplyHistoryListLimit
+  std::size_t reasonsOmitted = 0;
+  std::vector<ApplyHistoryRun> runs;  // in the order they ran
+  // "applied", "nothing to do", "staged" (for the next boot), "failed",
+  // "aborted", "refused" (2024, 2025, 2026), "error" (another exception);
+  // "unreadable" for a damaged record.
+  std::string outcome;
+  ApplyStatus status = APPLY_COMPLETED;
+  ErrorInfo error;       // the returned error: plugin failure, abort, impact error
+  int errorCode = 0;     // the exception's code when the operation threw (-1: an exception without one)
+  std::string errorText;  // and its text
+};
+
+// "sha256:" and the 64 hexadecimal digits of the SHA-256 of `document`'s
+// compact JSON.
+HOXCM_API std::string DocumentDigest(const Value& document);
+// Appends `record` (its sequence is ignored) and drops the oldest records
+// beyond kApplyHistoryLimit. Returns the record's sequence.
+HOXCM_API int64_t AppendApplyHistory(const ApplyHistoryRecord& record);
+// Every record, oldest first. A damaged record reads as outcome "unreadable".
+HOXCM_API std::vector<ApplyHistoryRecord> GetApplyHistory();
+// The record as JSON, the shape the history stores and `hoxcfg history
+// --json` prints (docs/apply-history.md).
+HOXCM_API void ApplyHistoryRecordToJson(const ApplyHistoryRecord& record, Document& out);
 
 }  // namespace HoxConfigManager

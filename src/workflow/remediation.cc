@@ -51,17 +51,22 @@ RemediationOutcome RunRemediation(const RemediationPlan& plan, PluginRunner& run
   return outcome;
 }
 
-ErrorInfo RemediateHost(Document& desired, std::string operationContext, std::shared_ptr<TaskHandle> task,
-                        bool boot, PluginRunner& runner) {
+RemediationOutcome RemediateHostRuns(Document& desired, std::string operationContext,
+                                     std::shared_ptr<TaskHandle> task, bool boot, PluginRunner& runner) {
   CSLogger::Log(CSLogger::kDetail, "Remediating HOXi host to desired configuration (boot=%d).", boot ? 1 : 0);
   const std::vector<DesiredConfigInput> tasks = boot ? GenerateBootTimeTasks(desired) : GenerateApplyTasks(desired);
   if (tasks.empty()) {
     CSLogger::Log(CSLogger::kWarning, "No tasks generated for the desired configuration.");
-    return ErrorInfo();
+    return {};
   }
   PluginManager registry(APPLY);
   const RemediationPlan plan = PlanRemediation(tasks, RegistryOwners(registry), registry.GetDependencies(), boot);
-  return RunRemediation(plan, runner, operationContext, std::move(task)).error;
+  return RunRemediation(plan, runner, operationContext, std::move(task));
+}
+
+ErrorInfo RemediateHost(Document& desired, std::string operationContext, std::shared_ptr<TaskHandle> task,
+                        bool boot, PluginRunner& runner) {
+  return RemediateHostRuns(desired, std::move(operationContext), std::move(task), boot, runner).error;
 }
 
 }  // namespace HoxConfigManager

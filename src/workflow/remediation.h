@@ -57,5 +57,9 @@ RemediationOutcome RunRemediation(const RemediationPlan& plan, PluginRunner& run
 // registry that cannot be ordered) are thrown.
 ErrorInfo RemediateHost(Document& desired, std::string operationContext, std::shared_ptr<TaskHandle> task,
                         bool boot, PluginRunner& runner = PluginRunner::Default());
+// RemediateHost with every run it made: what Apply and boot-time apply
+// record in the apply history.
+RemediationOutcome RemediateHostRuns(Document& desired, std::string operationContext,
+                                     std::shared_ptr<TaskHandle> task, bool boot, PluginRunner& runner);
 
 }  // namespace HoxConfigManager

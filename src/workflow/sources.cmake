@@ -1,5 +1,7 @@
 # The workflow operations built on the drift engine and the plugin framework.
 list(APPEND HOXCM_SOURCES
+  src/workflow/apply.cc
+  src/workflow/apply_history.cc
   src/workflow/impact.cc
   src/workflow/impact_handler.cc
   src/workflow/remediation.cc

@@ -73,11 +73,14 @@ class FakePluginRunner final : public HoxConfigManager::PluginRunner {
 };
 
 // Events in order: "progress <value>", "info|error <message id> <args...>".
-class RecordingTask final : public HoxConfigManager::TaskHandle {
+// Its child tasks are itself: their events and abort are the task's.
+class RecordingTask final : public HoxConfigManager::TaskHandle,
+                            public std::enable_shared_from_this<RecordingTask> {
  public:
   std::atomic<bool> aborted{false};
 
   bool IsAborted() override { return aborted; }
+  std::shared_ptr<TaskHandle> ChildTask(int) override { return shared_from_this(); }
   void UpdateProgress(float percent) override { Add("progress " + std::to_string(percent)); }
   std::shared_ptr<Notifications> AddNotification() override { return std::make_shared<Recorder>(this); }
   std::string GetTaskId() const override { return "task-1"; }
