@@ -114,6 +114,13 @@ struct HOXCM_API ImpactReasons {
   std::vector<ObjectImpact> objects;
 };
 
+// The reasons as JSON, for reports and records (docs/impact.md): an array
+// with one object per ObjectImpact, {"component", "group", "key",
+// "instance", "action", "impact", "reasons": [{"rule": "property" |
+// "operation" | "plugin", "impact", then "path", "oldValue", "newValue" or
+// "plugin", "reason"}]}. Values are allocated from `allocator`.
+HOXCM_API void ImpactReasonsToJson(const ImpactReasons& reasons, Value& out, Allocator& allocator);
+
 // Computes the impact of applying `desiredDocument` (a document, or one
 // wrapped as {"profile": ...}) to the host, into `result`:
 //   - the drift walk against `currentDocument` (taken over) or, without it,

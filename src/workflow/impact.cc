@@ -67,6 +67,41 @@ std::size_t ImpactInfoHash::operator()(const ImpactInfo& info) const {
   return h;
 }
 
+void ImpactReasonsToJson(const ImpactReasons& reasons, Value& out, Allocator& allocator) {
+  out.SetArray();
+  auto text = [&allocator](const std::string& s) { return Value(s, allocator); };
+  for (const ObjectImpact& object : reasons.objects) {
+    Value entry(rapidjson::kObjectType), list(rapidjson::kArrayType);
+    entry.AddMember("component", text(object.id.component), allocator);
+    entry.AddMember("group", text(object.id.group), allocator);
+    entry.AddMember("key", text(object.id.key), allocator);
+    entry.AddMember("instance", text(object.id.instanceId), allocator);
+    entry.AddMember("action", text(object.action), allocator);
+    entry.AddMember("impact", static_cast<int>(object.impact), allocator);
+    for (const ImpactReason& r : object.reasons) {
+      Value reason(rapidjson::kObjectType);
+      const bool plugin = r.rule == ImpactReason::Rule::kPlugin;
+      reason.AddMember("rule",
+                       rapidjson::StringRef(plugin ? "plugin"
+                                            : r.rule == ImpactReason::Rule::kPropertyTrigger ? "property"
+                                                                                              : "operation"),
+                       allocator);
+      reason.AddMember("impact", static_cast<int>(r.impact), allocator);
+      if (plugin) {
+        reason.AddMember("plugin", text(r.plugin), allocator);
+        reason.AddMember("reason", text(r.reason), allocator);
+      } else {
+        reason.AddMember("path", text(r.path), allocator);
+        reason.AddMember("oldValue", text(r.oldValue), allocator);
+        reason.AddMember("newValue", text(r.newValue), allocator);
+      }
+      list.PushBack(reason, allocator);
+    }
+    entry.AddMember("reasons", list, allocator);
+    out.PushBack(entry, allocator);
+  }
+}
+
 void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& result,
             std::shared_ptr<TaskHandle> taskHandle, std::optional<Document> currentDocument, ImpactReasons* reasons) {
   Impact(desiredDocument, taskId, result, std::move(taskHandle), std::move(currentDocument), reasons,

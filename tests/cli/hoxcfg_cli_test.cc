@@ -277,5 +277,43 @@ TEST_F(HoxcfgCliTest, LibraryLogIsQuietUnlessAskedAndRunnersExplainThemselves) {
   }
 }
 
+TEST_F(HoxcfgCliTest, ValidateAndImpactAnswerWithExitStatusFindingsAndReasons) {
+  // Given the sample host's export with its boot options changed, a rule
+  // added and a vNIC's MTU below its minimum.
+  InitSample();
+  const std::string same = root_.Path("/same.json"), changed = root_.Path("/changed.json");
+  ASSERT_EQ(Run("export -o " + same).exitCode, 0);
+  std::string text = root_.ReadFile("/same.json");
+  const auto replace = [&text](const std::string& from, const std::string& to) {
+    text.replace(text.find(from), from.size(), to);
+  };
+  replace(R"("hugepages": 2048)", R"("hugepages": 4096)");
+  replace(R"("rules": [)", R"("rules": [{"name": "web", "action": "allow", "protocol": "tcp"},)");
+  replace(R"("mtu": 1500)", R"("mtu": 100)");
+  root_.WriteFile("/changed.json", text);
+
+  EXPECT_EQ(Run("impact " + same).exitCode, 0);
+  EXPECT_EQ(Run("validate " + same).out, same + ": valid\n");
+  const HoxcfgOutcome impact = Run("impact " + changed);
+  EXPECT_EQ(impact.exitCode, 1);
+  EXPECT_EQ(impact.err, "");  // no progress without a terminal
+  for (const char* line : {"needs a reboot\n", "  /system/kernel/boot_options (SET): needs a reboot\n",
+                           "/system/kernel/boot_options/hugepages: 2048 -> 4096", "plugin network: firewall rules"}) {
+    EXPECT_NE(impact.out.find(line), std::string::npos) << line << impact.out;
+  }
+  HoxConfigManager::Document json;
+  HoxConfigManager::ParseDocument(Run("--json impact " + changed).out, json);
+  EXPECT_EQ(json["impact"].GetInt(), 2);
+  EXPECT_EQ(json["reasons"].Size(), 3u);  // the boot options, the rule, the vNIC
+  const HoxcfgOutcome terminal = RunHoxcfgOnTerminal(root_, "impact " + changed);
+  EXPECT_NE(terminal.out.find("hoxcfg: impact: plugin network started"), std::string::npos) << terminal.out;
+
+  const HoxcfgOutcome invalid = Run("validate " + changed);
+  EXPECT_EQ(invalid.exitCode, 1);
+  EXPECT_EQ(invalid.out, changed + ": /network/interfaces/vnic[vnic0]/mtu: must be at least 1280 "
+                                   "[com.tarvik.hox.settings.validation.minimum: mtu, 1280]\n");
+  EXPECT_EQ(Run("validate --no-schema " + changed).exitCode, 0);
+}
+
 }  // namespace
 }  // namespace hoxcm_test

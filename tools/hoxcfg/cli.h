@@ -222,6 +222,12 @@ std::string ReportPathToItemName(const std::string& path, const rapidjson::Value
 rapidjson::Document ReadJsonArgument(const std::string& path);
 // A configuration document: a JSON object that is not a JSON schema.
 rapidjson::Document ReadConfigurationDocument(const std::string& path);
+// A desired document as it applies to this host: a configuration document
+// whose host-specific sections (as an export writes them) are reduced to
+// this host's.
+rapidjson::Document ReadDesiredDocument(const std::string& path);
+// The help of a command's desired-document argument.
+extern const char* const kDocumentFileHelp;
 // Runs `work` on the document read from `path`: a library error about the
 // document that names no file (a wrong type somewhere in it, a document
 // path) is reported in that file.

@@ -10,6 +10,7 @@
 #include <hoxcm/documents.h>
 #include <hoxcm/errors.h>
 #include <hoxcm/files.h>
+#include <hoxcm/host_documents.h>
 
 #include "hoxcfg/cli.h"
 
@@ -95,6 +96,15 @@ rapidjson::Document ReadConfigurationDocument(const std::string& path) {
     throw Failure("this is a JSON schema, not a configuration document",
                   "check a document against it with `hoxcfg schema-check SCHEMA DOCUMENT`", kExitUsage, InFile(path));
   }
+  return doc;
+}
+
+const char* const kDocumentFileHelp = "Desired configuration document ('-': standard input)";
+
+rapidjson::Document ReadDesiredDocument(const std::string& path) {
+  rapidjson::Document file = ReadConfigurationDocument(path);
+  rapidjson::Document doc;
+  InDocument(path, [&] { HoxConfigManager::CreateMergedDocument(std::move(file), doc); });
   return doc;
 }
 

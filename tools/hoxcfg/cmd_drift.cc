@@ -14,17 +14,6 @@
 namespace hoxcfg {
 namespace {
 
-constexpr const char* kFileHelp = "Desired configuration document ('-': standard input)";
-
-// The document as it applies to this host: host-specific sections (as an
-// export writes them) are reduced to this host's.
-rapidjson::Document LoadDesired(const std::string& path) {
-  rapidjson::Document file = ReadConfigurationDocument(path);
-  rapidjson::Document doc;
-  InDocument(path, [&] { HoxConfigManager::CreateMergedDocument(std::move(file), doc); });
-  return doc;
-}
-
 std::string Plural(std::size_t n, const char* word) {
   return std::to_string(n) + " " + word + (n == 1 ? "" : "s");
 }
@@ -49,10 +38,10 @@ void RegisterCompliance(CLI::App& app, GlobalOptions& options) {
                           {kExitUsage, kUsageStatus}});
   auto file = std::make_shared<std::string>();
   auto events = std::make_shared<std::string>();
-  cmd->add_option("FILE", *file, kFileHelp)->required();
+  cmd->add_option("FILE", *file, kDocumentFileHelp)->required();
   AddEventsOption(cmd, *events);
   SetAction(cmd, options, Needs::kHost, [&options, file, events] {
-    auto desired = std::make_shared<rapidjson::Document>(LoadDesired(*file));
+    auto desired = std::make_shared<rapidjson::Document>(ReadDesiredDocument(*file));
     auto result = std::make_shared<HoxConfigManager::ComplianceResult>();
     InDocument(*file, [&] { HoxConfigManager::CheckCompliance(*desired, *result, MakeTask(options, *events)); });
     Print(options, {[result, desired] {
@@ -78,10 +67,10 @@ void RegisterDrift(CLI::App& app, GlobalOptions& options) {
                           {kExitUsage, kUsageStatus}});
   auto file = std::make_shared<std::string>();
   auto boot = std::make_shared<bool>(false);
-  cmd->add_option("FILE", *file, kFileHelp)->required();
+  cmd->add_option("FILE", *file, kDocumentFileHelp)->required();
   cmd->add_flag("--boot", *boot, "The tasks of a boot-time apply: every item, without comparison");
   SetAction(cmd, options, Needs::kHost, [&options, file, boot] {
-    rapidjson::Document desired = LoadDesired(*file);
+    rapidjson::Document desired = ReadDesiredDocument(*file);
     auto tasks = std::make_shared<std::vector<HoxConfigManager::DesiredConfigInput>>(InDocument(*file, [&] {
       return *boot ? HoxConfigManager::GenerateBootTimeTasks(desired) : HoxConfigManager::GenerateApplyTasks(desired);
     }));

@@ -13,5 +13,6 @@ void RegisterStoreCommands(CLI::App& app, GlobalOptions& options);    // init, e
 void RegisterSchemaCommands(CLI::App& app, GlobalOptions& options);   // schema-check, schemas
 void RegisterPluginCommands(CLI::App& app, GlobalOptions& options);   // plugins list|check
 void RegisterDriftCommands(CLI::App& app, GlobalOptions& options);    // compliance, drift
+void RegisterVerdictCommands(CLI::App& app, GlobalOptions& options);  // validate, impact
 
 }  // namespace hoxcfg

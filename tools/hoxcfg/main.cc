@@ -5,5 +5,6 @@
 int main(int argc, char** argv) {
   return hoxcfg::RunTool(argc, argv,
                          {hoxcfg::RegisterStoreCommands, hoxcfg::RegisterSchemaCommands,
-                          hoxcfg::RegisterPluginCommands, hoxcfg::RegisterDriftCommands});
+                          hoxcfg::RegisterPluginCommands, hoxcfg::RegisterDriftCommands,
+                          hoxcfg::RegisterVerdictCommands});
 }
