@@ -79,6 +79,9 @@ step "Is the host compliant with its own export? (exit 0: compliant)" compliance
 # compliance report (secrets masked) and the apply tasks it would generate.
 scripts/demo-drift.sh "$hoxcfg" "$root"
 
+# Validation and impact: findings per field, and what applying would cost.
+scripts/demo-verdicts.sh "$hoxcfg" "$root"
+
 echo
 echo "== The installed plugins and their dependency order (a table on a terminal, JSON in a pipe)"
 echo "\$ hoxcfg plugins list | ..."
@@ -103,6 +106,6 @@ for args in "compliance $root/broken.json" "compliance $root/missing.json" "--ro
 done
 
 echo
-echo "The furthest-along real operations are the compliance check and the apply-task"
-echo "list; applying a desired document through the plugins comes with the workflow"
-echo "operations."
+echo "The furthest-along real operations are the compliance check, the apply-task"
+echo "list, validation and impact analysis; applying a desired document through the"
+echo "plugins comes with the next workflow operations."
