@@ -1,6 +1,8 @@
 // Timings of the drift walk against parsing, on one pair of generated
-// documents, and of one wide key in matching and shuffled order. Prints the
-// ratios that docs/performance.md records.
+// documents, of the verdicts built on it (impact without plugin runs,
+// validation against the host document schema), and of one wide key in
+// matching and shuffled order. Prints the ratios that docs/performance.md
+// records.
 //
 //   drift_bench [--scale=N] [benchmark flags]
 #include <cstdio>
@@ -14,6 +16,9 @@
 
 #include <hoxcm/documents.h>
 #include <hoxcm/drift.h>
+#include <hoxcm/host_documents.h>
+#include <hoxcm/operations.h>
+#include <hoxcm/schema_store.h>
 
 #include "doc_generator.h"
 
@@ -24,6 +29,7 @@ using HoxConfigManager::Document;
 struct Corpus {
   std::string hostText, desiredText;
   Document host, desired;
+  Document schema;  // the host document schema of `desired`
 };
 
 Corpus& Medium() {
@@ -91,6 +97,58 @@ void BM_DriftCompliance(benchmark::State& state) {
   RunWalk<HoxConfigManager::CheckComplianceHandler>(state, Medium().desired, Medium().host);
 }
 
+// Parsing the desired document alone: the yardstick of validation.
+void BM_ParseDesired(benchmark::State& state) {
+  const Corpus& c = Medium();
+  for (auto _ : state) {
+    Document desired;
+    desired.Parse(c.desiredText.data(), c.desiredText.size());
+    benchmark::DoNotOptimize(desired.IsObject());
+  }
+  state.SetBytesProcessed(state.iterations() * c.desiredText.size());
+}
+
+// Impact with no impact plugin installed: the walk with the impact handler
+// and the folding of its verdict (state.range(0): with the reasons). The
+// walk writes drift records into the desired document, so each run gets a
+// fresh copy.
+void BM_Impact(benchmark::State& state) {
+  const Corpus& c = Medium();
+  HoxConfigManager::ImpactReasons reasons;
+  for (auto _ : state) {
+    state.PauseTiming();
+    Document desired = Copy(c.desired);
+    Document current = Copy(c.host);
+    HoxConfigManager::ImpactResult result;
+    state.ResumeTiming();
+    HoxConfigManager::Impact(desired, "", result, HoxConfigManager::TaskHandle::Dummy(), std::move(current),
+                             state.range(0) != 0 ? &reasons : nullptr);
+    benchmark::DoNotOptimize(result.impact);
+  }
+}
+
+// Validation of the desired document against its host document schema,
+// with no validation plugin installed.
+void BM_Validate(benchmark::State& state) {
+  const Corpus& c = Medium();
+  for (auto _ : state) {
+    HoxConfigManager::ValidationResult result;
+    HoxConfigManager::Validate(c.desired, c.schema, "", result, true);
+    benchmark::DoNotOptimize(result.errors.size());
+  }
+}
+
+// The validator's own part of BM_Validate: the host document schema
+// stage alone.
+void BM_ValidateSchemaStage(benchmark::State& state) {
+  const Corpus& c = Medium();
+  for (auto _ : state) {
+    Document findings;
+    JsonValidator::ValidateCMDocument(c.schema, c.desired, findings, {}, "");
+    benchmark::DoNotOptimize(findings.Size());
+  }
+}
+
 // One key of state.range(0) instances; state.range(1) shuffles the host.
 void BM_WideKey(benchmark::State& state) {
   Document host, desired;
@@ -103,6 +161,10 @@ BENCHMARK(BM_ParseBoth)->Unit(benchmark::kMillisecond)->MinTime(2.0);
 BENCHMARK(BM_DriftBareWalk)->Unit(benchmark::kMillisecond)->MinTime(2.0);
 BENCHMARK(BM_DriftApplyTasks)->Unit(benchmark::kMillisecond)->MinTime(2.0);
 BENCHMARK(BM_DriftCompliance)->Unit(benchmark::kMillisecond)->MinTime(2.0);
+BENCHMARK(BM_ParseDesired)->Unit(benchmark::kMillisecond)->MinTime(2.0);
+BENCHMARK(BM_Impact)->Arg(0)->Arg(1)->Unit(benchmark::kMillisecond)->MinTime(2.0);
+BENCHMARK(BM_Validate)->Unit(benchmark::kMillisecond)->MinTime(2.0);
+BENCHMARK(BM_ValidateSchemaStage)->Unit(benchmark::kMillisecond)->MinTime(2.0);
 BENCHMARK(BM_WideKey)
     ->ArgsProduct({{1000, 10000, 100000}, {0, 1}})
     ->Unit(benchmark::kMillisecond)
@@ -165,6 +227,13 @@ int main(int argc, char** argv) {
                 warm.document["DELETES"].Size(), warm.document["SETS"].Size());
   }
 
+  if (!HoxConfigManager::GenerateHostDocumentSchema(c.desired, c.schema)) return 2;
+  {
+    HoxConfigManager::ValidationResult findings;
+    HoxConfigManager::Validate(c.desired, c.schema, "", findings, true);
+    std::printf("validation: %zu faulty fields\n", findings.errors.size());
+  }
+
   CollectingReporter reporter;
   benchmark::RunSpecifiedBenchmarks(&reporter);
   benchmark::Shutdown();
@@ -177,6 +246,19 @@ int main(int argc, char** argv) {
       const double parse = t->at("BM_ParseBoth");
       for (const char* name : {"BM_DriftBareWalk", "BM_DriftApplyTasks", "BM_DriftCompliance"}) {
         if (t->count(name)) std::printf("%s ratio %s / BM_ParseBoth: %.2f\n", kind, name, t->at(name) / parse);
+      }
+    }
+    if (t->count("BM_DriftCompliance")) {
+      for (const char* name : {"BM_Impact/0", "BM_Impact/1"}) {
+        if (!t->count(name)) continue;
+        std::printf("%s ratio %s / BM_DriftCompliance: %.2f\n", kind, name,
+                    t->at(name) / t->at("BM_DriftCompliance"));
+      }
+    }
+    if (t->count("BM_ParseDesired")) {
+      for (const char* name : {"BM_Validate", "BM_ValidateSchemaStage"}) {
+        if (!t->count(name)) continue;
+        std::printf("%s ratio %s / BM_ParseDesired: %.2f\n", kind, name, t->at(name) / t->at("BM_ParseDesired"));
       }
     }
     double lo = 0, hi = 0;

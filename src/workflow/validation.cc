@@ -4,8 +4,10 @@
 
 #include <algorithm>
 #include <charconv>
+#include <deque>
 #include <cstdint>
 #include <limits>
+#include <tuple>
 #include <string_view>
 #include <unordered_map>
 #include <unordered_set>
@@ -100,32 +102,105 @@ StoreObjects Gather(const Value& root, const std::vector<ConfigStoreObjectId>& k
   return objects;
 }
 
-// Where a field lies in the document, as the positions of its segments;
-// a segment the document lacks (a missing member) sorts after its
-// siblings that exist.
-std::vector<std::uint32_t> DocumentPosition(const Value& root, const std::string& field) {
-  constexpr std::uint32_t kAbsent = std::numeric_limits<std::uint32_t>::max();
-  std::vector<std::uint32_t> position;
-  const Value* at = &root;
-  for (const std::string_view segment : Segments(field)) {
-    std::uint32_t index = kAbsent;
-    if (at != nullptr && at->IsObject()) {
-      for (auto it = at->MemberBegin(); it != at->MemberEnd(); ++it) {
-        if (NameOf(it->name) == segment) {
-          index = static_cast<std::uint32_t>(it - at->MemberBegin());
-          break;
-        }
+// Where fields lie in a document, as the positions of their segments; a
+// segment the document lacks (a missing member) sorts after its siblings
+// that exist. Wide objects (a document's components, say) are indexed once.
+class DocumentOrder {
+ public:
+  explicit DocumentOrder(const Value& root) : root_(root) {}
+
+  std::vector<std::uint32_t> Of(const std::string& field) {
+    std::vector<std::uint32_t> position;
+    const Value* at = &root_;
+    for (const std::string_view segment : Segments(field)) {
+      std::uint32_t index = kAbsent;
+      if (at != nullptr && at->IsObject()) {
+        index = IndexIn(*at, segment);
+      } else if (at != nullptr && at->IsArray()) {
+        std::uint32_t i = 0;
+        const auto [end, error] = std::from_chars(segment.data(), segment.data() + segment.size(), i);
+        if (error == std::errc() && end == segment.data() + segment.size() && i < at->Size()) index = i;
       }
-    } else if (at != nullptr && at->IsArray()) {
-      std::uint32_t i = 0;
-      const auto [end, error] = std::from_chars(segment.data(), segment.data() + segment.size(), i);
-      if (error == std::errc() && end == segment.data() + segment.size() && i < at->Size()) index = i;
+      position.push_back(index);
+      at = index == kAbsent ? nullptr : (at->IsObject() ? &at->MemberBegin()[index].value : &(*at)[index]);
     }
-    position.push_back(index);
-    at = index == kAbsent ? nullptr : (at->IsObject() ? &at->MemberBegin()[index].value : &(*at)[index]);
+    return position;
   }
-  return position;
+
+ private:
+  static constexpr std::uint32_t kAbsent = std::numeric_limits<std::uint32_t>::max();
+
+  std::uint32_t IndexIn(const Value& object, std::string_view name) {
+    if (object.MemberCount() <= compare::kWideObject) {
+      for (auto it = object.MemberBegin(); it != object.MemberEnd(); ++it) {
+        if (NameOf(it->name) == name) return static_cast<std::uint32_t>(it - object.MemberBegin());
+      }
+      return kAbsent;
+    }
+    auto [entry, added] = wide_.try_emplace(&object);
+    if (added) {
+      for (auto it = object.MemberBegin(); it != object.MemberEnd(); ++it) {
+        entry->second.try_emplace(NameOf(it->name), static_cast<std::uint32_t>(it - object.MemberBegin()));
+      }
+    }
+    const auto found = entry->second.find(name);
+    return found == entry->second.end() ? kAbsent : found->second;
+  }
+
+  const Value& root_;
+  std::unordered_map<const Value*, std::unordered_map<std::string_view, std::uint32_t>> wide_;
+};
+
+// "/c/g/k" of a field "/c/g/k/...": the part that names its key.
+std::string_view KeyPrefix(std::string_view field) {
+  std::size_t end = 0;
+  for (int slashes = 0; end < field.size(); ++end) {
+    if (field[end] == '/' && ++slashes == 4) break;
+  }
+  return field.substr(0, end);
 }
+
+// The findings of one validation, one entry per field in the order the
+// fields were first found.
+class Findings {
+ public:
+  // The entry of `field`, created empty when new.
+  ValidationErrorInfo& Entry(std::string_view field) {
+    if (const auto it = byField_.find(field); it != byField_.end()) return *it->second;
+    ValidationErrorInfo& entry = entries_.emplace_back();
+    entry.field.assign(field.data(), field.size());
+    byField_.emplace(entry.field, &entry);
+    return entry;
+  }
+  // A whole entry, unless its field already has one.
+  void Add(ValidationErrorInfo&& finding) {
+    if (byField_.count(finding.field) != 0) return;
+    ValidationErrorInfo& entry = entries_.emplace_back(std::move(finding));
+    byField_.emplace(entry.field, &entry);
+  }
+  // The entries sorted by where their fields lie in `root`.
+  std::vector<ValidationErrorInfo> InDocumentOrder(const Value& root) {
+    DocumentOrder order(root);
+    std::vector<std::vector<std::uint32_t>> positions;
+    positions.reserve(entries_.size());
+    for (const ValidationErrorInfo& entry : entries_) positions.push_back(order.Of(entry.field));
+    std::vector<std::size_t> sorted(entries_.size());
+    for (std::size_t i = 0; i < sorted.size(); ++i) sorted[i] = i;
+    const auto before = [&](std::size_t a, std::size_t b) {
+      return std::tie(positions[a], entries_[a].field) < std::tie(positions[b], entries_[b].field);
+    };
+    // The schema stage reports in document order already, as a rule.
+    if (!std::is_sorted(sorted.begin(), sorted.end(), before)) std::sort(sorted.begin(), sorted.end(), before);
+    std::vector<ValidationErrorInfo> out;
+    out.reserve(sorted.size());
+    for (const std::size_t i : sorted) out.push_back(std::move(entries_[i]));
+    return out;
+  }
+
+ private:
+  std::deque<ValidationErrorInfo> entries_;  // stable addresses: the index points into them
+  std::unordered_map<std::string_view, ValidationErrorInfo*> byField_;
+};
 
 }  // namespace
 
@@ -145,29 +220,37 @@ void Validate(const Document& desiredDocument, const Document& schemaDocument, c
   CSLogger::Log(CSLogger::kInfo, "ConfigManager Validate API invoked");
   std::shared_ptr<TaskHandle> task = taskHandle ? std::move(taskHandle) : TaskHandle::Dummy();
   const Value& root = DocumentShape::Unwrap(desiredDocument);
-  // Each field once: the first finding for it wins.
-  std::unordered_map<std::string, ValidationErrorInfo> findings;
+  // Each field once, in the order first found: the first finding wins.
+  Findings findings;
   FailedSet failed;
 
   if (checkSchema) {
     Document output;
     JsonValidator::ValidateCMDocument(schemaDocument, root, output, {}, "");
     RAPIDJSON_ASSERT(output.IsArray());
+    std::unordered_map<int, std::string> messageIds;
+    std::string_view lastKey;  // findings come in runs per key: mark each key once
     for (const Value& finding : output.GetArray()) {
       RAPIDJSON_ASSERT(finding.IsObject());
       const Value& field = finding["field"];
       const Value& code = finding["errId"];
       const Value& args = finding["errArgs"];
       RAPIDJSON_ASSERT(field.IsString() && code.IsInt() && args.IsArray());
-      ErrorInfo error(JsonValidator::ConvertErrorCodeToMsgId(code.GetInt()), {}, "");
+      auto id = messageIds.find(code.GetInt());
+      if (id == messageIds.end()) {
+        id = messageIds.emplace(code.GetInt(), JsonValidator::ConvertErrorCodeToMsgId(code.GetInt())).first;
+      }
+      ErrorInfo error(id->second, {}, "");
       for (const Value& arg : args.GetArray()) {
         RAPIDJSON_ASSERT(arg.IsString());
         error.args.emplace_back(arg.GetString(), arg.GetStringLength());
       }
-      ValidationErrorInfo& entry = findings[field.GetString()];
-      entry.field = field.GetString();
-      entry.errors.push_back(std::move(error));
-      failed.insert(FailedObjectOf(entry.field));
+      const std::string_view name = NameOf(field);
+      findings.Entry(name).errors.push_back(std::move(error));
+      if (const std::string_view key = KeyPrefix(name); key != lastKey) {
+        failed.insert(FailedObjectOf(std::string(key)));
+        lastKey = key;
+      }
     }
   }
   task->UpdateProgress(20.0f);
@@ -201,24 +284,13 @@ void Validate(const Document& desiredDocument, const Document& schemaDocument, c
         result.error = std::move(outcome.error);
         return;
       }
-      for (ValidationErrorInfo& finding : outcome.errors) {
-        const std::string field = finding.field;
-        findings.try_emplace(field, std::move(finding));
-      }
+      for (ValidationErrorInfo& finding : outcome.errors) findings.Add(std::move(finding));
     }
     progress += step;
     task->UpdateProgress(progress);
   }
 
-  // In document order; fields the document lacks after their siblings.
-  std::vector<std::pair<std::vector<std::uint32_t>, ValidationErrorInfo>> ordered;
-  ordered.reserve(findings.size());
-  for (auto& [field, entry] : findings) ordered.emplace_back(DocumentPosition(root, field), std::move(entry));
-  std::sort(ordered.begin(), ordered.end(), [](const auto& a, const auto& b) {
-    return std::tie(a.first, a.second.field) < std::tie(b.first, b.second.field);
-  });
-  result.errors.clear();
-  for (auto& [position, entry] : ordered) result.errors.push_back(std::move(entry));
+  result.errors = findings.InDocumentOrder(root);
 }
 
 }  // namespace HoxConfigManager
