@@ -10,6 +10,7 @@
 
 #include <cerrno>
 #include <cstdlib>
+#include <functional>
 #include <string>
 
 #include "support/temp_root.h"
@@ -30,14 +31,18 @@ inline HoxcfgOutcome RunHoxcfg(const TempRoot& root, const std::string& args) {
   return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, root.ReadFile("/tmp/stdout"), root.ReadFile("/tmp/stderr")};
 }
 
-// Runs hoxcfg with its standard streams on a new terminal, typing `input`.
-// `out` holds what the terminal showed (stdout and stderr, "\r\n" line ends).
+// Runs hoxcfg with its standard streams on a new terminal, typing `input`,
+// then calling `whileRunning` with the terminal (to type more while it
+// runs). `out` holds what the terminal showed (stdout and stderr, "\r\n"
+// line ends).
 inline HoxcfgOutcome RunHoxcfgOnTerminal(const TempRoot& root, const std::string& args,
-                                         const std::string& input = "") {
+                                         const std::string& input = "",
+                                         const std::function<void(int terminal)>& whileRunning = {}) {
   const int master = ::posix_openpt(O_RDWR | O_NOCTTY);
   if (master < 0 || ::grantpt(master) != 0 || ::unlockpt(master) != 0) return {-1, "", "no terminal"};
   const std::string terminal = ::ptsname(master);
-  const std::string command = "HOX_ROOT=" + root.path() + " " + BuildPath("tools/hoxcfg") + " " + args;
+  // exec: a Ctrl-C typed on the terminal must reach hoxcfg, not a shell.
+  const std::string command = "HOX_ROOT=" + root.path() + " exec " + BuildPath("tools/hoxcfg") + " " + args;
   const pid_t pid = ::fork();
   if (pid == 0) {
     ::setsid();  // the terminal opened next becomes the controlling one
@@ -49,6 +54,7 @@ inline HoxcfgOutcome RunHoxcfgOnTerminal(const TempRoot& root, const std::string
     ::_exit(127);
   }
   [[maybe_unused]] const ssize_t typed = ::write(master, input.data(), input.size());
+  if (whileRunning) whileRunning(master);
   std::string shown;
   char buffer[4096];
   for (;;) {  // until the terminal's last user has gone (EIO)

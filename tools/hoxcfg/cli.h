@@ -260,15 +260,40 @@ void AuditChange(const std::string& what);
 // Adds "--events FILE" to a command that runs long work: progress and
 // plugin notifications as JSON lines, one event per line.
 void AddEventsOption(CLI::App* command, std::string& eventsPath);
-// The task to hand to the library: JSON lines to `eventsPath` when given,
-// else progress on stderr when it is a terminal (not with --json or
-// --quiet), else silent. IsAborted() answers whether Ctrl-C (SIGINT) or
-// SIGTERM arrived while an InterruptWatch was alive.
+// The task to hand to the library: JSON lines to `eventsPath` when given
+// ("-": standard output), else progress on stderr when it is a terminal (not
+// with --json or --quiet), else silent. IsAborted() answers whether Ctrl-C
+// (SIGINT) or SIGTERM arrived while an InterruptWatch was alive.
 std::shared_ptr<HoxConfigManager::TaskHandle> MakeTask(const GlobalOptions& options,
                                                        const std::string& eventsPath = {});
 
+// Percentages of the whole work that a task's progress covers.
+struct ProgressRange {
+  float from = 0.0f;
+  float to = 100.0f;
+};
+class Reporter;
+// One display of progress (as MakeTask chooses it) for work that hands the
+// library several tasks: each task covers its part of one bar or one
+// stream of events.
+class Progress {
+ public:
+  explicit Progress(const GlobalOptions& options, const std::string& eventsPath = {});
+  // A task covering `range` of the whole; its child tasks cover `children`
+  // of that range, in the order they are made (any further child: all of it).
+  std::shared_ptr<HoxConfigManager::TaskHandle> Task(ProgressRange range = {},
+                                                     std::vector<ProgressRange> children = {}) const;
+  // Takes the bar off the terminal until the next progress, so that a
+  // command's own lines do not run into it.
+  void Hide() const;
+
+ private:
+  std::shared_ptr<Reporter> reporter_;  // null: silent
+};
+
 // While alive, SIGINT and SIGTERM request an abort instead of ending the
-// process (a second one ends it). Not nestable.
+// process; a second one only says that the abort is under way (ending the
+// process could leave a half-applied change). Not nestable.
 class InterruptWatch {
  public:
   InterruptWatch();

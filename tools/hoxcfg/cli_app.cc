@@ -147,6 +147,8 @@ std::string RemedyFor(int code) {
       return "check the schemas with `hoxcfg schemas`";
     case HoxConfigManager::HostNotInMaintenanceMode:
       return "run `hoxcfg maintenance enter` first";
+    case HoxConfigManager::ImpactResultNotApplicable:
+      return "the host changed since its verdict: run the command again for a new plan";
     default:
       return std::string();
   }

@@ -12,12 +12,27 @@
 #include <iostream>
 #include <list>
 #include <mutex>
+#include <string_view>
+#include <vector>
 
 #include <hoxcm/host.h>
+#include <hoxcm/operations.h>
 
 #include "hoxcfg/cli.h"
 
 namespace hoxcfg {
+
+// Where a task's events go.
+class Reporter {
+ public:
+  virtual ~Reporter() = default;
+  virtual void Progress(float percent) = 0;
+  // kind: "info", "warning" or "error"
+  virtual void Notice(const char* kind, const std::string& id, const std::list<std::string>& args,
+                      const std::string& message) = 0;
+  virtual void Hide() {}
+};
+
 namespace {
 
 using HoxConfigManager::ErrorInfo;
@@ -28,7 +43,14 @@ std::atomic<bool>& InterruptFlag() {
   return flag;
 }
 
-extern "C" void OnInterrupt(int) { InterruptFlag().store(true); }
+// The first signal requests the abort; later ones change nothing, since
+// ending the process could leave a half-applied change behind.
+extern "C" void OnInterrupt(int) {
+  if (InterruptFlag().exchange(true)) {
+    static const char kAgain[] = "\nhoxcfg: already stopping: waiting for the running plugin to end\n";
+    [[maybe_unused]] const ssize_t n = ::write(STDERR_FILENO, kAgain, sizeof kAgain - 1);
+  }
+}
 
 // One write per line: lines of the monitor thread and of the command's
 // thread never interleave.
@@ -41,22 +63,14 @@ void WriteAll(int fd, const std::string& text) {
   }
 }
 
-// Where a task's events go.
-class Reporter {
- public:
-  virtual ~Reporter() = default;
-  virtual void Progress(float percent) = 0;
-  // kind: "info", "warning" or "error"
-  virtual void Notice(const char* kind, const std::string& id, const std::list<std::string>& args,
-                      const std::string& message) = 0;
-};
-
 // A bar on the terminal's stderr, redrawn in place; notices print above it.
 class TerminalReporter final : public Reporter {
  public:
-  ~TerminalReporter() override {
+  ~TerminalReporter() override { Hide(); }
+  void Hide() override {
     std::lock_guard<std::mutex> lock(mutex_);
     if (drawn_) WriteAll(STDERR_FILENO, "\r\033[K");
+    drawn_ = false;
   }
   void Progress(float percent) override {
     std::lock_guard<std::mutex> lock(mutex_);
@@ -66,17 +80,27 @@ class TerminalReporter final : public Reporter {
   void Notice(const char* kind, const std::string& id, const std::list<std::string>& args,
               const std::string& message) override {
     std::lock_guard<std::mutex> lock(mutex_);
+    // The bar names the plugin that runs, between its start and its end.
+    if (EndsWith(id, ".plugin.started") && args.size() == 1) {
+      running_ = args.front();
+    } else if (id.find(".plugin.") != std::string::npos) {
+      running_.clear();
+    }
     std::string line = "\r\033[K" + Describe(kind, id, args, message) + "\n";
     WriteAll(STDERR_FILENO, line);
     if (drawn_) Draw();
   }
 
  private:
+  static bool EndsWith(const std::string& s, std::string_view end) {
+    return s.size() >= end.size() && s.compare(s.size() - end.size(), end.size(), end) == 0;
+  }
   // "com.tarvik.hox.settings.apply.plugin.started" with ["net"] reads
   // "apply: plugin net started"; other identifiers are shown as they are.
   static std::string Describe(const char* kind, const std::string& id, const std::list<std::string>& args,
                               const std::string& message) {
     static constexpr std::string_view kPrefix = "com.tarvik.hox.settings.";
+    if (id == HoxConfigManager::kApplyWaitingForHost) return "hoxcfg: waiting for another apply to finish";
     std::string text = std::string(kind) == "info" ? "" : std::string(kind) + ": ";
     const std::size_t plugin = id.find(".plugin.");
     if (id.rfind(kPrefix, 0) == 0 && plugin != std::string::npos && args.size() == 1) {
@@ -95,12 +119,14 @@ class TerminalReporter final : public Reporter {
     const int filled = static_cast<int>(percent_ * kWidth / 100.0f);
     char percent[16];
     std::snprintf(percent, sizeof percent, "%3d%%", static_cast<int>(percent_));
-    WriteAll(STDERR_FILENO, "\r\033[K[" + std::string(filled, '#') + std::string(kWidth - filled, ' ') + "] " + percent);
+    WriteAll(STDERR_FILENO, "\r\033[K[" + std::string(filled, '#') + std::string(kWidth - filled, ' ') + "] " + percent +
+                                (running_.empty() ? std::string() : "  " + running_));
     drawn_ = true;
   }
-  std::mutex mutex_;  // guards the two below and the terminal line
+  std::mutex mutex_;  // guards the three below and the terminal line
   float percent_ = 0;
   bool drawn_ = false;
+  std::string running_;
 };
 
 // One JSON object per line: {"event":"progress","percent":42.5},
@@ -115,7 +141,9 @@ class JsonLinesReporter final : public Reporter {
   void Progress(float percent) override {
     rapidjson::Document event(rapidjson::kObjectType);
     event.AddMember("event", "progress", event.GetAllocator());
-    event.AddMember("percent", std::isfinite(percent) ? static_cast<double>(percent) : 0.0, event.GetAllocator());
+    // Tenths of a percent: a float's binary digits are noise to a reader.
+    const double shown = std::isfinite(percent) ? std::round(static_cast<double>(percent) * 10.0) / 10.0 : 0.0;
+    event.AddMember("percent", shown, event.GetAllocator());
     Write(event);
   }
   void Notice(const char* kind, const std::string& id, const std::list<std::string>& args,
@@ -160,22 +188,33 @@ class ReportingNotifications final : public TaskHandle::Notifications {
   const std::shared_ptr<Reporter> reporter_;
 };
 
-// The task the library gets. Child tasks report to the same place: each
-// phase of an operation shows its own progress.
+// The task the library gets. Its progress covers its range of the whole;
+// child tasks report to the same place, each over its part of the range.
 class ReportingTask final : public TaskHandle {
  public:
-  explicit ReportingTask(std::shared_ptr<Reporter> reporter) : reporter_(std::move(reporter)) {}
+  ReportingTask(std::shared_ptr<Reporter> reporter, ProgressRange range, std::vector<ProgressRange> children)
+      : reporter_(std::move(reporter)), range_(range), children_(std::move(children)) {}
   bool IsAborted() override { return InterruptWatch::Interrupted(); }
   void UpdateProgress(float percent) override {
-    if (reporter_) reporter_->Progress(percent);
+    if (reporter_) reporter_->Progress(Scaled(percent));
   }
   std::shared_ptr<Notifications> AddNotification() override {
     return std::make_shared<ReportingNotifications>(reporter_);
   }
-  std::shared_ptr<TaskHandle> ChildTask(int) override { return std::make_shared<ReportingTask>(reporter_); }
+  // Called on the operation's thread only, like UpdateProgress.
+  std::shared_ptr<TaskHandle> ChildTask(int) override {
+    const ProgressRange part = made_ < children_.size() ? children_[made_++] : ProgressRange{};
+    return std::make_shared<ReportingTask>(reporter_, ProgressRange{Scaled(part.from), Scaled(part.to)},
+                                           std::vector<ProgressRange>());
+  }
 
  private:
+  float Scaled(float percent) const { return range_.from + (range_.to - range_.from) * percent / 100.0f; }
+
   const std::shared_ptr<Reporter> reporter_;  // null: silent
+  const ProgressRange range_;
+  const std::vector<ProgressRange> children_;
+  std::size_t made_ = 0;  // child tasks made so far
 };
 
 }  // namespace
@@ -185,7 +224,7 @@ InterruptWatch::InterruptWatch() {
   struct sigaction action {};
   action.sa_handler = OnInterrupt;
   sigemptyset(&action.sa_mask);
-  action.sa_flags = SA_RESETHAND;  // a second Ctrl-C ends the process
+  action.sa_flags = 0;  // no SA_RESTART: a wait at a prompt ends at once
   ::sigaction(SIGINT, &action, nullptr);
   ::sigaction(SIGTERM, &action, nullptr);
 }
@@ -203,16 +242,27 @@ void AddEventsOption(CLI::App* command, std::string& eventsPath) {
       ->type_name("FILE");
 }
 
-std::shared_ptr<TaskHandle> MakeTask(const GlobalOptions& options, const std::string& eventsPath) {
-  std::shared_ptr<Reporter> reporter;
+Progress::Progress(const GlobalOptions& options, const std::string& eventsPath) {
   if (!eventsPath.empty()) {
-    const int fd = ::open(eventsPath.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
+    const int fd = eventsPath == "-" ? ::fcntl(STDOUT_FILENO, F_DUPFD_CLOEXEC, 0)
+                                     : ::open(eventsPath.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
     if (fd < 0) throw Failure(std::strerror(errno), "", kExitUsage, InFile(eventsPath));
-    reporter = std::make_shared<JsonLinesReporter>(fd);
+    reporter_ = std::make_shared<JsonLinesReporter>(fd);
   } else if (!options.json && !options.quiet && StderrIsTerminal()) {
-    reporter = std::make_shared<TerminalReporter>();
+    reporter_ = std::make_shared<TerminalReporter>();
   }
-  return std::make_shared<ReportingTask>(std::move(reporter));
+}
+
+std::shared_ptr<TaskHandle> Progress::Task(ProgressRange range, std::vector<ProgressRange> children) const {
+  return std::make_shared<ReportingTask>(reporter_, range, std::move(children));
+}
+
+void Progress::Hide() const {
+  if (reporter_) reporter_->Hide();
+}
+
+std::shared_ptr<TaskHandle> MakeTask(const GlobalOptions& options, const std::string& eventsPath) {
+  return Progress(options, eventsPath).Task();
 }
 
 void Confirm(const GlobalOptions& options, const std::string& plan) {

@@ -6,7 +6,6 @@
 
 #include <hoxcm/documents.h>
 #include <hoxcm/drift.h>
-#include <hoxcm/host_documents.h>
 
 #include "hoxcfg/cli.h"
 #include "hoxcfg/commands.h"
