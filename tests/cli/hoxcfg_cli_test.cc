@@ -109,7 +109,7 @@ TEST_F(HoxcfgCliTest, EveryHostCommandChecksTheRootAndTakesGlobalOptionsAnywhere
   const std::string expected = "hoxcfg: no host at " + empty + ": run `hoxcfg init --root " + empty + "`\n";
   for (const std::string command :
        {"export", "show", "maintenance status", "maintenance enter --yes", "schemas", "plugins list", "plugins check",
-        "compliance DOC", "drift DOC", "schema-check --host DOC"}) {
+        "compliance DOC", "drift DOC", "schema-check --host DOC", "plan DOC", "apply --yes DOC", "history"}) {
     std::string args = command;
     if (const auto at = args.find("DOC"); at != std::string::npos) args.replace(at, 3, empty + "/doc.json");
     const HoxcfgOutcome o = Run(args + " --root " + empty);

@@ -1,5 +1,6 @@
 # The command-line conventions and docs/cli.md, through the built hoxcfg.
 hoxcm_add_test(hoxcfg_cli_test
+  cli/hoxcfg_apply_test.cc
   cli/hoxcfg_cli_test.cc
   cli/hoxcfg_docs_test.cc)
 if(TARGET hoxcfg)

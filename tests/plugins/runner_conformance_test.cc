@@ -1,18 +1,12 @@
 // One suite, run against both runners: the same plugin written for each
-// interface must give the same results, failures included. Then the sample
-// plugins end to end: remediating the host to a changed document runs them
-// in the registry's order and leaves the host compliant with that document
-// and its files rewritten.
+// interface must give the same results, failures included. (The sample
+// plugins run end to end in the hoxcfg apply tests.)
 #include <cerrno>
 
-#include <hoxcm/drift.h>
-#include <hoxcm/extraction.h>
 #include <hoxcm/host.h>
-#include <hoxcm/host_documents.h>
 
 #include "platform/process/child_process.h"
 #include "plugins/plugin_fixture.h"
-#include "workflow/remediation.h"
 
 namespace hoxcm_test {
 namespace {
@@ -153,50 +147,6 @@ TEST_P(RunnerConformanceTest, ABadRequestEndsTheRunnerWithInvalidArgument) {
 
 INSTANTIATE_TEST_SUITE_P(BothRunners, RunnerConformanceTest, ::testing::Values("c++", "python"),
                          [](const auto& info) { return info.param == "c++" ? "Cpp" : "Python"; });
-
-class SamplePluginsTest : public PluginTest {
- protected:
-  SamplePluginsTest() {
-    root.InstallRunners();
-    root.InstallSamplePlugins();
-  }
-};
-
-TEST_F(SamplePluginsTest, ApplyingADocumentMakesTheHostCompliantAndWritesItsFiles) {
-  for (const auto& [kind, file] : {std::pair{HoxConfigStore::ConfigKind::Default, "default-config.json"},
-                                   std::pair{HoxConfigStore::ConfigKind::User, "user-config.json"}}) {
-    Document doc;
-    CreateDocumentFromFile(SourcePath(std::string("data/sample-host/") + file).c_str(), doc);
-    HoxConfigStore::ImportConfiguration(kind, doc);
-  }
-  Document desired = ExtractCurrentConfiguration();
-  Allocator& a = desired.GetAllocator();
-  Value& profile = desired.HasMember("profile") ? desired["profile"] : desired;
-  profile["network"]["dns"]["config"]["servers"].SetArray().PushBack("192.0.2.53", a).PushBack("192.0.2.54", a);
-  profile["system"]["identity"]["hostname"]["hostname"].SetString("renamed", a);
-  profile["services"]["time"]["ntp"]["servers"].SetArray().PushBack("ntp.example.org", a);
-  profile["services"]["time"]["ntp"]["enabled"].SetBool(true);
-  Value& users = profile["security"]["accounts"]["users"];
-  users.Erase(users.End() - 1);  // a deletion
-  Document check;
-  check.CopyFrom(desired, check.GetAllocator());
-  ComplianceResult before;
-  CheckCompliance(check, before);
-  ASSERT_FALSE(before.compliant);
-
-  // Remediation must give every task to its plugin and run every group:
-  // the host is compliant afterwards.
-  EXPECT_EQ(RemediateHost(desired, "", TaskHandle::Dummy(), false), ErrorInfo());
-
-  ComplianceResult after;
-  check.CopyFrom(desired, check.GetAllocator());
-  CheckCompliance(check, after);
-  EXPECT_TRUE(after.compliant) << JsonToString(after.document);
-  EXPECT_EQ(root.ReadFile("/etc/resolv.conf"), "# written by the network plugin\nsearch lab.example.com example.com\n"
-                                               "nameserver 192.0.2.53\nnameserver 192.0.2.54\n");
-  EXPECT_EQ(root.ReadFile("/etc/hostname"), "renamed.lab.example.com\n");
-  EXPECT_EQ(root.ReadFile("/etc/ntp.conf"), "# written by the ntp plugin\nserver ntp.example.org iburst\n");
-}
 
 }  // namespace
 }  // namespace hoxcm_test

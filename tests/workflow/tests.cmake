@@ -1,5 +1,4 @@
 hoxcm_add_test(workflow_test
-  workflow/apply_e2e_test.cc
   workflow/apply_test.cc
   workflow/impact_test.cc
   workflow/remediation_plan_test.cc

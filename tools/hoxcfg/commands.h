@@ -14,5 +14,6 @@ void RegisterSchemaCommands(CLI::App& app, GlobalOptions& options);   // schema-
 void RegisterPluginCommands(CLI::App& app, GlobalOptions& options);   // plugins list|check
 void RegisterDriftCommands(CLI::App& app, GlobalOptions& options);    // compliance, drift
 void RegisterVerdictCommands(CLI::App& app, GlobalOptions& options);  // validate, impact
+void RegisterApplyCommands(CLI::App& app, GlobalOptions& options);    // plan, apply, history
 
 }  // namespace hoxcfg
