@@ -82,6 +82,10 @@ scripts/demo-drift.sh "$hoxcfg" "$root"
 # Validation and impact: findings per field, and what applying would cost.
 scripts/demo-verdicts.sh "$hoxcfg" "$root"
 
+# Plan and apply changes through the sample plugins: a plain one, one that
+# needs maintenance mode, one that needs a reboot; then the apply history.
+scripts/demo-apply.sh "$hoxcfg" "$root"
+
 echo
 echo "== The installed plugins and their dependency order (a table on a terminal, JSON in a pipe)"
 echo "\$ hoxcfg plugins list | ..."
@@ -104,8 +108,3 @@ for args in "compliance $root/broken.json" "compliance $root/missing.json" "--ro
   # shellcheck disable=SC2086
   "$hoxcfg" $args 2>&1 || echo "(exit $?)"
 done
-
-echo
-echo "The furthest-along real operations are the compliance check, the apply-task"
-echo "list, validation and impact analysis; applying a desired document through the"
-echo "plugins comes with the next workflow operations."
