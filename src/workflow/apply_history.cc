@@ -18,7 +18,7 @@ namespace {
 
 constexpr std::size_t kValueLimit = 256;
 
-// The reason rules by their names in the record.
+// The reason rules by their names in the record (ImpactReasonsToJson).
 constexpr std::array<std::pair<ImpactReason::Rule, const char*>, 3> kRuleNames = {{
     {ImpactReason::Rule::kPropertyTrigger, "property"},
     {ImpactReason::Rule::kOperation, "operation"},
@@ -78,10 +78,6 @@ class RecordWriter {
     v.AddMember("message", Text(e.message), a_);
     return v;
   }
-  // Adds `name` only when `s` is not empty.
-  void Optional(Value& object, const char* name, const std::string& s) {
-    if (!s.empty()) object.AddMember(rapidjson::StringRef(name), Text(s), a_);
-  }
   Value Verdict(const ApplyHistoryRecord& r) {
     Value v(rapidjson::kObjectType);
     v.AddMember("compliant", r.compliant, a_);
@@ -95,36 +91,11 @@ class RecordWriter {
     }
     v.AddMember("statements", statements, a_);
     v.AddMember("statementsOmitted", static_cast<uint64_t>(r.statementsOmitted), a_);
-    Value objects(rapidjson::kArrayType);
-    for (const ObjectImpact& object : r.reasons) objects.PushBack(Object(object), a_);
+    Value objects;
+    ImpactReasonsToJson(ImpactReasons{r.reasons}, objects, a_);
     v.AddMember("objects", objects, a_);
     v.AddMember("objectsOmitted", static_cast<uint64_t>(r.reasonsOmitted), a_);
     return v;
-  }
-  Value Object(const ObjectImpact& object) {
-    Value o(rapidjson::kObjectType);
-    o.AddMember("component", Text(object.id.component), a_);
-    o.AddMember("group", Text(object.id.group), a_);
-    o.AddMember("key", Text(object.id.key), a_);
-    o.AddMember("instance", Text(object.id.instanceId), a_);
-    o.AddMember("action", Text(object.action), a_);
-    o.AddMember("impact", static_cast<int>(object.impact), a_);
-    Value reasons(rapidjson::kArrayType);
-    for (const ImpactReason& reason : object.reasons) {
-      Value r(rapidjson::kObjectType);
-      const auto rule = std::find_if(kRuleNames.begin(), kRuleNames.end(),
-                                     [&reason](const auto& entry) { return entry.first == reason.rule; });
-      r.AddMember("rule", rapidjson::StringRef(rule->second), a_);
-      r.AddMember("impact", static_cast<int>(reason.impact), a_);
-      Optional(r, "path", reason.path);
-      Optional(r, "oldValue", reason.oldValue);
-      Optional(r, "newValue", reason.newValue);
-      Optional(r, "plugin", reason.plugin);
-      Optional(r, "reason", reason.reason);
-      reasons.PushBack(r, a_);
-    }
-    o.AddMember("reasons", reasons, a_);
-    return o;
   }
   void Write(const ApplyHistoryRecord& r) {
     out_.SetObject();

@@ -72,6 +72,7 @@
 
 #include <hoxcm/errors.h>
 #include <hoxcm/json.h>
+#include <hoxcm/operations.h>
 #include <hoxcm/task.h>
 
 namespace hoxcfg {
@@ -214,6 +215,12 @@ std::optional<ItemRef> ParseItemName(std::string_view text);
 // names it.
 std::string ReportPathToItemName(const std::string& path, const rapidjson::Value& desired,
                                  const char* hostValue);
+// "a reboot", "maintenance mode" or "neither a reboot nor maintenance mode".
+const char* Requirement(int impact);
+// Why a document costs what it costs, one object a line and each of its
+// reasons below it, paths in the one spelling (`root`: the compared
+// document's root). Empty when nothing costs anything.
+std::string ReasonsText(const HoxConfigManager::ImpactReasons& reasons, const rapidjson::Value& root);
 
 // ---- Input ---------------------------------------------------------------
 
@@ -262,7 +269,7 @@ void AuditChange(const std::string& what);
 void AddEventsOption(CLI::App* command, std::string& eventsPath);
 // The task to hand to the library: JSON lines to `eventsPath` when given
 // ("-": standard output), else progress on stderr when it is a terminal (not
-// with --json or --quiet), else silent. IsAborted() answers whether Ctrl-C
+// with --json or --quiet), else only a line when it waits for another apply. IsAborted() answers whether Ctrl-C
 // (SIGINT) or SIGTERM arrived while an InterruptWatch was alive.
 std::shared_ptr<HoxConfigManager::TaskHandle> MakeTask(const GlobalOptions& options,
                                                        const std::string& eventsPath = {});

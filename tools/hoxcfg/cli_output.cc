@@ -159,4 +159,34 @@ std::string ReportPathToItemName(const std::string& path, const rapidjson::Value
   return name;
 }
 
+const char* Requirement(int impact) {
+  return impact == HoxConfigManager::IMPACT_REBOOT_REQUIRED             ? "a reboot"
+         : impact == HoxConfigManager::IMPACT_MAINTENANCE_MODE_REQUIRED ? "maintenance mode"
+                                                                        : "neither a reboot nor maintenance mode";
+}
+
+std::string ReasonsText(const HoxConfigManager::ImpactReasons& reasons, const rapidjson::Value& root) {
+  using HoxConfigManager::ImpactReason;
+  const auto shown = [](const std::string& value) { return value.empty() ? std::string("(none)") : value; };
+  std::string text = reasons.objects.empty() ? "" : "why:\n";
+  for (const auto& object : reasons.objects) {
+    const auto& id = object.id;
+    text += "  " + ItemName(id.component, id.group, id.key, id.instanceId) +
+            (object.action.empty() ? "" : " (" + object.action + ")") + ": needs " + Requirement(object.impact) + "\n";
+    for (const ImpactReason& r : object.reasons) {
+      text += "      ";
+      if (r.rule == ImpactReason::Rule::kPlugin) {
+        text += "plugin " + r.plugin + ": " + (r.reason.empty() ? "(no reason given)" : r.reason) + "\n";
+        continue;
+      }
+      text += ReportPathToItemName(r.path, root, r.oldValue.empty() ? nullptr : r.oldValue.c_str()) + ": " +
+              shown(r.oldValue) + " -> " + shown(r.newValue);
+      text += r.rule == ImpactReason::Rule::kPropertyTrigger
+                  ? " (a trigger value of the property)\n"
+                  : " (" + object.action + " of this key needs " + Requirement(r.impact) + ")\n";
+    }
+  }
+  return text;
+}
+
 }  // namespace hoxcfg

@@ -171,6 +171,16 @@ class JsonLinesReporter final : public Reporter {
   std::mutex mutex_;
 };
 
+// Without a terminal: only that the command waits for another apply, on
+// stderr, so that a script's log says why nothing seems to happen.
+class WaitingReporter final : public Reporter {
+ public:
+  void Progress(float) override {}
+  void Notice(const char*, const std::string& id, const std::list<std::string>&, const std::string&) override {
+    if (id == HoxConfigManager::kApplyWaitingForHost) WriteAll(STDERR_FILENO, "hoxcfg: waiting for another apply to finish\n");
+  }
+};
+
 class ReportingNotifications final : public TaskHandle::Notifications {
  public:
   explicit ReportingNotifications(std::shared_ptr<Reporter> reporter) : reporter_(std::move(reporter)) {}
@@ -248,8 +258,9 @@ Progress::Progress(const GlobalOptions& options, const std::string& eventsPath) 
                                      : ::open(eventsPath.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
     if (fd < 0) throw Failure(std::strerror(errno), "", kExitUsage, InFile(eventsPath));
     reporter_ = std::make_shared<JsonLinesReporter>(fd);
-  } else if (!options.json && !options.quiet && StderrIsTerminal()) {
-    reporter_ = std::make_shared<TerminalReporter>();
+  } else if (!options.json && !options.quiet) {
+    reporter_ = StderrIsTerminal() ? std::shared_ptr<Reporter>(std::make_shared<TerminalReporter>())
+                                   : std::make_shared<WaitingReporter>();
   }
 }
 

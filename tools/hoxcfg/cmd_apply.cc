@@ -20,11 +20,9 @@ using HoxConfigManager::CheckApplyResult;
 using HoxConfigManager::DesiredConfigInput;
 using HoxConfigManager::ErrorInfo;
 using HoxConfigManager::IMPACT_TYPE;
-using HoxConfigManager::ImpactReason;
 using HoxConfigManager::PlannedRun;
 using rapidjson::Value;
 
-constexpr const char* kFileHelp = "Desired configuration document ('-': standard input)";
 constexpr const char* kAbortedId = "com.tarvik.hox.settings.apply.plugin.aborted";
 
 const char* ImpactName(IMPACT_TYPE impact) {
@@ -34,30 +32,10 @@ const char* ImpactName(IMPACT_TYPE impact) {
     default: return "none";
   }
 }
-const char* ImpactWords(IMPACT_TYPE impact) {
-  switch (impact) {
-    case HoxConfigManager::IMPACT_MAINTENANCE_MODE_REQUIRED: return "maintenance mode";
-    case HoxConfigManager::IMPACT_REBOOT_REQUIRED: return "a reboot";
-    default: return "nothing";
-  }
-}
-const char* RuleName(ImpactReason::Rule rule) {
-  switch (rule) {
-    case ImpactReason::Rule::kPropertyTrigger: return "property";
-    case ImpactReason::Rule::kPlugin: return "plugin";
-    default: return "operation";
-  }
-}
 
 std::string ItemOf(const HoxConfigStore::ConfigStoreObjectId& id) {
   return ItemName(id.component, id.group, id.key, id.instanceId);
 }
-// A value as a line shows it: masked already, cut when long.
-std::string Short(const std::string& value) {
-  if (value.empty()) return "(none)";
-  return value.size() <= 60 ? value : value.substr(0, 57) + "...";
-}
-
 // What plan and apply show before anything changes: the verdict with its
 // reasons and the plugin runs, for the document as it applies to this host.
 struct Preview {
@@ -68,9 +46,6 @@ struct Preview {
   HoxConfigManager::ApplyPlan plan;
   std::string digest;
 
-  std::string Item(const std::string& reportPath) const {
-    return ReportPathToItemName(reportPath, HoxConfigManager::DocumentShape::Unwrap(desired), nullptr);
-  }
 };
 
 std::shared_ptr<Preview> Prepare(const std::string& file, const std::shared_ptr<HoxConfigManager::TaskHandle>& task) {
@@ -112,23 +87,7 @@ std::string PreviewText(const Preview& p) {
                                           "reboot required: staged for the next boot"};
   std::string out = "not compliant with " + DisplayName(p.file) + "\nverdict: " + kVerdicts[p.check->impact] +
                     "\ndocument " + p.digest + "\n";
-  if (!p.reasons.objects.empty()) out += "why:\n";
-  for (const HoxConfigManager::ObjectImpact& object : p.reasons.objects) {
-    out += "  " + ItemOf(object.id) + (object.action.empty() ? "" : " (" + object.action + ")") + " needs " +
-           ImpactWords(object.impact) + "\n";
-    for (const ImpactReason& r : object.reasons) {
-      if (r.rule == ImpactReason::Rule::kPlugin) {
-        out += "      plugin " + r.plugin + ": " + r.reason + "\n";
-        continue;
-      }
-      if (r.rule == ImpactReason::Rule::kOperation) {
-        out += "      the key's schema: every " + object.action + " needs " + ImpactWords(r.impact) + "\n";
-      }
-      if (r.rule == ImpactReason::Rule::kPropertyTrigger || object.action == "SET") {
-        out += "      " + p.Item(r.path) + ": " + Short(r.oldValue) + " -> " + Short(r.newValue) + "\n";
-      }
-    }
-  }
+  out += ReasonsText(p.reasons, HoxConfigManager::DocumentShape::Unwrap(p.desired));
   out += p.check->impact == HoxConfigManager::IMPACT_REBOOT_REQUIRED
              ? "apply stages the document for the next boot; no plugin runs now. The changes:\n"
              : "plugin runs, in order:\n";
@@ -168,29 +127,9 @@ rapidjson::Document PreviewJson(const Preview& p) {
   out.AddMember("compliant", !p.check, a);
   out.AddMember("document", Value(p.digest, a), a);
   if (!p.check) return out;
-  out.AddMember("impact", rapidjson::StringRef(ImpactName(p.check->impact)), a);
-  Value reasons(rapidjson::kArrayType);
-  for (const HoxConfigManager::ObjectImpact& object : p.reasons.objects) {
-    Value entry(rapidjson::kObjectType);
-    entry.AddMember("item", Value(ItemOf(object.id), a), a);
-    entry.AddMember("action", Value(object.action, a), a);
-    entry.AddMember("impact", rapidjson::StringRef(ImpactName(object.impact)), a);
-    Value why(rapidjson::kArrayType);
-    for (const ImpactReason& r : object.reasons) {
-      Value reason(rapidjson::kObjectType);
-      reason.AddMember("rule", rapidjson::StringRef(RuleName(r.rule)), a);
-      reason.AddMember("impact", rapidjson::StringRef(ImpactName(r.impact)), a);
-      const std::pair<const char*, std::string> fields[] = {
-          {"path", r.path.empty() ? "" : p.Item(r.path)}, {"oldValue", r.oldValue}, {"newValue", r.newValue},
-          {"plugin", r.plugin}, {"reason", r.reason}};
-      for (const auto& [name, text] : fields) {
-        if (!text.empty()) reason.AddMember(rapidjson::StringRef(name), Value(text, a), a);
-      }
-      why.PushBack(reason, a);
-    }
-    entry.AddMember("why", why, a);
-    reasons.PushBack(entry, a);
-  }
+  out.AddMember("impact", static_cast<int>(p.check->impact), a);
+  Value reasons;
+  HoxConfigManager::ImpactReasonsToJson(p.reasons, reasons, a);
   out.AddMember("reasons", reasons, a);
   out.AddMember("runs", RunsJson(p.plan.runs, a), a);
   out.AddMember("neverRun", RunsJson(p.plan.neverRun, a), a);
@@ -227,7 +166,7 @@ void RegisterPlan(CLI::App& app, GlobalOptions& options) {
                           {kExitAborted, "interrupted (Ctrl-C)"}});
   auto file = std::make_shared<std::string>();
   auto events = std::make_shared<std::string>();
-  cmd->add_option("FILE", *file, kFileHelp)->required();
+  cmd->add_option("FILE", *file, kDocumentFileHelp)->required();
   AddEventsOption(cmd, *events);
   SetAction(cmd, options, Needs::kHost, [&options, file, events] {
     InterruptWatch watch;
@@ -283,7 +222,7 @@ void RegisterApply(CLI::App& app, GlobalOptions& options) {
                           {kExitAborted, "interrupted (Ctrl-C): the running plugin was stopped"}});
   auto file = std::make_shared<std::string>();
   auto events = std::make_shared<std::string>();
-  cmd->add_option("FILE", *file, kFileHelp)->required();
+  cmd->add_option("FILE", *file, kDocumentFileHelp)->required();
   AddEventsOption(cmd, *events);
   SetAction(cmd, options, Needs::kHost, [&options, file, events] {
     InterruptWatch watch;

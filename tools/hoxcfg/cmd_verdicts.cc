@@ -17,7 +17,6 @@ namespace hoxcfg {
 namespace {
 
 using HoxConfigManager::ErrorInfo;
-using HoxConfigManager::ImpactReason;
 
 // A run that could not be completed: exit 130 when Ctrl-C asked for it,
 // else a failure (exit 2) naming the plugin.
@@ -122,12 +121,6 @@ void RegisterValidate(CLI::App& app, GlobalOptions& options) {
 
 // ---- impact --------------------------------------------------------------
 
-const char* Requirement(int impact) {
-  return impact == HoxConfigManager::IMPACT_REBOOT_REQUIRED             ? "a reboot"
-         : impact == HoxConfigManager::IMPACT_MAINTENANCE_MODE_REQUIRED ? "maintenance mode"
-                                                                        : "neither a reboot nor maintenance mode";
-}
-
 // A statement in words: "add /c/g/k" (its arguments are component, key,
 // group), "a reboot is required".
 std::string Statement(const HoxConfigManager::ImpactInfo& info) {
@@ -136,19 +129,6 @@ std::string Statement(const HoxConfigManager::ImpactInfo& info) {
   if (kind == "maintenance-mode") return "maintenance mode is required";
   if (info.args.size() == 3) return kind + " " + ItemName(info.args[0], info.args[2], info.args[1]);
   return info.id;
-}
-
-std::string Shown(const std::string& value) { return value.empty() ? "(none)" : value; }
-
-// One reason in words, paths in the one spelling.
-std::string Reason(const ImpactReason& r, const std::string& action, const rapidjson::Value& root) {
-  if (r.rule == ImpactReason::Rule::kPlugin) {
-    return "plugin " + r.plugin + ": " + (r.reason.empty() ? "(no reason given)" : r.reason);
-  }
-  const std::string where = ReportPathToItemName(r.path, root, r.oldValue.empty() ? nullptr : r.oldValue.c_str());
-  const std::string change = where + ": " + Shown(r.oldValue) + " -> " + Shown(r.newValue);
-  if (r.rule == ImpactReason::Rule::kPropertyTrigger) return change + " (a trigger value of the property)";
-  return change + " (" + action + " of this key needs " + Requirement(r.impact) + ")";
 }
 
 void RegisterImpact(CLI::App& app, GlobalOptions& options) {
@@ -184,17 +164,7 @@ void RegisterImpact(CLI::App& app, GlobalOptions& options) {
                         if (info.args.empty()) continue;  // the overall statement, said above
                         text += "  " + Statement(info) + "\n";
                       }
-                      if (!reasons->objects.empty()) text += "why:\n";
-                      for (const auto& object : reasons->objects) {
-                        const auto& id = object.id;
-                        text += "  " + ItemName(id.component, id.group, id.key, id.instanceId) +
-                                (object.action.empty() ? "" : " (" + object.action + ")") + ": needs " +
-                                Requirement(object.impact) + "\n";
-                        for (const ImpactReason& r : object.reasons) {
-                          text += "      " + Reason(r, object.action, root) + "\n";
-                        }
-                      }
-                      return text;
+                      return text + ReasonsText(*reasons, root);
                     },
                     [result, reasons] {
                       rapidjson::Document out(rapidjson::kObjectType);
