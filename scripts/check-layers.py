@@ -61,6 +61,7 @@ PUBLIC_HEADERS = {
     "plugins.h": "plugins",
     "plugin_sdk.h": "plugins",
     "operations.h": "workflow",
+    "boot.h": "workflow",
 }
 
 SOURCE_SUFFIXES = (".h", ".hpp", ".cc", ".cpp", ".c")

@@ -106,6 +106,10 @@ enum class Durability : int {
 HOXCM_API void WriteFileAtomically(const std::string& path, std::string_view content, mode_t mode,
                                    Durability durability);
 
+// Removes the file (or link) at `path`: 0, or the errno value of the
+// failure (ENOENT when there was nothing to remove).
+HOXCM_API int RemoveFile(const std::string& path);
+
 // Creates `directory` and its missing parents; each directory created gets
 // exactly `mode`. Throws FileError, also when a part of the path exists but
 // is not a directory.

@@ -2,6 +2,8 @@
 list(APPEND HOXCM_SOURCES
   src/workflow/apply.cc
   src/workflow/apply_history.cc
+  src/workflow/boot.cc
+  src/workflow/boot_record.cc
   src/workflow/impact.cc
   src/workflow/impact_handler.cc
   src/workflow/remediation.cc

@@ -1,5 +1,6 @@
 hoxcm_add_test(workflow_test
   workflow/apply_test.cc
+  workflow/boot_test.cc
   workflow/impact_test.cc
   workflow/remediation_plan_test.cc
   workflow/remediation_test.cc

@@ -282,6 +282,8 @@ void WriteFileAtomically(const std::string& path, std::string_view content, mode
   if (durability == Durability::kDurable) SyncDirectory(DirectoryOf(path), path);
 }
 
+int RemoveFile(const std::string& path) { return ::unlink(path.c_str()) == 0 ? 0 : errno; }
+
 void CreateDirectories(const std::string& directory, mode_t mode) {
   if (directory.empty()) return;
   struct stat st {};
