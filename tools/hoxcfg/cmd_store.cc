@@ -44,7 +44,7 @@ void RegisterInit(CLI::App& app, GlobalOptions& options) {
                          {{kExitOk, "the host root is ready"}, {kExitUsage, kUsageStatus}});
   auto sample = std::make_shared<bool>(false);
   auto force = std::make_shared<bool>(false);
-  cmd->add_flag("--sample", *sample, "Also load the sample host: configuration, host facts, SSH files");
+  cmd->add_flag("--sample", *sample, "Also load the sample host: configuration, host facts, SSH and auto-deployment files");
   cmd->add_flag("--force", *force, "Allow initialising the real root /");
   SetAction(cmd, options, Needs::kNothing, [&options, sample, force] {
     const std::string root = HoxPlatform::HostRoot();

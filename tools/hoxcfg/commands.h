@@ -15,5 +15,6 @@ void RegisterPluginCommands(CLI::App& app, GlobalOptions& options);   // plugins
 void RegisterDriftCommands(CLI::App& app, GlobalOptions& options);    // compliance, drift
 void RegisterVerdictCommands(CLI::App& app, GlobalOptions& options);  // validate, impact
 void RegisterApplyCommands(CLI::App& app, GlobalOptions& options);    // plan, apply, history
+void RegisterBootCommands(CLI::App& app, GlobalOptions& options);     // bootstrap, boot, smartnic
 
 }  // namespace hoxcfg

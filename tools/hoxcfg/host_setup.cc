@@ -114,6 +114,12 @@ std::vector<std::string> InstallSampleHost(const std::string& sampleDir) {
   CopyFile(sampleDir + "/root/.ssh/authorized_keys", Under(HostPaths::kSshAuthorizedKeys), kPrivate,
            FileKind::HostFile);
   report.push_back("installed SSH files");
+  // What an installer leaves for the first boot; a bootstrap that needs a
+  // reboot keeps them in the store until the next boot.
+  for (std::string_view path : {HostPaths::kAutodeployWaiterNotify, HostPaths::kAutodeployFirewall}) {
+    CopyFile(sampleDir + std::string(path), Under(path), kPrivate, FileKind::HostFile);
+  }
+  report.push_back("installed the auto-deployment files");
   ImportDocument(HoxConfigStore::ConfigKind::Default, sampleDir + "/default-config.json");
   ImportDocument(HoxConfigStore::ConfigKind::User, sampleDir + "/user-config.json");
   report.push_back("loaded the sample host's default and user configuration");

@@ -6,5 +6,6 @@ int main(int argc, char** argv) {
   return hoxcfg::RunTool(argc, argv,
                          {hoxcfg::RegisterStoreCommands, hoxcfg::RegisterSchemaCommands,
                           hoxcfg::RegisterPluginCommands, hoxcfg::RegisterDriftCommands,
-                          hoxcfg::RegisterVerdictCommands, hoxcfg::RegisterApplyCommands});
+                          hoxcfg::RegisterVerdictCommands, hoxcfg::RegisterApplyCommands,
+                          hoxcfg::RegisterBootCommands});
 }
