@@ -86,6 +86,9 @@ scripts/demo-verdicts.sh "$hoxcfg" "$root"
 # needs maintenance mode, one that needs a reboot; then the apply history.
 scripts/demo-apply.sh "$hoxcfg" "$root"
 
+# A bootstrap that needs a reboot, a simulated reboot and the boot's outcome.
+scripts/demo-boot.sh "$hoxcfg" "$root"
+
 echo
 echo "== The installed plugins and their dependency order (a table on a terminal, JSON in a pipe)"
 echo "\$ hoxcfg plugins list | ..."
