@@ -15,4 +15,4 @@ cmake -S "$here" -B "$build" -DCMAKE_BUILD_TYPE=Release -DHOXCM_BUILD_TESTS=OFF 
   -DHOXCM_BUILD_SAMPLES=OFF -DHOXCM_BUILD_BENCHMARKS=ON >/dev/null
 cmake --build "$build" -j2 --target apply_bench >/dev/null
 "$build/bench/apply_bench" --benchmark_filter="${BENCH_FILTER:-BM_ApplyAgainstCheckApply}" \
-  --benchmark_repetitions="$repetitions"
+  --benchmark_repetitions="$repetitions" --benchmark_color=false

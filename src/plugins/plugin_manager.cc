@@ -78,8 +78,13 @@ void PluginManager::ProcessJson(const char* path, PluginType type) {
 std::vector<std::shared_ptr<Plugin>> PluginManager::Find(const HoxConfigStore::ConfigStoreObjectId& id) {
   std::vector<std::shared_ptr<Plugin>> result;
   const auto range = extensions.equal_range(ObjectKey(id));
+  // Apply looks up every object it changes: the line's text is built only
+  // when it is written.
+  const bool detail = CSLogger::IsEnabled(CSLogger::kDetail);
   for (auto it = range.first; it != range.second; ++it) {
-    CSLogger::Log(CSLogger::kDetail, "Plugin found=%s for cso=%s", it->second.c_str(), id.toString().c_str());
+    if (detail) {
+      CSLogger::Log(CSLogger::kDetail, "Plugin found=%s for cso=%s", it->second.c_str(), id.toString().c_str());
+    }
     result.push_back(plugins[it->second]);
   }
   return result;

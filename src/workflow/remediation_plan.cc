@@ -22,23 +22,28 @@ RemediationPlan PlanRemediation(const std::vector<DesiredConfigInput>& tasks, co
   RemediationPlan plan;
   std::vector<RemediationGroup> groups;  // in the order of their first task
   std::unordered_map<std::string, std::size_t> byKey;
+  // The per-task detail lines are built only when they are written: an
+  // apply of thousands of objects would spend more on their texts than on
+  // the plan.
+  const bool detail = CSLogger::IsEnabled(CSLogger::kDetail);
   for (const DesiredConfigInput& task : tasks) {
     const HoxConfigStore::ConfigStoreObjectId& id = task.object->GetConfigStoreObjectId();
-    const std::string csoid = id.toString();
     const std::vector<PlanOwner> found = owners(id);
     if (found.empty()) {
-      CSLogger::Log(CSLogger::kWarning, "Plugin not present for %s", csoid.c_str());
+      CSLogger::Log(CSLogger::kWarning, "Plugin not present for %s", id.toString().c_str());
       plan.unowned.push_back(task);
       continue;
     }
     for (const PlanOwner& owner : found) {
       if (boot && !owner.bootCapable) {
         CSLogger::Log(CSLogger::kError, "Plugin=%s does not support boot-time remediation for csoid=%s",
-                      owner.id.c_str(), csoid.c_str());
+                      owner.id.c_str(), id.toString().c_str());
         plan.bootSkipped.push_back({owner.id, task});
         continue;
       }
-      CSLogger::Log(CSLogger::kDetail, "Found plugin=%s for cso=%s", owner.id.c_str(), csoid.c_str());
+      if (detail) {
+        CSLogger::Log(CSLogger::kDetail, "Found plugin=%s for cso=%s", owner.id.c_str(), id.toString().c_str());
+      }
       const std::string key = (owner.version == 3 ? std::string("REMEDIATE") : task.action) + ":" + owner.id;
       CSLogger::Log(CSLogger::kDetail, "Adding key=%s for plugin=%s", key.c_str(), owner.id.c_str());
       const auto [it, added] = byKey.try_emplace(key, groups.size());
