@@ -11,8 +11,6 @@
 // nothing, so the host keeps its drift after an apply; what an Apply leaves
 // behind (its history record) is removed before the next one, outside the
 // timed region.
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <sqlite3.h>
@@ -33,6 +31,8 @@
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
 #include <hoxcm/operations.h>
+
+#include "bare_spawn.h"
 
 namespace fs = std::filesystem;
 using namespace HoxConfigManager;
@@ -155,15 +155,7 @@ Document Copy(const Document& doc) {
   return out;
 }
 
-void BareSpawnAndWait(const std::string& runner) {
-  char* argv[] = {const_cast<char*>(runner.c_str()), const_cast<char*>("++group=x"), nullptr};
-  char* env[] = {nullptr};
-  pid_t pid;
-  if (posix_spawn(&pid, runner.c_str(), nullptr, nullptr, argv, env) != 0) std::abort();
-  int status;
-  while (waitpid(pid, &status, 0) < 0) {
-  }
-}
+using hoxcm_bench::BareSpawnAndWait;
 
 // Wall and CPU (of this thread: the runners' own work is not in it) time.
 struct Cost {

@@ -3,8 +3,6 @@
 // manifest tree of 1,000 plugins.
 //
 //   plugins_bench --benchmark_repetitions=5 --benchmark_report_aggregates_only=true
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -18,6 +16,8 @@
 #include <hoxcm/documents.h>
 #include <hoxcm/host.h>
 #include <hoxcm/plugins.h>
+
+#include "bare_spawn.h"
 
 namespace fs = std::filesystem;
 using namespace HoxConfigManager;
@@ -74,15 +74,7 @@ std::string Manifest(const std::string& provides, const std::string& depends) {
          provides + R"(","depends":[)" + depends + "]}}}";
 }
 
-void BareSpawnAndWait(const std::string& runner) {
-  char* argv[] = {const_cast<char*>(runner.c_str()), const_cast<char*>("++group=x"), nullptr};
-  char* env[] = {nullptr};
-  pid_t pid;
-  if (posix_spawn(&pid, runner.c_str(), nullptr, nullptr, argv, env) != 0) std::abort();
-  int status;
-  while (waitpid(pid, &status, 0) < 0) {
-  }
-}
+using hoxcm_bench::BareSpawnAndWait;
 
 void BM_BareSpawnAndWait(benchmark::State& state) {
   for (auto _ : state) BareSpawnAndWait(Root().runner());
