@@ -59,7 +59,9 @@ class ValidationTest : public PluginTest {
   ValidationResult Run(const std::string& text, bool checkSchema, const std::string& schemaOf = "") {
     const Document desired = Parse(text);
     Document schema;
-    if (checkSchema) EXPECT_TRUE(GenerateHostDocumentSchema(Parse(schemaOf.empty() ? text : schemaOf), schema));
+    if (checkSchema) {
+      EXPECT_TRUE(GenerateHostDocumentSchema(Parse(schemaOf.empty() ? text : schemaOf), schema));
+    }
     ValidationResult result;
     Validate(desired, schema, "task-1", result, checkSchema, task_, runner_);
     return result;
