@@ -268,7 +268,10 @@ void RegisterSmartnic(CLI::App& app, GlobalOptions& options) {
                          std::to_string(*items) + " items)");
     InDocument(*file, [&] { Boot::SetSmartnicConfiguration(HoxConfigManager::JsonToString(doc)); });
     AuditChange("desired SmartNIC configuration replaced from " + DisplayName(*file));
-    Print(options, {[items] { return "desired SmartNIC configuration replaced: " + std::to_string(*items) + " items\n"; },
+    Print(options, {[items] {
+                      return "desired SmartNIC configuration replaced: " + std::to_string(*items) +
+                             (*items == 1 ? " item\n" : " items\n");
+                    },
                     [items] {
                       rapidjson::Document out(rapidjson::kObjectType);
                       out.AddMember("items", static_cast<uint64_t>(*items), out.GetAllocator());
