@@ -62,6 +62,7 @@ PUBLIC_HEADERS = {
     "plugin_sdk.h": "plugins",
     "operations.h": "workflow",
     "boot.h": "workflow",
+    "host_api.h": "workflow",
 }
 
 SOURCE_SUFFIXES = (".h", ".hpp", ".cc", ".cpp", ".c")

@@ -262,6 +262,10 @@ HOXCM_API void ProcessDesiredObject(rapidjson::MemoryPoolAllocator<>& allocator,
                                     const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema,
                                     const rapidjson::Value& value);
 
+// Removes the rows of `kind` of one key (of one instance when the id has
+// one); a key without rows is left as it is.
+HOXCM_API void DeleteConfigRows(const std::shared_ptr<DBStore>& db, ConfigKind kind, const ConfigStoreObjectId& id);
+
 // The current / default configuration of one key: an object for a
 // singleton, an array of instances for a multi-instance key; null when none.
 HOXCM_API rapidjson::Document GetCurrentConfigInternal(const std::shared_ptr<DBStore>& db,

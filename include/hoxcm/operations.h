@@ -12,6 +12,7 @@
 // CheckApply and Apply (docs/apply.md) change the host in two steps: a
 // verdict first, then the change, refused when the verdict no longer holds;
 // every Apply leaves a record in the apply history.
+// The single-item host API, built on these, is <hoxcm/host_api.h>.
 //
 // Every operation runs on the caller's thread and blocks while its plugins
 // run, one after another. Results are plain values owned by the caller.

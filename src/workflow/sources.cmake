@@ -4,6 +4,8 @@ list(APPEND HOXCM_SOURCES
   src/workflow/apply_history.cc
   src/workflow/boot.cc
   src/workflow/boot_record.cc
+  src/workflow/host_api.cc
+  src/workflow/host_api_item.cc
   src/workflow/impact.cc
   src/workflow/impact_handler.cc
   src/workflow/remediation.cc

@@ -65,19 +65,6 @@ bool Failed(const FailedSet& failed, const ConfigStoreObjectId& key) {
          failed.count(ConfigStoreObjectId(key.component, "", "")) != 0 || failed.count(ConfigStoreObjectId()) != 0;
 }
 
-// The item of a key in the document, or null when the document has none
-// (also when a level above it is not an object: the schema stage reports
-// that).
-const Value* ItemOf(const Value& root, const ConfigStoreObjectId& key) {
-  const Value* level = &root;
-  for (const std::string* name : {&key.component, &key.group, &key.key}) {
-    if (!level->IsObject()) return nullptr;
-    level = FindByName(*level, *name);
-    if (level == nullptr) return nullptr;
-  }
-  return level;
-}
-
 bool IsDeleteDefault(const Value& v) { return v.IsString() && NameOf(v) == DocumentShape::kDeleteDefault; }
 
 // One store object per configured value of the keys: one for a singleton's
@@ -203,6 +190,30 @@ class Findings {
 };
 
 }  // namespace
+
+const Value* ItemOf(const Value& root, const ConfigStoreObjectId& key) {
+  const Value* level = &root;
+  for (const std::string* name : {&key.component, &key.group, &key.key}) {
+    if (!level->IsObject()) return nullptr;
+    level = FindByName(*level, *name);
+    if (level == nullptr) return nullptr;
+  }
+  return level;
+}
+
+std::pair<std::string, ErrorInfo> SchemaFinding(const Value& finding) {
+  RAPIDJSON_ASSERT(finding.IsObject());
+  const Value& field = finding["field"];
+  const Value& code = finding["errId"];
+  const Value& args = finding["errArgs"];
+  RAPIDJSON_ASSERT(field.IsString() && code.IsInt() && args.IsArray());
+  ErrorInfo error(JsonValidator::ConvertErrorCodeToMsgId(code.GetInt()), {}, "");
+  for (const Value& arg : args.GetArray()) {
+    RAPIDJSON_ASSERT(arg.IsString());
+    error.args.emplace_back(arg.GetString(), arg.GetStringLength());
+  }
+  return {std::string(field.GetString(), field.GetStringLength()), std::move(error)};
+}
 
 std::size_t CsoIdHash::operator()(const ConfigStoreObjectId& id) const {
   return std::hash<std::string>()(id.toString());

@@ -1,6 +1,7 @@
 hoxcm_add_test(workflow_test
   workflow/apply_test.cc
   workflow/boot_test.cc
+  workflow/host_api_test.cc
   workflow/impact_test.cc
   workflow/remediation_plan_test.cc
   workflow/remediation_test.cc

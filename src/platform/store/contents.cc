@@ -364,6 +364,17 @@ void ProcessDesiredObject(rapidjson::MemoryPoolAllocator<>& allocator, const std
                                [&](Database& conn) { UpsertItem(conn, ConfigKind::Desired, row); });
 }
 
+void DeleteConfigRows(const std::shared_ptr<DBStore>& db, ConfigKind kind, const ConfigStoreObjectId& id) {
+  detail::AsDatabase(db).Write("delete configuration rows", [&](Database& conn) {
+    std::string sql = "DELETE FROM config_item WHERE kind = ? AND component = ? AND config_group = ? AND name = ?";
+    if (!id.instanceId.empty()) sql += " AND identifier = ?";
+    auto remove = conn.Prepare(sql);
+    remove.Bind(1, static_cast<int64_t>(kind)).Bind(2, id.component).Bind(3, id.group).Bind(4, id.key);
+    if (!id.instanceId.empty()) remove.Bind(5, id.instanceId);
+    remove.Run();
+  });
+}
+
 rapidjson::Document GetCurrentConfigInternal(const std::shared_ptr<DBStore>& db, const std::string& component,
                                              const std::string& group, const std::string& key) {
   return ItemFromRows(ReadKey(db, ConfigKind::User, {component, group, key}), component, group, key, false);
