@@ -111,3 +111,7 @@ for args in "compliance $root/broken.json" "compliance $root/missing.json" "--ro
   # shellcheck disable=SC2086
   "$hoxcfg" $args 2>&1 || echo "(exit $?)"
 done
+
+# Read, set and delete single items through the host API (last: it leaves a
+# change staged for the next boot, after which the host refuses changes).
+scripts/demo-item.sh "$hoxcfg" "$root"

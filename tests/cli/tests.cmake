@@ -3,7 +3,8 @@ hoxcm_add_test(hoxcfg_cli_test
   cli/hoxcfg_apply_test.cc
   cli/hoxcfg_boot_test.cc
   cli/hoxcfg_cli_test.cc
-  cli/hoxcfg_docs_test.cc)
+  cli/hoxcfg_docs_test.cc
+  cli/hoxcfg_item_test.cc)
 if(TARGET hoxcfg)
   add_dependencies(hoxcfg_cli_test hoxcfg cpp_plugin_runner hoxcm_sample_network)
 endif()

@@ -182,6 +182,12 @@ void Print(const GlobalOptions& options, const Answer& answer);
 rapidjson::Document CopyOf(const rapidjson::Value& value);
 // The shape of every check: {"valid": <`findings` is empty>, NAME: findings}.
 rapidjson::Document CheckShape(const char* name, const rapidjson::Value& findings);
+// The validator's findings about `document` (an array of {"field", "errId",
+// "errArgs", "error"}) as a check's answer: "DOCUMENT: /field: what is
+// wrong" one a line ("DOCUMENT: valid" without any), or CheckShape
+// ("findings"). Returns kExitOk without findings, else kExitNegative.
+int PrintFindings(const GlobalOptions& options, std::shared_ptr<rapidjson::Document> findings,
+                  const std::string& document);
 // JSON text, indented by two spaces unless --compact; ends with '\n'.
 std::string JsonText(const rapidjson::Value& value, const GlobalOptions& options);
 // Writes `text` to stdout, or to `path` (replaced atomically, mode 0600:
@@ -224,6 +230,9 @@ std::string ReasonsText(const HoxConfigManager::ImpactReasons& reasons, const ra
 
 // ---- Input ---------------------------------------------------------------
 
+// The text of a file argument ("-": standard input), bounded as documents
+// are; unreadable files fail with the system's reason.
+std::string ReadTextArgument(const std::string& path);
 // The parsed JSON of a file argument ("-": standard input). Unreadable files
 // fail with the system's reason, malformed JSON with FILE:LINE:COLUMN.
 rapidjson::Document ReadJsonArgument(const std::string& path);

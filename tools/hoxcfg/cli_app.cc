@@ -149,6 +149,10 @@ std::string RemedyFor(int code) {
       return "run `hoxcfg maintenance enter` first";
     case HoxConfigManager::ImpactResultNotApplicable:
       return "the host changed since its verdict: run the command again for a new plan";
+    case HoxConfigManager::PendingDesiredConfiguration:
+      return "a change staged for the next boot waits (`hoxcfg show desired`): reboot the host first";
+    case HoxConfigManager::NotUserConfiguration:
+      return "the host keeps this item out of its user configuration";
     default:
       return std::string();
   }

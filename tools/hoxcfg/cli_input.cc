@@ -50,6 +50,8 @@ const char* TypeName(const rapidjson::Value& value) {
 
 }  // namespace
 
+std::string ReadTextArgument(const std::string& path) { return ReadArgument(path); }
+
 rapidjson::Document ReadJsonArgument(const std::string& path) {
   const std::string text = ReadArgument(path);
   rapidjson::Document doc;

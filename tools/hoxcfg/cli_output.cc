@@ -45,6 +45,21 @@ rapidjson::Document CheckShape(const char* name, const rapidjson::Value& finding
   return out;
 }
 
+int PrintFindings(const GlobalOptions& options, std::shared_ptr<rapidjson::Document> findings,
+                  const std::string& document) {
+  Print(options, {[findings, document] {
+                    if (findings->Empty()) return DisplayName(document) + ": valid\n";
+                    std::string text;
+                    for (const auto& f : findings->GetArray()) {
+                      text += FormatWhere(Where{document, 0, 0, f["field"].GetString()}) + ": " +
+                              f["error"].GetString() + "\n";
+                    }
+                    return text;
+                  },
+                  [findings] { return CheckShape("findings", *findings); }});
+  return findings->Empty() ? kExitOk : kExitNegative;
+}
+
 void Print(const GlobalOptions& options, const Answer& answer) {
   if (options.quiet) return;
   const bool json = options.json || (answer.list && !StdoutIsTerminal());

@@ -23,17 +23,7 @@ int Report(const GlobalOptions& options, std::shared_ptr<rapidjson::Document> fi
       throw Failure(f["error"].GetString(), "", kExitUsage, InFile(schema));
     }
   }
-  Print(options, {[findings, document] {
-                    if (findings->Empty()) return DisplayName(document) + ": valid\n";
-                    std::string text;
-                    for (const auto& f : findings->GetArray()) {
-                      text += FormatWhere(Where{document, 0, 0, f["field"].GetString()}) + ": " +
-                              f["error"].GetString() + "\n";
-                    }
-                    return text;
-                  },
-                  [findings] { return CheckShape("findings", *findings); }});
-  return findings->Empty() ? kExitOk : kExitNegative;
+  return PrintFindings(options, std::move(findings), document);
 }
 
 void RegisterSchemaCheck(CLI::App& app, GlobalOptions& options) {

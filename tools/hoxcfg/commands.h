@@ -16,5 +16,6 @@ void RegisterDriftCommands(CLI::App& app, GlobalOptions& options);    // complia
 void RegisterVerdictCommands(CLI::App& app, GlobalOptions& options);  // validate, impact
 void RegisterApplyCommands(CLI::App& app, GlobalOptions& options);    // plan, apply, history
 void RegisterBootCommands(CLI::App& app, GlobalOptions& options);     // bootstrap, boot, smartnic
+void RegisterItemCommands(CLI::App& app, GlobalOptions& options);     // get, set, delete
 
 }  // namespace hoxcfg

@@ -7,5 +7,6 @@ int main(int argc, char** argv) {
                          {hoxcfg::RegisterStoreCommands, hoxcfg::RegisterSchemaCommands,
                           hoxcfg::RegisterPluginCommands, hoxcfg::RegisterDriftCommands,
                           hoxcfg::RegisterVerdictCommands, hoxcfg::RegisterApplyCommands,
-                          hoxcfg::RegisterBootCommands});
+                          hoxcfg::RegisterBootCommands,
+                          hoxcfg::RegisterItemCommands});
 }

@@ -1,0 +1,63 @@
+// hoxcfg get, set and delete through the built tool on a sandbox sample
+// host, with the real runners.
+#include <gtest/gtest.h>
+
+#include <unistd.h>
+
+#include <string>
+
+#include "support/run_hoxcfg.h"
+
+namespace hoxcm_test {
+namespace {
+
+bool Has(const std::string& text, const std::string& part) { return text.find(part) != std::string::npos; }
+
+TEST(HoxcfgItemTest, GetSetAndDeleteAnswerWithTheirExitStatuses) {
+  TempRoot root;
+  ASSERT_EQ(RunHoxcfg(root, "init --sample").exitCode, 0);
+
+  // Secrets are masked, and shown only to root on a terminal.
+  HoxcfgOutcome r = RunHoxcfg(root, "get security/accounts/users --json --compact");
+  EXPECT_EQ(r.exitCode, 0);
+  EXPECT_TRUE(Has(r.out, R"("password":"******")") && !Has(r.out, "$6$")) << r.out;
+  EXPECT_EQ(RunHoxcfg(root, "get security/accounts/users --show-secrets").exitCode, 2);
+  r = RunHoxcfgOnTerminal(root, "get security/accounts/users --show-secrets");
+  EXPECT_EQ(r.exitCode, ::geteuid() == 0 ? 0 : 2) << r.out;
+  EXPECT_EQ(Has(r.out, "$6$"), ::geteuid() == 0) << r.out;
+
+  // Findings per field: 1; a value that cannot be the item: 2.
+  r = RunHoxcfg(root, R"(set network/dns/config --yes --value '{"servers": "10.0.0.1"}')");
+  EXPECT_EQ(r.exitCode, 1);
+  EXPECT_EQ(r.out, "--value: /network/dns/config/servers: must be an array\n");
+  r = RunHoxcfg(root, R"(set network/dns/config --yes --value '[{"servers": []}]')");
+  EXPECT_EQ(r.exitCode, 2);
+  EXPECT_TRUE(Has(r.err, "error 2028: Not a Non-Singleton object: /network/dns/config")) << r.err;
+
+  // Applied, then unchanged; without --yes and a terminal, refused.
+  const std::string dns = R"(set network/dns/config --value '{"servers": ["10.0.0.53"]}')";
+  EXPECT_EQ(RunHoxcfg(root, dns).exitCode, 2);
+  r = RunHoxcfg(root, dns + " --yes");
+  EXPECT_EQ(r.exitCode, 0);
+  EXPECT_EQ(r.out, "/network/dns/config: applied\n");
+  EXPECT_EQ(RunHoxcfg(root, dns + " --yes").out, "/network/dns/config: unchanged\n");
+
+  r = RunHoxcfg(root, "delete services/syslog/config --yes");
+  EXPECT_EQ(r.exitCode, 0);
+  EXPECT_EQ(r.out, "/services/syslog/config: deleted\n");
+  EXPECT_TRUE(Has(RunHoxcfg(root, "get services/syslog/config --json --compact").out, R"("current":null)"));
+
+  // Staged for the next boot: 3, shown as desired; then every change is refused.
+  r = RunHoxcfg(root, "set system/kernel/boot_options --yes --json --compact --value "
+                      R"('{"iommu": true, "hugepages": 4096, "console": "ttyS0"}')");
+  EXPECT_EQ(r.exitCode, 3);
+  EXPECT_EQ(r.out, R"({"item":"/system/kernel/boot_options","status":"staged","impact":"reboot","reasons":)"
+                   R"(["reboot: /system/kernel/boot_options/hugepages: 2048 -> 4096"]})" "\n");
+  EXPECT_TRUE(Has(RunHoxcfg(root, "show desired --compact").out, R"("hugepages":4096)"));
+  r = RunHoxcfg(root, R"(set network/dns/config --yes --value '{"servers": ["10.0.0.54"]}')");
+  EXPECT_EQ(r.exitCode, 2);
+  EXPECT_TRUE(Has(r.err, "error 2029")) << r.err;
+}
+
+}  // namespace
+}  // namespace hoxcm_test

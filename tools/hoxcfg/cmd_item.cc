@@ -1,0 +1,327 @@
+// hoxcfg get, set and delete: one configuration item through the host API
+// (docs/host-api.md), with the impact shown and confirmed before a change.
+#include <unistd.h>
+
+#include <algorithm>
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include <hoxcm/documents.h>
+#include <hoxcm/host_api.h>
+#include <hoxcm/host_documents.h>
+#include <hoxcm/schema_store.h>
+
+#include "hoxcfg/cli.h"
+#include "hoxcfg/commands.h"
+
+namespace hoxcfg {
+namespace {
+
+using HoxConfigManager::HostConfigResult;
+using HoxConfigManager::ImpactResult;
+
+constexpr const char* kItemHelp = "The item: COMPONENT/GROUP/KEY (a singleton's object, or a key's instances)";
+constexpr const char* kAbortedId = "com.tarvik.hox.settings.apply.plugin.aborted";
+
+struct Item {
+  std::string component, group, key;
+  std::string Name() const { return ItemName(component, group, key); }
+};
+
+Item ParseItem(const std::string& text) {
+  std::vector<std::string> parts;
+  std::string rest = text.size() > 1 && text.front() == '/' ? text.substr(1) : text;
+  for (std::size_t slash; (slash = rest.find('/')) != std::string::npos; rest.erase(0, slash + 1)) {
+    parts.push_back(rest.substr(0, slash));
+  }
+  parts.push_back(rest);
+  for (const std::string& part : parts) {
+    if (parts.size() != 3 || part.empty()) {
+      throw Failure("'" + text + "' is not an item", "name it COMPONENT/GROUP/KEY, for example network/dns/config");
+    }
+  }
+  return {parts[0], parts[1], parts[2]};
+}
+
+std::shared_ptr<HoxSchemaStore::SchemaObject> SchemaOf(const Item& item) {
+  const auto store = HoxSchemaStore::SchemaStore::GetStore();
+  return store ? store->Find(item.component, item.group, item.key) : nullptr;
+}
+
+// A value of the item as JSON, its sensitive members masked unless `clear`.
+rapidjson::Document Shown(const Item& item, const std::string& json, bool clear) {
+  rapidjson::Document value;
+  HoxConfigManager::ParseDocument(json, value);
+  const auto schema = SchemaOf(item);
+  if (clear || value.IsNull() || !schema) return value;
+  rapidjson::Document masked;
+  HoxConfigManager::ParseDocument(
+      HoxConfigStore::ConfigStoreDocument::RedactAndSerializeValue(schema->GetJsonSchema(), value), masked);
+  return masked;
+}
+
+const char* ImpactName(int impact) {
+  switch (impact) {
+    case HoxConfigManager::IMPACT_NONE: return "none";
+    case HoxConfigManager::IMPACT_MAINTENANCE_MODE_REQUIRED: return "maintenance mode";
+    default: return "reboot";
+  }
+}
+
+// "reboot: /system/kernel/boot_options/hugepages: 2048 -> 4096", one line a
+// reason; values are masked by the library.
+std::vector<std::string> ReasonLines(const HoxConfigManager::ImpactReasons& reasons) {
+  std::vector<std::string> lines;
+  for (const auto& object : reasons.objects) {
+    for (const auto& r : object.reasons) {
+      std::string line = std::string(ImpactName(r.impact)) + ": ";
+      if (r.rule == HoxConfigManager::ImpactReason::Rule::kPlugin) {
+        line += "plugin " + r.plugin + ": " + r.reason;
+      } else if (r.rule == HoxConfigManager::ImpactReason::Rule::kOperation) {
+        line += object.action + " " + ItemName(object.id.component, object.id.group, object.id.key, object.id.instanceId);
+      } else {
+        line += r.path + ": " + (r.oldValue.empty() ? "(none)" : r.oldValue) + " -> " +
+                (r.newValue.empty() ? "(none)" : r.newValue);
+      }
+      lines.push_back(std::move(line));
+    }
+  }
+  return lines;
+}
+
+// The answer of set and delete: the item, what was decided and why.
+struct Outcome {
+  std::string item;
+  std::string status;  // "unchanged", "applied", "applied in maintenance mode", "staged", "deleted", ...
+  std::string impact;  // set only
+  std::vector<std::string> reasons;
+};
+
+Answer OutcomeAnswer(const std::shared_ptr<Outcome>& o) {
+  return {[o] {
+            std::string text = o->item + ": " + o->status;
+            if (o->status == "staged") text += " for the next boot: reboot the host to apply it";
+            text += "\n";
+            for (const std::string& r : o->reasons) text += "  " + r + "\n";
+            return text;
+          },
+          [o] {
+            rapidjson::Document out(rapidjson::kObjectType);
+            auto& a = out.GetAllocator();
+            out.AddMember("item", rapidjson::Value(o->item, a), a);
+            out.AddMember("status", rapidjson::Value(o->status, a), a);
+            if (!o->impact.empty()) {
+              out.AddMember("impact", rapidjson::Value(o->impact, a), a);
+              rapidjson::Value reasons(rapidjson::kArrayType);
+              for (const std::string& r : o->reasons) reasons.PushBack(rapidjson::Value(r, a), a);
+              out.AddMember("reasons", reasons, a);
+            }
+            return out;
+          }};
+}
+
+// Runs a change of the host: an abort is exit 130, a plugin's failure exit 1;
+// the audit line is written whatever happened once the change began.
+int RunChange(const GlobalOptions& options, const std::shared_ptr<Outcome>& outcome, const std::string& what,
+              const std::function<HostConfigResult()>& change) {
+  HostConfigResult result;
+  try {
+    InterruptWatch watch;
+    result = change();
+  } catch (const HoxConfigStore::ConfigStoreException& e) {
+    const auto error = HoxConfigManager::PluginErrorOf(e);
+    if (!error) throw;
+    AuditChange(what + " " + outcome->item + " failed");
+    throw Failure("plugin error " + error->id + (error->message.empty() ? "" : ": " + error->message),
+                  "the item may be partly changed; `hoxcfg get " + outcome->item + "` shows it", kExitNegative);
+  }
+  if (!result.errorInfo.id.empty()) {
+    outcome->status = "aborted";
+    AuditChange(what + " " + outcome->item + " aborted");
+    Print(options, OutcomeAnswer(outcome));
+    return kExitAborted;
+  }
+  if (outcome->status.empty()) {
+    outcome->status = result.status == HoxConfigManager::HOST_CONFIG_PENDING_REBOOT ? "staged"
+                      : result.status == HoxConfigManager::HOST_CONFIG_COMPLETED_IN_MAINTENANCE_MODE
+                          ? "applied in maintenance mode"
+                          : "applied";
+  }
+  AuditChange(what + " " + outcome->item + " " + outcome->status);
+  Print(options, OutcomeAnswer(outcome));
+  return result.status == HoxConfigManager::HOST_CONFIG_PENDING_REBOOT ? kExitStaged : kExitOk;
+}
+
+void RegisterGet(CLI::App& app, GlobalOptions& options) {
+  auto* cmd = AddCommand(app, "get", "Print one item's configuration, its default, and whether it is the user's",
+                         {{kExitOk, "printed"}, {kExitUsage, kUsageStatus}});
+  auto item = std::make_shared<std::string>();
+  auto secrets = std::make_shared<bool>(false);
+  cmd->add_option("ITEM", *item, kItemHelp)->required();
+  cmd->add_flag("--show-secrets", *secrets, "Show sensitive values in clear (root, on a terminal only)");
+  SetAction(cmd, options, Needs::kHost, [&options, item, secrets] {
+    const Item at = ParseItem(*item);
+    if (*secrets && (::geteuid() != 0 || !StdoutIsTerminal() || options.json)) {
+      throw Failure("--show-secrets shows secrets to root on a terminal only",
+                    "run it as root on a terminal without --json, or leave --show-secrets out");
+    }
+    std::string current, defaults, user;
+    HoxConfigManager::GetConfig(at.component, at.group, at.key, current, defaults, user);
+    auto shownCurrent = std::make_shared<rapidjson::Document>(Shown(at, current, *secrets));
+    auto shownDefault = std::make_shared<rapidjson::Document>(Shown(at, defaults, *secrets));
+    const bool isUser = user == "true";
+    Print(options, {[&options, at, shownCurrent, shownDefault, isUser] {
+                      return at.Name() + (isUser ? ": user configuration\n" : ": not user configuration\n") +
+                             "current: " + JsonText(*shownCurrent, options) +
+                             "default: " + JsonText(*shownDefault, options);
+                    },
+                    [at, shownCurrent, shownDefault, isUser] {
+                      rapidjson::Document out(rapidjson::kObjectType);
+                      auto& a = out.GetAllocator();
+                      out.AddMember("item", rapidjson::Value(at.Name(), a), a);
+                      out.AddMember("current", rapidjson::Value(*shownCurrent, a), a);
+                      out.AddMember("default", rapidjson::Value(*shownDefault, a), a);
+                      out.AddMember("userConfiguration", isUser, a);
+                      return out;
+                    }});
+    return kExitOk;
+  });
+}
+
+// The findings of ValidateInput in schema-check's shape.
+int ReportFindings(const GlobalOptions& options, const std::string& source,
+                   const std::vector<HoxConfigManager::ValidationErrorInfo>& findings) {
+  auto list = std::make_shared<rapidjson::Document>(rapidjson::kArrayType);
+  auto& a = list->GetAllocator();
+  for (const auto& finding : findings) {
+    for (const auto& error : finding.errors) {
+      const int code = JsonValidator::ConvertMsgIdToErrorCode(error.id);
+      rapidjson::Value entry(rapidjson::kObjectType), args(rapidjson::kArrayType);
+      for (const std::string& arg : error.args) args.PushBack(rapidjson::Value(arg, a), a);
+      entry.AddMember("field", rapidjson::Value(finding.field, a), a);
+      entry.AddMember("errId", code, a);
+      entry.AddMember("errArgs", args, a);
+      entry.AddMember("error", rapidjson::Value(JsonValidator::DescribeFinding(code, error.args), a), a);
+      list->PushBack(entry, a);
+    }
+  }
+  return PrintFindings(options, std::move(list), source);
+}
+
+void RegisterSet(CLI::App& app, GlobalOptions& options) {
+  auto* cmd = AddCommand(app, "set", "Set one item: applied now, or staged for the next boot when it needs a reboot",
+                         {{kExitOk, "applied (or the item had the value already)"},
+                          {kExitNegative, "the value is not valid (each finding is listed), or a plugin failed"},
+                          {kExitUsage, kUsageStatus},
+                          {kExitStaged, "staged for the next boot: it needs a reboot"},
+                          {kExitAborted, "aborted with Ctrl-C"}});
+  auto item = std::make_shared<std::string>();
+  auto value = std::make_shared<std::string>();
+  auto file = std::make_shared<std::string>();
+  auto events = std::make_shared<std::string>();
+  cmd->add_option("ITEM", *item, kItemHelp)->required();
+  auto* valueOption = cmd->add_option("--value", *value, "The new item as JSON text")->type_name("JSON");
+  auto* fileOption =
+      cmd->add_option("--file", *file, "Read the new item from FILE ('-': standard input)")->type_name("FILE");
+  AddEventsOption(cmd, *events);
+  SetAction(cmd, options, Needs::kHost, [&options, item, value, file, events, valueOption, fileOption] {
+    const Item at = ParseItem(*item);
+    if (valueOption->count() + fileOption->count() != 1) {
+      throw Failure("set needs the new item once", "give it with --value JSON or with --file FILE");
+    }
+    const std::string source = fileOption->count() ? *file : std::string("--value");
+    const std::string text = fileOption->count() ? ReadTextArgument(*file) : *value;
+
+    rapidjson::Document parsed;
+    std::vector<HoxConfigManager::ValidationErrorInfo> findings;
+    InDocument(source, [&] { HoxConfigManager::ValidateInput(at.component, at.group, at.key, text, parsed, findings); });
+    if (!findings.empty()) return ReportFindings(options, source, findings);
+
+    rapidjson::Document current, desired, staged;
+    HoxConfigManager::GenerateSetDocuments(at.component, at.group, at.key, current, desired, staged, parsed);
+    const auto task = MakeTask(options, *events);
+    HoxConfigManager::ImpactReasons reasons;
+    ImpactResult impact;
+    auto outcome = std::make_shared<Outcome>();
+    outcome->item = at.Name();
+    try {
+      InterruptWatch watch;
+      impact = HoxConfigManager::CheckImpact(desired, current, task, &reasons);
+    } catch (const HoxConfigStore::ConfigStoreException& e) {
+      const auto error = HoxConfigManager::PluginErrorOf(e);
+      if (!error) throw;
+      if (error->id.find(".aborted") != std::string::npos) return kExitAborted;
+      throw Failure("impact plugin error " + error->id + (error->message.empty() ? "" : ": " + error->message), "",
+                    kExitNegative);
+    }
+    outcome->impact = ImpactName(impact.impact);
+    outcome->reasons = ReasonLines(reasons);
+    if (impact.compliant) {
+      outcome->status = "unchanged";
+      Print(options, OutcomeAnswer(outcome));
+      return kExitOk;
+    }
+    // "stage /system/kernel/boot_options for the next boot (reboot: /system/
+    // kernel/boot_options/hugepages: 2048 -> 4096)"
+    std::string why;
+    for (const std::string& reason : outcome->reasons) why += (why.empty() ? "" : "; ") + reason;
+    if (why.empty()) why = impact.impact == HoxConfigManager::IMPACT_NONE ? "no impact" : outcome->impact;
+    Confirm(options, (impact.impact == HoxConfigManager::IMPACT_REBOOT_REQUIRED ? "stage " + outcome->item + " for the next boot"
+                                                                              : "set " + outcome->item + " now") +
+                         " (" + why + ")");
+    return RunChange(options, outcome, "set", [&] {
+      return HoxConfigManager::SetConfig(current, desired, staged, impact, at.component, at.group, at.key, task);
+    });
+  });
+}
+
+void RegisterDelete(CLI::App& app, GlobalOptions& options) {
+  auto* cmd = AddCommand(app, "delete", "Remove a singleton item's configuration through its plugin",
+                         {{kExitOk, "deleted (or the host had no configuration for it)"},
+                          {kExitNegative, "the plugin failed"},
+                          {kExitUsage, kUsageStatus},
+                          {kExitAborted, "aborted with Ctrl-C"}});
+  auto item = std::make_shared<std::string>();
+  auto events = std::make_shared<std::string>();
+  cmd->add_option("ITEM", *item, "The item: COMPONENT/GROUP/KEY of a singleton key")->required();
+  AddEventsOption(cmd, *events);
+  SetAction(cmd, options, Needs::kHost, [&options, item, events] {
+    const Item at = ParseItem(*item);
+    std::string current, defaults, user;
+    HoxConfigManager::GetConfig(at.component, at.group, at.key, current, defaults, user);
+    auto outcome = std::make_shared<Outcome>();
+    outcome->item = at.Name();
+    if (current == "null") {
+      outcome->status = "nothing to delete";
+      Print(options, OutcomeAnswer(outcome));
+      return kExitOk;
+    }
+    std::string plan = "delete the configuration of " + outcome->item + ": " +
+                       HoxConfigManager::JsonToString(Shown(at, current, false));
+    if (const auto schema = SchemaOf(at)) {
+      std::vector<std::string> operations;
+      bool propertyLevel = false;
+      if (schema->GetRebootOperations(operations, propertyLevel) == 0 &&
+          std::find(operations.begin(), operations.end(), "DELETE") != operations.end()) {
+        plan += "\n  it takes effect at the next boot";
+      }
+    }
+    Confirm(options, plan);
+    outcome->status = "deleted";
+    return RunChange(options, outcome, "delete", [&] {
+      return HoxConfigManager::DeleteConfig(at.component, at.group, at.key, MakeTask(options, *events));
+    });
+  });
+}
+
+}  // namespace
+
+void RegisterItemCommands(CLI::App& app, GlobalOptions& options) {
+  RegisterGet(app, options);
+  RegisterSet(app, options);
+  RegisterDelete(app, options);
+}
+
+}  // namespace hoxcfg

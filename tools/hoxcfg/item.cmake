@@ -1,0 +1,1 @@
+list(APPEND HOXCFG_SOURCES hoxcfg/cmd_item.cc)
