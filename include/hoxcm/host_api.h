@@ -20,8 +20,10 @@
 // further change is refused with 2029 until the boot-time apply has run.
 //
 // Every operation runs on the caller's thread. SetConfig and DeleteConfig
-// hold the host run lock while they change the host, so they never
-// interleave with another process's plugin runs. Failures are thrown through
+// hold the host run lock from their checks to their last plugin run, so they
+// never interleave with another apply (they wait for it, posting
+// kApplyWaitingForHost; an abort ends the wait), and each leaves a record in
+// the apply history (kind "set" or "delete"). Failures are thrown through
 // ThrowException with the codes named below; a plugin's failure travels as
 // code 2084 whose message carries the plugin's ErrorInfo (PluginErrorOf).
 #pragma once
@@ -90,21 +92,6 @@ HOXCM_API ImpactResult CheckImpact(Document& desiredDocument, const Document& cu
                                    std::shared_ptr<TaskHandle> taskHandle = TaskHandle::Dummy(),
                                    ImpactReasons* reasons = nullptr);
 
-// What SetConfig and DeleteConfig did; the numbering is ApplyStatus's.
-enum HostConfigStatus : int32_t {
-  HOST_CONFIG_COMPLETED = 0,                      // applied to the running host, or nothing had to change
-  HOST_CONFIG_PENDING_REBOOT = 1,                 // staged: the next boot applies it
-  HOST_CONFIG_COMPLETED_IN_MAINTENANCE_MODE = 2,  // applied while the host is in maintenance mode
-};
-
-struct HOXCM_API HostConfigResult {
-  HostConfigStatus status = HOST_CONFIG_COMPLETED;
-  // Empty unless the task was aborted: then
-  // "com.tarvik.hox.settings.apply.plugin.aborted" with the plugin that did
-  // not run; the plugins before it have applied their part.
-  ErrorInfo errorInfo;
-};
-
 // Applies or stages the change that GenerateSetDocuments described and
 // CheckImpact judged, for the item (component, group, key):
 //   - boot mode not 0 (a staged change waits for a boot): HostNotInNBM 2029;
@@ -118,21 +105,28 @@ struct HOXCM_API HostConfigResult {
 //   - impact 2: `stagedValue` replaces the item in the desired configuration
 //     and boot mode becomes 4, in one store transaction; the host is not
 //     touched.
-HOXCM_API HostConfigResult SetConfig(const Document& currentDocument, Document& desiredDocument,
+// Returns the status as Apply does (APPLY_COMPLETED, also when nothing had
+// to change; APPLY_COMPLETED_IN_MAINTENANCE_MODE; APPLY_PENDING_REBOOT) and,
+// when the task was aborted, errorInfo "com.tarvik.hox.settings.apply.plugin.
+// aborted" with the plugin that did not run (none when the wait for the host
+// was aborted); the plugins before it have applied their part. Unlike
+// Apply, a plugin's failure is thrown.
+HOXCM_API ApplyResult SetConfig(const Document& currentDocument, Document& desiredDocument,
                                      const Document& stagedValue, const ImpactResult& impactResult,
                                      const std::string& component, const std::string& group,
                                      const std::string& key,
                                      std::shared_ptr<TaskHandle> taskHandle = TaskHandle::Dummy());
 
 // Removes the configuration of a singleton item through its plugin (a
-// "DELETE" run); nothing happens when the host has none. Throws
+// "DELETE" run); nothing happens when the host has none. Returns as
+// SetConfig does. Throws
 // ConfigManagerException 2180, 2001, 2181 (as GetConfig), 2027 (the key's
 // default may be changed but never deleted), 2084 (no plugin applies the
 // item, or the plugin failed: its ErrorInfo); InvalidArgumentException 2021
 // (no schema), 2022 (a multi-instance key: set its instances instead);
 // HostNotInNBM 2029 (a staged change waits for a boot); HostNotInMM 2026
 // (the key's schema requires maintenance mode to delete it).
-HOXCM_API HostConfigResult DeleteConfig(const std::string& component, const std::string& group,
+HOXCM_API ApplyResult DeleteConfig(const std::string& component, const std::string& group,
                                         const std::string& key,
                                         std::shared_ptr<TaskHandle> taskHandle = TaskHandle::Dummy());
 

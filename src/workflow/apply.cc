@@ -23,33 +23,6 @@ namespace {
 constexpr const char* kApplyAborted = "com.tarvik.hox.settings.apply.plugin.aborted";
 constexpr const char* kImpactAborted = "com.tarvik.hox.settings.impact.plugin.aborted";
 
-// The runner of an operation, once the host is its own: null when the task
-// was aborted while another apply held the host.
-using RunnerSource = std::function<PluginRunner*(TaskHandle& task)>;
-
-// A source that takes the host run lock for `task` (saying so when it must
-// wait) and hands out `runner`, or a LaunchingRunner on that lock when
-// `runner` is null. The lock is held as long as the source lives.
-class LockingSource {
- public:
-  explicit LockingSource(PluginRunner* runner) : given_(runner) {}
-  PluginRunner* operator()(TaskHandle& task) {
-    lock_ = LaunchingRunner::LockHost({[&task] {
-                                         CSLogger::Log(CSLogger::kInfo, "Waiting for another apply to finish.");
-                                         task.AddNotification()->PluginInfo(kApplyWaitingForHost, {});
-                                       },
-                                       [&task] { return task.IsAborted(); }});
-    if (!lock_) return nullptr;
-    if (given_ != nullptr) return given_;
-    return &launching_.emplace(*lock_);
-  }
-
- private:
-  PluginRunner* const given_;
-  std::unique_ptr<HoxPlatform::HostRunLock> lock_;
-  std::optional<LaunchingRunner> launching_;  // runs under lock_, so declared after it
-};
-
 QUICK_BOOT_STATUS QuickBootStatus() {
   if (HostCtl::System::LoadHox::IsSTMSupported()) return QUICK_BOOT_STM_SUPPORTED;
   return HostCtl::System::LoadHox::IsSupported() ? QUICK_BOOT_SUPPORTED : QUICK_BOOT_NOT_SUPPORTED;
@@ -159,24 +132,9 @@ ApplyResult ApplyWith(const std::shared_ptr<CheckApplyResult>& check, std::share
   CSLogger::Log(CSLogger::kDetail, "Apply operation completed.");
   if (!task) task = TaskHandle::Dummy();
   ApplyHistoryRecord record;
-  record.kind = "apply";
-  record.startedAt = static_cast<int64_t>(std::time(nullptr));
-  const auto start = std::chrono::steady_clock::now();
-  const auto append = [&record, &start] {
-    record.seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
-    AppendApplyHistoryOrLog(record);
-  };
-  try {
-    bool compliant = false;
-    const ApplyResult result = ApplySteps(check, task, source, record, compliant);
-    RecordResult(record, result, compliant);
-    append();
-    return result;
-  } catch (...) {
-    RecordException(record, std::current_exception());
-    append();
-    throw;
-  }
+  return RecordOperation("apply", record, [&](bool& compliant) {
+    return ApplySteps(check, task, source, record, compliant);
+  });
 }
 
 }  // namespace

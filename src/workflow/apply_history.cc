@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <array>
 #include <chrono>
+#include <ctime>
 #include <string_view>
 
 #include <hoxcm/config_store.h>
@@ -276,9 +277,32 @@ void RecordException(ApplyHistoryRecord& record, const std::exception_ptr& error
     record.errorText = "unknown exception";
   }
   const int code = record.errorCode;
-  record.outcome = code == InvalidApplyInput || code == ImpactResultNotApplicable || code == HostNotInMaintenanceMode
+  record.outcome = code == InvalidApplyInput || code == ImpactResultNotApplicable ||
+                           code == HostNotInMaintenanceMode || code == PendingDesiredConfiguration
                        ? "refused"
                        : "error";
+}
+
+ApplyResult RecordOperation(const char* kind, ApplyHistoryRecord& record,
+                            const std::function<ApplyResult(bool& nothingToDo)>& operation) {
+  record.kind = kind;
+  record.startedAt = static_cast<int64_t>(std::time(nullptr));
+  const auto start = std::chrono::steady_clock::now();
+  const auto append = [&record, &start] {
+    record.seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+    AppendApplyHistoryOrLog(record);
+  };
+  try {
+    bool nothingToDo = false;
+    const ApplyResult result = operation(nothingToDo);
+    RecordResult(record, result, nothingToDo);
+    append();
+    return result;
+  } catch (...) {
+    RecordException(record, std::current_exception());
+    append();
+    throw;
+  }
 }
 
 int64_t AppendApplyHistory(const ApplyHistoryRecord& record, std::size_t keep) {

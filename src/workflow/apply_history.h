@@ -1,7 +1,7 @@
 // Filling apply history records (operations.h) from what an operation
 // computed, and appending them with a bound of the caller's choosing.
-// Apply records itself; boot-time apply builds its record with the same
-// pieces: the verdict, the runs of RemediateHostRuns, the outcome.
+// Apply records itself; boot-time apply and the host API's changes build
+// their records with the same pieces: the verdict, the runs, the outcome.
 //
 // Thread safety: the functions touch only their arguments and the store,
 // whose connection serialises its own use.
@@ -10,6 +10,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <exception>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -27,9 +28,16 @@ std::vector<ApplyHistoryRun> HistoryRuns(const std::vector<GroupRun>& runs);
 // The outcome of an operation that returned `result` ("nothing to do" when
 // the host already complied: `compliant`).
 void RecordResult(ApplyHistoryRecord& record, const ApplyResult& result, bool compliant);
-// The outcome of an operation that threw `error`: "refused" for 2024, 2025
-// and 2026, "error" otherwise.
+// The outcome of an operation that threw `error`: "refused" for 2024, 2025,
+// 2026 and 2029, "error" otherwise.
 void RecordException(ApplyHistoryRecord& record, const std::exception_ptr& error);
+
+// Runs `operation` and appends `record` to the history whatever happens:
+// `kind`, the start and the wall time, then the outcome of the result it
+// returns (`nothingToDo` set by it: "nothing to do") or of the exception it
+// throws, which goes on to the caller. The operation fills in the rest.
+ApplyResult RecordOperation(const char* kind, ApplyHistoryRecord& record,
+                            const std::function<ApplyResult(bool& nothingToDo)>& operation);
 
 // AppendApplyHistory keeping the `keep` newest records.
 int64_t AppendApplyHistory(const ApplyHistoryRecord& record, std::size_t keep);

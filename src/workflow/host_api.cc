@@ -2,8 +2,10 @@
 // change applied at once or staged for the next boot (SetConfig), and the
 // removal of a singleton's configuration (DeleteConfig). Live changes are
 // planned and run as remediation plans, with remediation's log lines,
-// notifications and progress.
+// notifications and progress, under the host run lock (waiting for another
+// apply as Apply does); every change leaves a record in the apply history.
 #include <algorithm>
+#include <functional>
 #include <list>
 #include <optional>
 #include <string>
@@ -14,6 +16,8 @@
 #include <hoxcm/host.h>
 #include <hoxcm/host_documents.h>
 
+#include "workflow/apply.h"
+#include "workflow/apply_history.h"
 #include "workflow/host_api.h"
 #include "workflow/impact.h"
 #include "workflow/remediation.h"
@@ -36,38 +40,44 @@ void RequireNormalBootMode() {
   ThrowException<HostNotInMM>(HostNotInMaintenanceMode);
 }
 
-// Runs a plan that changes one item. A plan in which no plugin runs would
-// change nothing, which the caller asked for by name: that is the plugin
-// error "not found". A failing plugin is thrown; an abort is returned.
-HostConfigResult RunItemPlan(const RemediationPlan& plan, const std::vector<DesiredConfigInput>& tasks,
-                             PluginRunner& runner, const std::shared_ptr<TaskHandle>& task) {
+ApplyResult Aborted(std::vector<std::string> args) {
+  ApplyResult result;
+  result.errorInfo = ErrorInfo(kAborted, std::move(args), "");
+  return result;
+}
+
+// Runs a plan that changes one item; its runs go into `record`. A plan in
+// which no plugin runs would change nothing, which the caller asked for by
+// name: that is the plugin error "not found". A plugin's error or an abort
+// is returned.
+ApplyResult RunItemPlan(const std::vector<DesiredConfigInput>& tasks, PluginRunner& runner,
+                             const std::shared_ptr<TaskHandle>& task, ApplyHistoryRecord& record) {
+  PluginManager registry(APPLY);
+  const RemediationPlan plan = PlanRemediation(tasks, RegistryOwners(registry), registry.GetDependencies(), false);
   if (plan.groups.empty()) {
     const std::string id = tasks.front().object->GetConfigStoreObjectId().toString();
     const std::string& action = tasks.front().action;
     CSLogger::Log(CSLogger::kError, "Couldn't find the plugin %s for operation %s", id.c_str(), action.c_str());
-    ThrowPluginError(ErrorInfo(kPluginNotFound, {id, action}, "Couldn't find the plugin " + id + " for operation " + action));
+    ApplyResult missing;
+    missing.errorInfo = ErrorInfo(kPluginNotFound, {id, action}, "Couldn't find the plugin " + id + " for operation " + action);
+    return missing;
   }
   RemediationOutcome outcome = RunRemediation(plan, runner, "", task);
-  HostConfigResult result;
+  record.runs = HistoryRuns(outcome.runs);
   if (outcome.error.id == kAborted) {
     // Named after the plugin that did not run (none when every one ran).
     std::list<std::string> next;
     if (outcome.runs.size() < plan.groups.size()) next.push_back(plan.groups[outcome.runs.size()].pluginId);
     task->AddNotification()->PluginInfo(kAborted, next);
-    result.errorInfo = ErrorInfo(kAborted, {next.begin(), next.end()}, "");
-    return result;
+    return Aborted({next.begin(), next.end()});
   }
-  if (!outcome.error.id.empty()) ThrowPluginError(outcome.error);
+  ApplyResult result;
+  result.errorInfo = std::move(outcome.error);
   return result;
 }
 
-RemediationPlan PlanItem(const std::vector<DesiredConfigInput>& tasks) {
-  PluginManager registry(APPLY);
-  return PlanRemediation(tasks, RegistryOwners(registry), registry.GetDependencies(), false);
-}
-
-HostConfigResult ApplyNow(const Document& currentDocument, Document& desiredDocument, PluginRunner& runner,
-                          const std::shared_ptr<TaskHandle>& task) {
+ApplyResult ApplyNow(const Document& currentDocument, Document& desiredDocument, PluginRunner& runner,
+                          const std::shared_ptr<TaskHandle>& task, ApplyHistoryRecord& record, bool& nothingToDo) {
   HoxConfigStore::SetBootMode(HoxConfigStore::BOOTMODE_NORMAL);
   CSLogger::Log(CSLogger::kInfo, "Remediating HOXi host to desired configuration ");
   CSLogger::Log(CSLogger::kInfo, "Generating Apply Tasks");
@@ -79,9 +89,10 @@ HostConfigResult ApplyNow(const Document& currentDocument, Document& desiredDocu
   const std::vector<DesiredConfigInput> tasks = generator.getTasks();
   if (tasks.empty()) {
     CSLogger::Log(CSLogger::kWarning, "No tasks generated for the desired configuration.");
+    nothingToDo = true;
     return {};
   }
-  return RunItemPlan(PlanItem(tasks), tasks, runner, task);
+  return RunItemPlan(tasks, runner, task, record);
 }
 
 // The staged value replaces the item in the desired configuration, and boot
@@ -115,6 +126,118 @@ bool Lists(int (HoxSchemaStore::SchemaObject::*query)(std::vector<std::string>&,
   bool propertyLevel = false;
   return (schema.*query)(operations, propertyLevel) == 0 &&
          std::find(operations.begin(), operations.end(), operation) != operations.end();
+}
+
+// Records one change in the apply history, as Apply is recorded (the host
+// API's changes are listed beside the applies), then throws a plugin's
+// error as the host API's 2084; an abort is returned.
+ApplyResult Recorded(const char* kind, ApplyHistoryRecord& record,
+                     const std::function<ApplyResult(bool& nothingToDo)>& change) {
+  ApplyResult result = RecordOperation(kind, record, change);
+  if (!result.errorInfo.id.empty() && result.errorInfo.id != kAborted) ThrowPluginError(result.errorInfo);
+  return result;
+}
+
+ApplyResult SetConfigWith(const Document& currentDocument, Document& desiredDocument,
+                               const Document& stagedValue, const ImpactResult& impactResult,
+                               const std::string& component, const std::string& group, const std::string& key,
+                               std::shared_ptr<TaskHandle> taskHandle, LockingSource source) {
+  CSLogger::Log(CSLogger::kInfo, "Running SET Config Host API");
+  const std::shared_ptr<TaskHandle> task = taskHandle ? std::move(taskHandle) : TaskHandle::Dummy();
+  ApplyHistoryRecord record;
+  record.document = DocumentDigest(desiredDocument);
+  return Recorded("set", record, [&](bool& nothingToDo) {
+    PluginRunner* runner = source(*task);
+    if (runner == nullptr) {
+      CSLogger::Log(CSLogger::kInfo, "Apply aborted, returning...");
+      return Aborted({});
+    }
+    const HostItem item = ResolveItem(component, group, key);
+    RequireUserConfiguration(item);
+    const auto db = OpenStore();
+    RequireNormalBootMode();
+    if (!impactResult.error.id.empty()) {
+      ApplyResult failed;
+      failed.errorInfo = impactResult.error;
+      return failed;
+    }
+    RecordVerdict(record, impactResult, ImpactReasons());
+    // The verdict holds for the item as it was when the documents were built.
+    const Document now = CurrentDocumentOf(item, db);
+    const Value* was = ItemOf(currentDocument, item.Id());
+    const Value* is = ItemOf(now, item.Id());
+    if ((was == nullptr) != (is == nullptr) || (was != nullptr && *was != *is)) {
+      CSLogger::Log(CSLogger::kError, "The configuration of %s changed since its documents were generated",
+                    item.Path().c_str());
+      ThrowException<InvalidImpact>(ImpactResultNotApplicable);
+    }
+
+    ApplyResult result;
+    switch (impactResult.impact) {
+      case IMPACT_REBOOT_REQUIRED:
+        Stage(item, db, stagedValue);
+        result.status = APPLY_PENDING_REBOOT;
+        break;
+      case IMPACT_MAINTENANCE_MODE_REQUIRED:
+        if (!IsMaintenanceModeEnabled()) ThrowNotInMaintenanceMode();
+        result = ApplyNow(currentDocument, desiredDocument, *runner, task, record, nothingToDo);
+        if (result.errorInfo.id.empty()) result.status = APPLY_COMPLETED_IN_MAINTENANCE_MODE;
+        break;
+      case IMPACT_NONE:
+        result = ApplyNow(currentDocument, desiredDocument, *runner, task, record, nothingToDo);
+        break;
+      default:
+        ThrowNotInMaintenanceMode();
+    }
+    if (result.errorInfo.id.empty()) CSLogger::Log(CSLogger::kInfo, "Setting configuration Successful");
+    return result;
+  });
+}
+
+ApplyResult DeleteConfigWith(const std::string& component, const std::string& group, const std::string& key,
+                                  std::shared_ptr<TaskHandle> taskHandle, LockingSource source) {
+  CSLogger::Log(CSLogger::kDetail, "%s invoked", "DeleteConfig");
+  const std::shared_ptr<TaskHandle> task = taskHandle ? std::move(taskHandle) : TaskHandle::Dummy();
+  ApplyHistoryRecord record;
+  return Recorded("delete", record, [&](bool& nothingToDo) {
+    const HostItem item = ResolveItem(component, group, key);
+    // Instances are removed by setting the key's instances without them.
+    if (item.schema->IsMultiInstance()) ThrowException<InvalidArgumentException>(NotSingletonObject, item.Path());
+    const auto db = OpenStore();
+    RequireUserConfiguration(item);
+    if (item.schema->IsMutableDefault()) {
+      ThrowException<ConfigManagerException>(DeleteDefaultNotSupported, item.schema->GetId().toString());
+    }
+    PluginRunner* runner = source(*task);
+    if (runner == nullptr) {
+      CSLogger::Log(CSLogger::kInfo, "Apply aborted, returning...");
+      return Aborted({});
+    }
+    RequireNormalBootMode();
+    const bool maintenance =
+        Lists(&HoxSchemaStore::SchemaObject::GetMaintenanceModeOperations, *item.schema, "DELETE");
+    if (maintenance && !IsMaintenanceModeEnabled()) ThrowNotInMaintenanceMode();
+    if (Lists(&HoxSchemaStore::SchemaObject::GetRebootOperations, *item.schema, "DELETE")) {
+      // A removal cannot be staged: the boot-time apply only adds and sets.
+      CSLogger::Log(CSLogger::kWarning, "The removal of %s takes effect at the next boot", item.Path().c_str());
+    }
+
+    const Document current = CurrentDocumentOf(item, db);
+    const Value* now = ItemOf(current, item.Id());
+    if (now == nullptr) {
+      CSLogger::Log(CSLogger::kInfo, "No configuration to delete for %s", item.Path().c_str());
+      nothingToDo = true;
+      return ApplyResult();
+    }
+    const std::vector<DesiredConfigInput> tasks{
+        {HoxConfigStore::CreateObject(item.Id(), *now, item.schema), nullptr, ActionName(DELETE)}};
+    ApplyResult result = RunItemPlan(tasks, *runner, task, record);
+    if (result.errorInfo.id.empty()) {
+      if (maintenance) result.status = APPLY_COMPLETED_IN_MAINTENANCE_MODE;
+      CSLogger::Log(CSLogger::kInfo, "Deleting configuration Successful");
+    }
+    return result;
+  });
 }
 
 }  // namespace
@@ -157,97 +280,28 @@ ImpactResult CheckImpact(Document& desiredDocument, const Document& currentDocum
   return result;
 }
 
-HostConfigResult SetConfig(const Document& currentDocument, Document& desiredDocument, const Document& stagedValue,
+ApplyResult SetConfig(const Document& currentDocument, Document& desiredDocument, const Document& stagedValue,
                            const ImpactResult& impactResult, const std::string& component, const std::string& group,
                            const std::string& key, std::shared_ptr<TaskHandle> taskHandle) {
-  const HoxPlatform::HostRunLock lock = LaunchingRunner::LockHost();
-  LaunchingRunner runner(lock);
-  return SetConfig(currentDocument, desiredDocument, stagedValue, impactResult, component, group, key,
-                   std::move(taskHandle), runner);
+  return SetConfigWith(currentDocument, desiredDocument, stagedValue, impactResult, component, group, key,
+                       std::move(taskHandle), LockingSource(nullptr));
 }
 
-HostConfigResult SetConfig(const Document& currentDocument, Document& desiredDocument, const Document& stagedValue,
+ApplyResult SetConfig(const Document& currentDocument, Document& desiredDocument, const Document& stagedValue,
                            const ImpactResult& impactResult, const std::string& component, const std::string& group,
                            const std::string& key, std::shared_ptr<TaskHandle> taskHandle, PluginRunner& runner) {
-  CSLogger::Log(CSLogger::kInfo, "Running SET Config Host API");
-  const std::shared_ptr<TaskHandle> task = taskHandle ? std::move(taskHandle) : TaskHandle::Dummy();
-  const HostItem item = ResolveItem(component, group, key);
-  RequireUserConfiguration(item);
-  const auto db = OpenStore();
-  RequireNormalBootMode();
-  if (!impactResult.error.id.empty()) ThrowPluginError(impactResult.error);
-  // The verdict holds for the item as it was when the documents were built.
-  const Document now = CurrentDocumentOf(item, db);
-  const Value* was = ItemOf(currentDocument, item.Id());
-  const Value* is = ItemOf(now, item.Id());
-  if ((was == nullptr) != (is == nullptr) || (was != nullptr && *was != *is)) {
-    CSLogger::Log(CSLogger::kError, "The configuration of %s changed since its documents were generated",
-                  item.Path().c_str());
-    ThrowException<InvalidImpact>(ImpactResultNotApplicable);
-  }
-
-  HostConfigResult result;
-  switch (impactResult.impact) {
-    case IMPACT_REBOOT_REQUIRED:
-      Stage(item, db, stagedValue);
-      result.status = HOST_CONFIG_PENDING_REBOOT;
-      break;
-    case IMPACT_MAINTENANCE_MODE_REQUIRED:
-      if (!IsMaintenanceModeEnabled()) ThrowNotInMaintenanceMode();
-      result = ApplyNow(currentDocument, desiredDocument, runner, task);
-      if (result.errorInfo.id.empty()) result.status = HOST_CONFIG_COMPLETED_IN_MAINTENANCE_MODE;
-      break;
-    case IMPACT_NONE:
-      result = ApplyNow(currentDocument, desiredDocument, runner, task);
-      break;
-    default:
-      ThrowNotInMaintenanceMode();
-  }
-  if (result.errorInfo.id.empty()) CSLogger::Log(CSLogger::kInfo, "Setting configuration Successful");
-  return result;
+  return SetConfigWith(currentDocument, desiredDocument, stagedValue, impactResult, component, group, key,
+                       std::move(taskHandle), LockingSource(&runner));
 }
 
-HostConfigResult DeleteConfig(const std::string& component, const std::string& group, const std::string& key,
+ApplyResult DeleteConfig(const std::string& component, const std::string& group, const std::string& key,
                               std::shared_ptr<TaskHandle> taskHandle) {
-  const HoxPlatform::HostRunLock lock = LaunchingRunner::LockHost();
-  LaunchingRunner runner(lock);
-  return DeleteConfig(component, group, key, std::move(taskHandle), runner);
+  return DeleteConfigWith(component, group, key, std::move(taskHandle), LockingSource(nullptr));
 }
 
-HostConfigResult DeleteConfig(const std::string& component, const std::string& group, const std::string& key,
+ApplyResult DeleteConfig(const std::string& component, const std::string& group, const std::string& key,
                               std::shared_ptr<TaskHandle> taskHandle, PluginRunner& runner) {
-  CSLogger::Log(CSLogger::kDetail, "%s invoked", "DeleteConfig");
-  const std::shared_ptr<TaskHandle> task = taskHandle ? std::move(taskHandle) : TaskHandle::Dummy();
-  const HostItem item = ResolveItem(component, group, key);
-  // Instances are removed by setting the key's instances without them.
-  if (item.schema->IsMultiInstance()) ThrowException<InvalidArgumentException>(NotSingletonObject, item.Path());
-  const auto db = OpenStore();
-  RequireUserConfiguration(item);
-  if (item.schema->IsMutableDefault()) {
-    ThrowException<ConfigManagerException>(DeleteDefaultNotSupported, item.schema->GetId().toString());
-  }
-  RequireNormalBootMode();
-  const bool maintenance = Lists(&HoxSchemaStore::SchemaObject::GetMaintenanceModeOperations, *item.schema, "DELETE");
-  if (maintenance && !IsMaintenanceModeEnabled()) ThrowNotInMaintenanceMode();
-  if (Lists(&HoxSchemaStore::SchemaObject::GetRebootOperations, *item.schema, "DELETE")) {
-    // A removal cannot be staged: the boot-time apply only adds and sets.
-    CSLogger::Log(CSLogger::kWarning, "The removal of %s takes effect at the next boot", item.Path().c_str());
-  }
-
-  const Document current = CurrentDocumentOf(item, db);
-  const Value* now = ItemOf(current, item.Id());
-  if (now == nullptr) {
-    CSLogger::Log(CSLogger::kInfo, "No configuration to delete for %s", item.Path().c_str());
-    return {};
-  }
-  const std::vector<DesiredConfigInput> tasks{
-      {HoxConfigStore::CreateObject(item.Id(), *now, item.schema), nullptr, ActionName(DELETE)}};
-  HostConfigResult result = RunItemPlan(PlanItem(tasks), tasks, runner, task);
-  if (result.errorInfo.id.empty()) {
-    if (maintenance) result.status = HOST_CONFIG_COMPLETED_IN_MAINTENANCE_MODE;
-    CSLogger::Log(CSLogger::kInfo, "Deleting configuration Successful");
-  }
-  return result;
+  return DeleteConfigWith(component, group, key, std::move(taskHandle), LockingSource(&runner));
 }
 
 }  // namespace HoxConfigManager

@@ -1,8 +1,8 @@
 // The single-item host API's shared pieces, and its operations with the
 // plugin runner as a parameter: the production overloads in
-// <hoxcm/host_api.h> take the host run lock and run plugins through a
-// LaunchingRunner under it; tests pass a FakePluginRunner (and take no
-// lock).
+// <hoxcm/host_api.h> run plugins through a LaunchingRunner on the host run
+// lock they take; tests pass a FakePluginRunner. Both take the lock, as
+// Apply does.
 //
 // Thread safety: as the operations; nothing here holds state.
 #pragma once
@@ -53,14 +53,13 @@ Document CurrentDocumentOf(const HostItem& item, const std::shared_ptr<HoxConfig
 // Throws ConfigManagerException 2084 carrying `error` (see PluginErrorOf).
 [[noreturn]] void ThrowPluginError(const ErrorInfo& error);
 
-// The operations with their plugins run by `runner`, without the host run
-// lock (the public overloads hold it around these).
+// The operations with their plugins run by `runner`.
 ImpactResult CheckImpact(Document& desiredDocument, const Document& currentDocument,
                          std::shared_ptr<TaskHandle> taskHandle, ImpactReasons* reasons, PluginRunner& runner);
-HostConfigResult SetConfig(const Document& currentDocument, Document& desiredDocument, const Document& stagedValue,
+ApplyResult SetConfig(const Document& currentDocument, Document& desiredDocument, const Document& stagedValue,
                            const ImpactResult& impactResult, const std::string& component, const std::string& group,
                            const std::string& key, std::shared_ptr<TaskHandle> taskHandle, PluginRunner& runner);
-HostConfigResult DeleteConfig(const std::string& component, const std::string& group, const std::string& key,
+ApplyResult DeleteConfig(const std::string& component, const std::string& group, const std::string& key,
                               std::shared_ptr<TaskHandle> taskHandle, PluginRunner& runner);
 
 }  // namespace HoxConfigManager

@@ -62,11 +62,11 @@ class HostApiTest : public PluginTest {
     GenerateSetDocuments(c.at.component, c.at.group, c.at.key, c.current, c.desired, c.staged, value);
     return c;
   }
-  HostConfigResult Apply(Change& c) {
+  ApplyResult Apply(Change& c) {
     const ImpactResult impact = CheckImpact(c.desired, c.current, task_, nullptr, runner_);
     return SetConfig(c.current, c.desired, c.staged, impact, c.at.component, c.at.group, c.at.key, task_, runner_);
   }
-  HostConfigResult Delete(const std::string& path) {
+  ApplyResult Delete(const std::string& path) {
     const Address at = Split(path);
     return DeleteConfig(at.component, at.group, at.key, task_, runner_);
   }
@@ -156,7 +156,7 @@ TEST_F(HostApiTest, StoreGeneratedIdentitiesFollowTheContent) {
   EXPECT_EQ(c.desired["network"]["routes"]["static"], c.staged);
   EXPECT_EQ(c.current["network"]["routes"]["static"].Size(), 2u);
 
-  EXPECT_EQ(Apply(c).status, HOST_CONFIG_COMPLETED);
+  EXPECT_EQ(Apply(c).status, APPLY_COMPLETED);
   const std::vector<std::string> inputs = AppliedInputs();
   ASSERT_EQ(inputs.size(), 3u);
   EXPECT_EQ(inputs[0].substr(0, 12), "network ADD ");
@@ -183,7 +183,7 @@ TEST_F(HostApiTest, AChangeEndsAppliedAbortedStaleOrWithThePluginsError) {
   runner_.apply.clear();
   runner_.calls.clear();
   task_->aborted = true;
-  const HostConfigResult aborted = SetConfig(dns.current, dns.desired, dns.staged, ImpactResult(), "network", "dns",
+  const ApplyResult aborted = SetConfig(dns.current, dns.desired, dns.staged, ImpactResult(), "network", "dns",
                                              "config", task_, runner_);
   EXPECT_EQ(aborted.errorInfo, ErrorInfo("com.tarvik.hox.settings.apply.plugin.aborted", {"network"}, ""));
   EXPECT_EQ(task_->Events().back(), "info com.tarvik.hox.settings.apply.plugin.aborted network");
@@ -220,13 +220,13 @@ TEST_F(HostApiTest, DeleteRemovesASingletonThroughItsPluginOrSaysWhyNot) {
   for (const auto& r : refusals) EXPECT_EQ(ThrownBy([&] { Delete(r.path); }).code, r.code) << r.path;
   EXPECT_TRUE(runner_.calls.empty());
 
-  EXPECT_EQ(Delete("/services/syslog/config").status, HOST_CONFIG_COMPLETED);
+  EXPECT_EQ(Delete("/services/syslog/config").status, APPLY_COMPLETED);
   EXPECT_EQ(AppliedInputs(), (std::vector<std::string>{"services:syslog DELETE "}));
 
   // Nothing to delete: no plugin runs.
   HoxConfigStore::DeleteConfigRows(HoxConfigStore::GetDBStore(), ConfigKind::User, {"services", "syslog", "config"});
   runner_.calls.clear();
-  EXPECT_EQ(Delete("/services/syslog/config").status, HOST_CONFIG_COMPLETED);
+  EXPECT_EQ(Delete("/services/syslog/config").status, APPLY_COMPLETED);
   EXPECT_TRUE(runner_.calls.empty());
 
   // While a staged change waits for a boot, no removal either.
@@ -284,10 +284,10 @@ class HostApiEndToEndTest : public HostApiTest {
     return current;
   }
   // Validated, judged and set; the impact it was judged with.
-  IMPACT_TYPE Set(const std::string& path, const std::string& text, HostConfigResult* result = nullptr) {
+  IMPACT_TYPE Set(const std::string& path, const std::string& text, ApplyResult* result = nullptr) {
     Change c = Prepare(path, text);
     const ImpactResult impact = CheckImpact(c.desired, c.current);
-    const HostConfigResult r = SetConfig(c.current, c.desired, c.staged, impact, c.at.component, c.at.group, c.at.key);
+    const ApplyResult r = SetConfig(c.current, c.desired, c.staged, impact, c.at.component, c.at.group, c.at.key);
     if (result != nullptr) *result = r;
     return impact.impact;
   }
@@ -300,9 +300,9 @@ TEST_F(HostApiEndToEndTest, TheImpactDecidesWhetherAChangeIsAppliedStagedOrRefus
 
   // No impact: the network plugin writes the resolver file, and the store
   // records the new value.
-  HostConfigResult result;
+  ApplyResult result;
   EXPECT_EQ(Set("/network/dns/config", R"({"servers": ["10.0.0.53"]})", &result), IMPACT_NONE);
-  EXPECT_EQ(result.status, HOST_CONFIG_COMPLETED);
+  EXPECT_EQ(result.status, APPLY_COMPLETED);
   EXPECT_NE(root.ReadFile("/etc/resolv.conf").find("nameserver 10.0.0.53"), std::string::npos);
   EXPECT_EQ(Get("/network/dns/config"), R"({"servers":["10.0.0.53"]})");
 
@@ -319,7 +319,7 @@ TEST_F(HostApiEndToEndTest, TheImpactDecidesWhetherAChangeIsAppliedStagedOrRefus
   const std::string options = Get("/system/kernel/boot_options");
   EXPECT_EQ(Set("/system/kernel/boot_options", R"({"iommu": true, "hugepages": 4096, "console": "ttyS0"})", &result),
             IMPACT_REBOOT_REQUIRED);
-  EXPECT_EQ(result.status, HOST_CONFIG_PENDING_REBOOT);
+  EXPECT_EQ(result.status, APPLY_PENDING_REBOOT);
   EXPECT_FALSE(std::filesystem::exists(root.Path("/etc/tarvik/boot-options.conf")));
   EXPECT_EQ(Get("/system/kernel/boot_options"), options);
   EXPECT_EQ(JsonToString(ExtractDesiredConfiguration()),
@@ -327,6 +327,11 @@ TEST_F(HostApiEndToEndTest, TheImpactDecidesWhetherAChangeIsAppliedStagedOrRefus
   EXPECT_EQ(HoxConfigStore::GetBootMode(), HoxConfigStore::BOOTMODE_DESIRED_STAGED);
   EXPECT_EQ(ThrownBy([&] { Set("/network/dns/config", R"({"servers": ["10.0.0.54"]})"); }).code, 2029);
   EXPECT_EQ(Get("/network/dns/config"), R"({"servers":["10.0.0.53"]})");
+
+  // Each change is in the apply history.
+  std::vector<std::string> history;
+  for (const ApplyHistoryRecord& r : GetApplyHistory()) history.push_back(r.kind + " " + r.outcome);
+  EXPECT_EQ(history, (std::vector<std::string>{"set applied", "set refused", "set staged", "set refused"}));
 }
 
 TEST_F(HostApiEndToEndTest, AValueSetHereBehavesTheSameInAnExportedDocument) {

@@ -19,7 +19,7 @@
 namespace hoxcfg {
 namespace {
 
-using HoxConfigManager::HostConfigResult;
+using HoxConfigManager::ApplyResult;
 using HoxConfigManager::ImpactResult;
 
 constexpr const char* kItemHelp = "The item: COMPONENT/GROUP/KEY (a singleton's object, or a key's instances)";
@@ -125,8 +125,8 @@ Answer OutcomeAnswer(const std::shared_ptr<Outcome>& o) {
 // Runs a change of the host: an abort is exit 130, a plugin's failure exit 1;
 // the audit line is written whatever happened once the change began.
 int RunChange(const GlobalOptions& options, const std::shared_ptr<Outcome>& outcome, const std::string& what,
-              const std::function<HostConfigResult()>& change) {
-  HostConfigResult result;
+              const std::function<ApplyResult()>& change) {
+  ApplyResult result;
   try {
     InterruptWatch watch;
     result = change();
@@ -144,14 +144,14 @@ int RunChange(const GlobalOptions& options, const std::shared_ptr<Outcome>& outc
     return kExitAborted;
   }
   if (outcome->status.empty()) {
-    outcome->status = result.status == HoxConfigManager::HOST_CONFIG_PENDING_REBOOT ? "staged"
-                      : result.status == HoxConfigManager::HOST_CONFIG_COMPLETED_IN_MAINTENANCE_MODE
+    outcome->status = result.status == HoxConfigManager::APPLY_PENDING_REBOOT ? "staged"
+                      : result.status == HoxConfigManager::APPLY_COMPLETED_IN_MAINTENANCE_MODE
                           ? "applied in maintenance mode"
                           : "applied";
   }
   AuditChange(what + " " + outcome->item + " " + outcome->status);
   Print(options, OutcomeAnswer(outcome));
-  return result.status == HoxConfigManager::HOST_CONFIG_PENDING_REBOOT ? kExitStaged : kExitOk;
+  return result.status == HoxConfigManager::APPLY_PENDING_REBOOT ? kExitStaged : kExitOk;
 }
 
 void RegisterGet(CLI::App& app, GlobalOptions& options) {
