@@ -35,6 +35,9 @@ show 0 "Remove a singleton's configuration through its plugin" delete services/s
 show 2 "A default that may change but never go cannot be removed" delete services/time/ntp --yes
 show 3 "More huge pages need a reboot: staged for the next boot (exit 3), the host untouched" \
   set system/kernel/boot_options --yes --value '{"iommu": true, "hugepages": 4096, "console": "ttyS0"}'
-show 0 "The staged change, waiting for the boot-time apply" show desired
+echo
+echo "== The staged change, waiting for the boot-time apply"
+echo "\$ hoxcfg show desired | grep hugepages"
+"$hoxcfg" show desired | grep hugepages
 show 2 "Until the host has booted, every further change is refused (error 2029)" \
   set network/dns/config --yes --value '{"servers": ["10.0.0.54"]}'

@@ -39,7 +39,7 @@ TEST(HoxcfgItemTest, GetSetAndDeleteAnswerWithTheirExitStatuses) {
   EXPECT_EQ(RunHoxcfg(root, dns).exitCode, 2);
   r = RunHoxcfg(root, dns + " --yes");
   EXPECT_EQ(r.exitCode, 0);
-  EXPECT_EQ(r.out, "/network/dns/config: applied\n");
+  EXPECT_EQ(r.out, "/network/dns/config: needs neither a reboot nor maintenance mode\n/network/dns/config: applied\n");
   EXPECT_EQ(RunHoxcfg(root, dns + " --yes").out, "/network/dns/config: unchanged\n");
 
   r = RunHoxcfg(root, "delete services/syslog/config --yes");
@@ -51,8 +51,10 @@ TEST(HoxcfgItemTest, GetSetAndDeleteAnswerWithTheirExitStatuses) {
   r = RunHoxcfg(root, "set system/kernel/boot_options --yes --json --compact --value "
                       R"('{"iommu": true, "hugepages": 4096, "console": "ttyS0"}')");
   EXPECT_EQ(r.exitCode, 3);
-  EXPECT_EQ(r.out, R"({"item":"/system/kernel/boot_options","status":"staged","impact":"reboot","reasons":)"
-                   R"(["reboot: /system/kernel/boot_options/hugepages: 2048 -> 4096"]})" "\n");
+  EXPECT_EQ(r.out, R"({"item":"/system/kernel/boot_options","status":"staged","impact":2,"reasons":[{"component":)"
+                   R"("system","group":"kernel","key":"boot_options","instance":"","action":"SET","impact":2,)"
+                   R"("reasons":[{"rule":"property","impact":2,"path":"/system/kernel/boot_options/hugepages",)"
+                   R"("oldValue":"2048","newValue":"4096"}]}]})" "\n");
   EXPECT_TRUE(Has(RunHoxcfg(root, "show desired --compact").out, R"("hugepages":4096)"));
   r = RunHoxcfg(root, R"(set network/dns/config --yes --value '{"servers": ["10.0.0.54"]}')");
   EXPECT_EQ(r.exitCode, 2);

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <functional>
+#include <iostream>
 #include <memory>
 #include <string>
 #include <vector>
@@ -23,7 +24,6 @@ using HoxConfigManager::ApplyResult;
 using HoxConfigManager::ImpactResult;
 
 constexpr const char* kItemHelp = "The item: COMPONENT/GROUP/KEY (a singleton's object, or a key's instances)";
-constexpr const char* kAbortedId = "com.tarvik.hox.settings.apply.plugin.aborted";
 
 struct Item {
   std::string component, group, key;
@@ -62,81 +62,50 @@ rapidjson::Document Shown(const Item& item, const std::string& json, bool clear)
   return masked;
 }
 
-const char* ImpactName(int impact) {
-  switch (impact) {
-    case HoxConfigManager::IMPACT_NONE: return "none";
-    case HoxConfigManager::IMPACT_MAINTENANCE_MODE_REQUIRED: return "maintenance mode";
-    default: return "reboot";
-  }
-}
-
-// "reboot: /system/kernel/boot_options/hugepages: 2048 -> 4096", one line a
-// reason; values are masked by the library.
-std::vector<std::string> ReasonLines(const HoxConfigManager::ImpactReasons& reasons) {
-  std::vector<std::string> lines;
-  for (const auto& object : reasons.objects) {
-    for (const auto& r : object.reasons) {
-      std::string line = std::string(ImpactName(r.impact)) + ": ";
-      if (r.rule == HoxConfigManager::ImpactReason::Rule::kPlugin) {
-        line += "plugin " + r.plugin + ": " + r.reason;
-      } else if (r.rule == HoxConfigManager::ImpactReason::Rule::kOperation) {
-        line += object.action + " " + ItemName(object.id.component, object.id.group, object.id.key, object.id.instanceId);
-      } else {
-        line += r.path + ": " + (r.oldValue.empty() ? "(none)" : r.oldValue) + " -> " +
-                (r.newValue.empty() ? "(none)" : r.newValue);
-      }
-      lines.push_back(std::move(line));
-    }
-  }
-  return lines;
-}
-
 // The answer of set and delete: the item, what was decided and why.
 struct Outcome {
   std::string item;
   std::string status;  // "unchanged", "applied", "applied in maintenance mode", "staged", "deleted", ...
-  std::string impact;  // set only
-  std::vector<std::string> reasons;
+  // set only: the impact (-1 for delete) and its reasons, in the shape of `hoxcfg impact --json`
+  int impact = -1;
+  rapidjson::Document reasons;
 };
 
 Answer OutcomeAnswer(const std::shared_ptr<Outcome>& o) {
   return {[o] {
-            std::string text = o->item + ": " + o->status;
-            if (o->status == "staged") text += " for the next boot: reboot the host to apply it";
-            text += "\n";
-            for (const std::string& r : o->reasons) text += "  " + r + "\n";
-            return text;
+            if (o->status == "staged") return o->item + ": staged for the next boot: reboot the host to apply it\n";
+            return o->item + ": " + o->status + "\n";
           },
           [o] {
             rapidjson::Document out(rapidjson::kObjectType);
             auto& a = out.GetAllocator();
             out.AddMember("item", rapidjson::Value(o->item, a), a);
             out.AddMember("status", rapidjson::Value(o->status, a), a);
-            if (!o->impact.empty()) {
-              out.AddMember("impact", rapidjson::Value(o->impact, a), a);
-              rapidjson::Value reasons(rapidjson::kArrayType);
-              for (const std::string& r : o->reasons) reasons.PushBack(rapidjson::Value(r, a), a);
-              out.AddMember("reasons", reasons, a);
+            if (o->impact >= 0) {
+              out.AddMember("impact", o->impact, a);
+              out.AddMember("reasons", rapidjson::Value(o->reasons, a), a);
             }
             return out;
           }};
 }
 
-// Runs a change of the host: an abort is exit 130, a plugin's failure exit 1;
-// the audit line is written whatever happened once the change began.
-int RunChange(const GlobalOptions& options, const std::shared_ptr<Outcome>& outcome, const std::string& what,
-              const std::function<ApplyResult()>& change) {
+// Runs a change of the host under the caller's InterruptWatch: an abort is
+// exit 130, a plugin's failure exit 1; the audit line is written whatever
+// happened once the change began.
+int RunChange(const GlobalOptions& options, const Progress& progress, const std::shared_ptr<Outcome>& outcome,
+              const std::string& what, const std::function<ApplyResult()>& change) {
   ApplyResult result;
   try {
-    InterruptWatch watch;
     result = change();
   } catch (const HoxConfigStore::ConfigStoreException& e) {
+    progress.Hide();
     const auto error = HoxConfigManager::PluginErrorOf(e);
     if (!error) throw;
     AuditChange(what + " " + outcome->item + " failed");
     throw Failure("plugin error " + error->id + (error->message.empty() ? "" : ": " + error->message),
                   "the item may be partly changed; `hoxcfg get " + outcome->item + "` shows it", kExitNegative);
   }
+  progress.Hide();
   if (!result.errorInfo.id.empty()) {
     outcome->status = "aborted";
     AuditChange(what + " " + outcome->item + " aborted");
@@ -152,6 +121,16 @@ int RunChange(const GlobalOptions& options, const std::shared_ptr<Outcome>& outc
   AuditChange(what + " " + outcome->item + " " + outcome->status);
   Print(options, OutcomeAnswer(outcome));
   return result.status == HoxConfigManager::APPLY_PENDING_REBOOT ? kExitStaged : kExitOk;
+}
+
+// Asks as `hoxcfg apply` asks: Ctrl-C at the question is an abort (130).
+void ConfirmChange(const GlobalOptions& options, const std::string& plan) {
+  try {
+    Confirm(options, plan);
+  } catch (const Failure&) {
+    if (InterruptWatch::Interrupted()) throw Failure("aborted: nothing was changed", "", kExitAborted);
+    throw;
+  }
 }
 
 void RegisterGet(CLI::App& app, GlobalOptions& options) {
@@ -214,9 +193,10 @@ void RegisterSet(CLI::App& app, GlobalOptions& options) {
   auto* cmd = AddCommand(app, "set", "Set one item: applied now, or staged for the next boot when it needs a reboot",
                          {{kExitOk, "applied (or the item had the value already)"},
                           {kExitNegative, "the value is not valid (each finding is listed), or a plugin failed"},
-                          {kExitUsage, kUsageStatus},
-                          {kExitStaged, "staged for the next boot: it needs a reboot"},
-                          {kExitAborted, "aborted with Ctrl-C"}});
+                          {kExitUsage, kUsageStatus + std::string(" (maintenance mode is required and not entered, "
+                                                                   "or a staged change waits for a reboot)")},
+                          {kExitStaged, "the change needs a reboot: staged for the next boot"},
+                          {kExitAborted, "interrupted (Ctrl-C): the running plugin was stopped"}});
   auto item = std::make_shared<std::string>();
   auto value = std::make_shared<std::string>();
   auto file = std::make_shared<std::string>();
@@ -241,38 +221,42 @@ void RegisterSet(CLI::App& app, GlobalOptions& options) {
 
     rapidjson::Document current, desired, staged;
     HoxConfigManager::GenerateSetDocuments(at.component, at.group, at.key, current, desired, staged, parsed);
-    const auto task = MakeTask(options, *events);
+    InterruptWatch watch;
+    // One bar, as `hoxcfg apply` shows it: the impact, then the change.
+    const Progress progress(options, *events);
     HoxConfigManager::ImpactReasons reasons;
     ImpactResult impact;
     auto outcome = std::make_shared<Outcome>();
     outcome->item = at.Name();
     try {
-      InterruptWatch watch;
-      impact = HoxConfigManager::CheckImpact(desired, current, task, &reasons);
+      impact = HoxConfigManager::CheckImpact(desired, current, progress.Task({0, 10}), &reasons);
     } catch (const HoxConfigStore::ConfigStoreException& e) {
+      progress.Hide();
       const auto error = HoxConfigManager::PluginErrorOf(e);
       if (!error) throw;
-      if (error->id.find(".aborted") != std::string::npos) return kExitAborted;
+      if (InterruptWatch::Interrupted()) throw Failure("aborted: nothing was changed", "", kExitAborted);
       throw Failure("impact plugin error " + error->id + (error->message.empty() ? "" : ": " + error->message), "",
                     kExitNegative);
     }
-    outcome->impact = ImpactName(impact.impact);
-    outcome->reasons = ReasonLines(reasons);
+    progress.Hide();
+    outcome->impact = impact.compliant ? HoxConfigManager::IMPACT_NONE : impact.impact;
+    HoxConfigManager::ImpactReasonsToJson(reasons, outcome->reasons, outcome->reasons.GetAllocator());
     if (impact.compliant) {
       outcome->status = "unchanged";
       Print(options, OutcomeAnswer(outcome));
       return kExitOk;
     }
-    // "stage /system/kernel/boot_options for the next boot (reboot: /system/
-    // kernel/boot_options/hugepages: 2048 -> 4096)"
-    std::string why;
-    for (const std::string& reason : outcome->reasons) why += (why.empty() ? "" : "; ") + reason;
-    if (why.empty()) why = impact.impact == HoxConfigManager::IMPACT_NONE ? "no impact" : outcome->impact;
-    Confirm(options, (impact.impact == HoxConfigManager::IMPACT_REBOOT_REQUIRED ? "stage " + outcome->item + " for the next boot"
-                                                                              : "set " + outcome->item + " now") +
-                         " (" + why + ")");
-    return RunChange(options, outcome, "set", [&] {
-      return HoxConfigManager::SetConfig(current, desired, staged, impact, at.component, at.group, at.key, task);
+    // What will happen and why, as `hoxcfg plan` says it.
+    if (!options.json && !options.quiet) {
+      std::cout << outcome->item << ": needs " << Requirement(impact.impact) << "\n"
+                << ReasonsText(reasons, desired) << std::flush;
+    }
+    ConfirmChange(options, impact.impact == HoxConfigManager::IMPACT_REBOOT_REQUIRED
+                               ? "stage " + outcome->item + " for the next boot"
+                               : "set " + outcome->item + " now");
+    return RunChange(options, progress, outcome, "set", [&] {
+      return HoxConfigManager::SetConfig(current, desired, staged, impact, at.component, at.group, at.key,
+                                         progress.Task({10, 100}));
     });
   });
 }
@@ -281,8 +265,9 @@ void RegisterDelete(CLI::App& app, GlobalOptions& options) {
   auto* cmd = AddCommand(app, "delete", "Remove a singleton item's configuration through its plugin",
                          {{kExitOk, "deleted (or the host had no configuration for it)"},
                           {kExitNegative, "the plugin failed"},
-                          {kExitUsage, kUsageStatus},
-                          {kExitAborted, "aborted with Ctrl-C"}});
+                          {kExitUsage, kUsageStatus + std::string(" (maintenance mode is required and not entered, "
+                                                                   "or a staged change waits for a reboot)")},
+                          {kExitAborted, "interrupted (Ctrl-C): the running plugin was stopped"}});
   auto item = std::make_shared<std::string>();
   auto events = std::make_shared<std::string>();
   cmd->add_option("ITEM", *item, "The item: COMPONENT/GROUP/KEY of a singleton key")->required();
@@ -308,10 +293,12 @@ void RegisterDelete(CLI::App& app, GlobalOptions& options) {
         plan += "\n  it takes effect at the next boot";
       }
     }
-    Confirm(options, plan);
+    InterruptWatch watch;
+    ConfirmChange(options, plan);
     outcome->status = "deleted";
-    return RunChange(options, outcome, "delete", [&] {
-      return HoxConfigManager::DeleteConfig(at.component, at.group, at.key, MakeTask(options, *events));
+    const Progress progress(options, *events);
+    return RunChange(options, progress, outcome, "delete", [&] {
+      return HoxConfigManager::DeleteConfig(at.component, at.group, at.key, progress.Task());
     });
   });
 }
