@@ -9,6 +9,7 @@
 
 #include <hoxcm/host_api.h>
 
+#include <hoxcm/boot.h>
 #include <hoxcm/extraction.h>
 #include <hoxcm/host_documents.h>
 
@@ -328,10 +329,17 @@ TEST_F(HostApiEndToEndTest, TheImpactDecidesWhetherAChangeIsAppliedStagedOrRefus
   EXPECT_EQ(ThrownBy([&] { Set("/network/dns/config", R"({"servers": ["10.0.0.54"]})"); }).code, 2029);
   EXPECT_EQ(Get("/network/dns/config"), R"({"servers":["10.0.0.53"]})");
 
+  // The boot-time run applies the staged item and lets changes through again.
+  EXPECT_FALSE(ExecuteBootPlugins());
+  EXPECT_EQ(HoxConfigStore::GetBootMode(), HoxConfigStore::BOOTMODE_NORMAL);
+  EXPECT_NE(Get("/system/kernel/boot_options").find(R"("hugepages":4096)"), std::string::npos);
+  EXPECT_EQ(Set("/network/dns/config", R"({"servers": ["10.0.0.54"]})"), IMPACT_NONE);
+
   // Each change is in the apply history.
   std::vector<std::string> history;
   for (const ApplyHistoryRecord& r : GetApplyHistory()) history.push_back(r.kind + " " + r.outcome);
-  EXPECT_EQ(history, (std::vector<std::string>{"set applied", "set refused", "set staged", "set refused"}));
+  EXPECT_EQ(history, (std::vector<std::string>{"set applied", "set refused", "set staged", "set refused",
+                                               "boot applied", "set applied"}));
 }
 
 TEST_F(HostApiEndToEndTest, AValueSetHereBehavesTheSameInAnExportedDocument) {
