@@ -1,6 +1,7 @@
 #!/usr/bin/env bash
 # The single-item part of the demo: one item read, one set at once, one
-# removed, one staged for the next boot, and the change refused after it.
+# removed, one staged for the next boot, the next change refused until a
+# (simulated) boot-time run has applied it, then accepted.
 #
 #   scripts/demo-item.sh HOXCFG ROOT      (ROOT: a host root made by hoxcfg init --sample)
 set -euo pipefail
@@ -41,3 +42,6 @@ echo "\$ hoxcfg show desired | grep hugepages"
 "$hoxcfg" show desired | grep hugepages
 show 2 "Until the host has booted, every further change is refused (error 2029)" \
   set network/dns/config --yes --value '{"servers": ["10.0.0.54"]}'
+show 0 "Reboot (simulated): the boot-time apply applies the staged item and returns boot mode to normal" \
+  boot run --yes
+show 0 "Changes go through again" set network/dns/config --yes --value '{"servers": ["10.0.0.54"]}'

@@ -112,6 +112,6 @@ for args in "compliance $root/broken.json" "compliance $root/missing.json" "--ro
   "$hoxcfg" $args 2>&1 || echo "(exit $?)"
 done
 
-# Read, set and delete single items through the host API (last: it leaves a
-# change staged for the next boot, after which the host refuses changes).
+# Read, set and delete single items through the host API; a change staged
+# for the next boot refuses further changes until the boot-time run.
 scripts/demo-item.sh "$hoxcfg" "$root"
