@@ -1,5 +1,6 @@
 # Process-wide services shared by everything.
 list(APPEND HOXCM_SOURCES
+  src/platform/failpoint.cc
   src/platform/logger.cc
   src/platform/system_log.cc
   src/platform/paths.cc

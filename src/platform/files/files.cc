@@ -16,6 +16,7 @@
 #include <set>
 #include <utility>
 
+#include "platform/failpoint.h"
 #include "platform/file_descriptor.h"
 
 namespace HoxPlatform {
@@ -67,6 +68,7 @@ std::optional<FileDescriptor> OpenForReading(const std::string& path, bool missi
 }
 
 std::string ReadOpened(const FileDescriptor& fd, const std::string& path, FileKind kind) {
+  if (Failpoint("read:", path)) Fail("read", path, EIO);
   const std::size_t limit = MaxFileSize(kind);
   struct stat st {};
   if (::fstat(fd.get(), &st) != 0) Fail("read", path, errno);
@@ -273,10 +275,12 @@ void WriteFileAtomically(const std::string& path, std::string_view content, mode
   if (fd.get() < 0) Fail("write", path, errno);
   TemporaryFile temp(std::move(pattern));
   WriteAll(fd, content, temp.path());
+  if (Failpoint("write:", path)) Fail("write", temp.path(), EIO);
   if (::fchmod(fd.get(), mode) != 0) Fail("write", temp.path(), errno);
   if (durability == Durability::kDurable && ::fsync(fd.get()) != 0) Fail("write", temp.path(), errno);
   // A failing close may be the first sign of a lost write.
   if (fd.Close() != 0) Fail("write", temp.path(), errno);
+  if (Failpoint("rename:", path)) Fail("write", path, EIO);
   if (::rename(temp.path().c_str(), path.c_str()) != 0) Fail("write", path, errno);
   temp.Release();
   if (durability == Durability::kDurable) SyncDirectory(DirectoryOf(path), path);

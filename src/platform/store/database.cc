@@ -16,6 +16,7 @@
 #include <hoxcm/files.h>
 #include <hoxcm/host.h>
 
+#include "platform/failpoint.h"
 #include "platform/file_descriptor.h"
 
 namespace HoxConfigStore::detail {
@@ -340,6 +341,7 @@ Database::WriteScope::~WriteScope() {
 }
 
 void Database::WriteScope::Commit() {
+  if (HoxPlatform::Failpoint("store.commit")) ThrowSqliteError(db_.handle_.get(), SQLITE_IOERR, what_);
   db_.Exec(savepoint_ ? "RELEASE hox_write" : "COMMIT", what_);
   done_ = true;
 }
@@ -363,6 +365,7 @@ void Transaction::Commit() {
   if (!open_ || owner_ != std::this_thread::get_id()) {
     throw ConfigStoreException(2000, "ConfigStore error: no open transaction on this thread");
   }
+  if (HoxPlatform::Failpoint("store.commit")) ThrowSqliteError(db_->handle_.get(), SQLITE_IOERR, "commit");
   db_->Exec("COMMIT", "commit");
   open_ = false;
 }

@@ -2,6 +2,7 @@
 // bound, in one transaction, and read back oldest first.
 #include <hoxcm/config_store.h>
 
+#include "platform/failpoint.h"
 #include "platform/store/database.h"
 
 namespace HoxConfigStore {
@@ -18,6 +19,7 @@ int64_t AppendApplyHistoryRow(const std::string& record, std::size_t keep) {
     db.Prepare("DELETE FROM apply_history WHERE seq <= ?")
         .Bind(1, sequence - static_cast<int64_t>(keep == 0 ? 1 : keep))
         .Run();
+    if (HoxPlatform::Failpoint("store.history")) detail::ThrowSqliteError(nullptr, SQLITE_IOERR, "append to the apply history");
   });
   return sequence;
 }
