@@ -106,18 +106,35 @@ struct LevelVisitor {
 
 namespace detail {
 
+// "/component", "/component/group" or "/component/group/key": where a walk
+// was when it failed.
+HOXCM_API std::string LevelPath(const Value& component, const Value* group, const Value* key);
+
+// A structural fault found below a component (its value, a group's, an
+// item's, or one the visitor found in an item) leaves with the path of the
+// deepest level reached; see LocateStructuralFault.
 template <typename V, typename Visitor>
 void WalkLevels(V& components, Visitor& visitor) {
   RAPIDJSON_ASSERT(components.IsObject());
   for (auto c = components.MemberBegin(); c != components.MemberEnd(); ++c) {
-    RAPIDJSON_ASSERT(c->value.IsObject());
-    visitor.EnterComponent(c->name, c->value);
-    for (auto g = c->value.MemberBegin(); g != c->value.MemberEnd(); ++g) {
-      RAPIDJSON_ASSERT(g->value.IsObject());
-      visitor.EnterGroup(c->name, g->name, g->value);
-      for (auto k = g->value.MemberBegin(); k != g->value.MemberEnd(); ++k) {
-        visitor.Item(Item<V>{c->name, g->name, k->name, k->value});
+    const Value* group = nullptr;
+    const Value* key = nullptr;
+    try {
+      RAPIDJSON_ASSERT(c->value.IsObject());
+      visitor.EnterComponent(c->name, c->value);
+      for (auto g = c->value.MemberBegin(); g != c->value.MemberEnd(); ++g) {
+        group = &g->name;
+        key = nullptr;
+        RAPIDJSON_ASSERT(g->value.IsObject());
+        visitor.EnterGroup(c->name, g->name, g->value);
+        for (auto k = g->value.MemberBegin(); k != g->value.MemberEnd(); ++k) {
+          key = &k->name;
+          visitor.Item(Item<V>{c->name, g->name, k->name, k->value});
+        }
       }
+    } catch (HoxConfigStore::ConfigStoreException& error) {
+      LocateStructuralFault(error, LevelPath(c->name, group, key));
+      throw;
     }
   }
 }

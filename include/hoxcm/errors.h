@@ -172,6 +172,13 @@ template <typename T, typename... Args>
   throw exception;
 }
 
+// Gives a fault in a document's structure (ConfigStoreException 2000 "Invalid
+// JSON", or 2084) the place where it was found, `documentPath`, unless a
+// deeper level of the walk already gave it one. Code and text stay as they
+// are; other exceptions (a store failure with code 2000 among them) are left
+// alone. Called only on the failure path: the walks pay nothing for it.
+HOXCM_API void LocateStructuralFault(HoxConfigStore::ConfigStoreException& error, std::string documentPath);
+
 // A structured, localisable error reported by a plugin or an operation. An
 // empty `id` means success.
 struct HOXCM_API ErrorInfo {

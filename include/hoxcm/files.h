@@ -56,9 +56,14 @@ enum class FileKind : int {
 };
 
 // Documents and request files carry whole host configurations (tens of MB
-// for the largest hosts measured).
+// for the largest hosts measured). A host that needs more sets
+// HOX_MAX_DOCUMENT_MIB (a whole number of MiB) in the environment of the
+// process that reads them; MaxFileSize applies it to both kinds.
 constexpr std::size_t kMaxDocumentFileSize = 128u << 20;
 constexpr std::size_t kMaxPluginExchangeFileSize = 128u << 20;
+// The largest HOX_MAX_DOCUMENT_MIB taken; a larger, zero or malformed value
+// leaves the default.
+constexpr std::size_t kMaxDocumentMibOverride = 16384;
 // A manifest or manifest schema is a few kB.
 constexpr std::size_t kMaxManifestFileSize = 1u << 20;
 constexpr std::size_t kMaxManifestSchemaFileSize = 1u << 20;
@@ -69,6 +74,8 @@ constexpr std::size_t kMaxHostFileSize = 16u << 20;
 // Runner programs and plugin libraries, debug and sanitizer builds included.
 constexpr std::size_t kMaxProgramFileSize = 256u << 20;
 
+// The limit of `kind`, with HOX_MAX_DOCUMENT_MIB applied to documents and
+// plugin exchange files.
 HOXCM_API std::size_t MaxFileSize(FileKind kind);
 
 // The whole content of the file at `path`, symbolic links followed. Throws

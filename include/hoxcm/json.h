@@ -23,6 +23,8 @@
 
 namespace HoxConfigManager::detail {
 [[noreturn]] HOXCM_API void ThrowInvalidJson();
+// The same fault, found at `documentPath` ("/network/interfaces/vnic/3").
+[[noreturn]] HOXCM_API void ThrowInvalidJsonAt(std::string documentPath);
 }  // namespace HoxConfigManager::detail
 
 #undef RAPIDJSON_ASSERT

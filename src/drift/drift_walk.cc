@@ -218,11 +218,12 @@ class DriftWalk {
       hostIds.reserve(h.Size());
     }
     for (auto [side, ids] : {std::pair{&d, &desiredIds}, std::pair{&h, &hostIds}}) {
-      for (const Value& instance : side->GetArray()) {
-        RAPIDJSON_ASSERT(instance.IsObject());
+      for (SizeType i = 0; i < side->Size(); ++i) {
+        const Value& instance = (*side)[i];
+        if (!instance.IsObject()) InstanceFault(i);
         if (generated) continue;
         const Value* member = compare::FindByName(instance, identity);
-        RAPIDJSON_ASSERT(member != nullptr && member->IsString());
+        if (member == nullptr || !member->IsString()) InstanceFault(i);
         ids->push_back(member);
       }
     }
@@ -237,7 +238,7 @@ class DriftWalk {
         if (j != kNone) continue;
         id.instanceId = GeneratedIdOf(d[i]);
         const PathSegment segment(path_, i);
-        handler_.Add(d[i], id, schema, path_);
+        AtInstance([&] { handler_.Add(d[i], id, schema, path_); });
       }
       matched = matcher.matched();
     } else {
@@ -264,14 +265,16 @@ class DriftWalk {
             matcher.Take([&](SizeType p) { return SameBytes(NameOf(*hostIds[p]), key); }, [&] { return key; });
         id.instanceId.assign(name.GetString(), name.GetStringLength());
         const PathSegment segment(path_, i);
-        if (j == kNone) {
-          handler_.Add(d[i], id, schema, path_);
-          continue;
-        }
-        Value record;
-        if (CompareMembers(d[i], h[j], node, driftRecords_ ? &record : nullptr) && consolidated_) {
-          handler_.Set(d[i], h[j], id, schema, path_, record);
-        }
+        AtInstance([&] {
+          if (j == kNone) {
+            handler_.Add(d[i], id, schema, path_);
+            return;
+          }
+          Value record;
+          if (CompareMembers(d[i], h[j], node, driftRecords_ ? &record : nullptr) && consolidated_) {
+            handler_.Set(d[i], h[j], id, schema, path_, record);
+          }
+        });
       }
       matched = matcher.matched();
     }
@@ -284,8 +287,27 @@ class DriftWalk {
         id.instanceId.assign(hostIds[j]->GetString(), hostIds[j]->GetStringLength());
       }
       const PathSegment segment(path_, next++);
-      handler_.Delete(h[j], id, schema, path_);
+      AtInstance([&] { handler_.Delete(h[j], id, schema, path_); });
     }
+  }
+
+  // Runs `body` on the instance whose path is in path_: a structural fault
+  // found in it leaves with that path (deeper members' segments are gone
+  // by then).
+  template <typename Body>
+  void AtInstance(Body&& body) {
+    try {
+      body();
+    } catch (HoxConfigStore::ConfigStoreException& error) {
+      LocateStructuralFault(error, path_);
+      throw;
+    }
+  }
+
+  // An instance that is not an object, or lacks its identity.
+  [[noreturn]] void InstanceFault(SizeType index) {
+    const PathSegment segment(path_, index);
+    detail::ThrowInvalidJsonAt(path_);
   }
 
   static std::string GeneratedIdOf(const Value& instance) {

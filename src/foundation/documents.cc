@@ -60,3 +60,16 @@ std::shared_ptr<Document> CreateDocumentFromString(const std::string& text) {
 }
 
 }  // namespace HoxConfigManager
+
+namespace HoxConfigManager::DocumentShape::detail {
+
+std::string LevelPath(const Value& component, const Value* group, const Value* key) {
+  std::string path;
+  for (const Value* name : {&component, group, key}) {
+    if (name == nullptr) break;
+    path.append("/").append(name->GetString(), name->GetStringLength());
+  }
+  return path;
+}
+
+}  // namespace HoxConfigManager::DocumentShape::detail

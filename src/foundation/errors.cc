@@ -1,6 +1,8 @@
 #include <hoxcm/errors.h>
 #include <hoxcm/json.h>
 
+#include <string_view>
+
 namespace HostCtl::Lib {
 
 HostCtlException::HostCtlException(const char* message) : message_(message ? message : "") {}
@@ -23,6 +25,9 @@ int ConfigStoreException::GetErrorCode() const { return code_; }
 }  // namespace HoxConfigStore
 
 namespace HoxConfigManager {
+namespace {
+constexpr std::string_view kInvalidJsonText = "Invalid JSON";
+}  // namespace
 
 const std::unordered_map<CMErrorCodes, const char*>& ErrorMessageTable() {
   static const std::unordered_map<CMErrorCodes, const char*> table = {
@@ -49,7 +54,26 @@ const std::unordered_map<CMErrorCodes, const char*>& ErrorMessageTable() {
 }
 
 namespace detail {
-void ThrowInvalidJson() { throw HoxConfigStore::ConfigStoreException(2000, "Invalid JSON"); }
+void ThrowInvalidJson() { throw HoxConfigStore::ConfigStoreException(2000, kInvalidJsonText.data()); }
+void ThrowInvalidJsonAt(std::string documentPath) {
+  HoxConfigStore::ConfigStoreException error(2000, kInvalidJsonText.data());
+  ErrorLocation location;
+  location.documentPath = std::move(documentPath);
+  error.SetLocation(std::move(location));
+  throw error;
+}
 }  // namespace detail
+
+void LocateStructuralFault(HoxConfigStore::ConfigStoreException& error, std::string documentPath) {
+  const bool structural = error.GetErrorCode() == InvalidKeyValue ||
+                          (error.GetErrorCode() == HoxConfigStore::ConfigStoreException::kConfigStoreError &&
+                           std::string_view(error.what()) == kInvalidJsonText);
+  if (!structural) return;
+  const ErrorLocation* known = error.GetLocation();
+  if (known != nullptr && !known->documentPath.empty()) return;  // a deeper level knew better
+  ErrorLocation location = known != nullptr ? *known : ErrorLocation{};
+  location.documentPath = std::move(documentPath);
+  error.SetLocation(std::move(location));
+}
 
 }  // namespace HoxConfigManager

@@ -56,23 +56,27 @@ TEST_F(DriftStoreTest, OwnConfigurationIsCompliantAndMissingItemsRevertToTheirDe
 }
 
 TEST_F(DriftStoreTest, MalformedDocumentsThrowBeforeAnyReportAndLeaveTheStoreUntouched) {
+  // Structural faults keep their code and text and say where they are: the
+  // deepest level of the document the walk reached.
   struct Case {
     const char* what;
     const char* desired;
+    std::string place;
     std::string failure = "2000 Invalid JSON";
   };
   const std::vector<Case> cases = {
-      {"document is an array", "[1]"},
-      {"component is a string", R"({"network":"x"})"},
-      {"group is an array", R"({"network":{"dns":[]}})"},
-      {"singleton is an array", R"({"network":{"dns":{"config":[]}}})"},
-      {"instances are an object", R"({"storage":{"nfs":{"mounts":{}}}})"},
-      {"instance is a string", R"({"storage":{"nfs":{"mounts":["a"]}}})"},
+      {"document is an array", "[1]", ""},
+      {"component is a string", R"({"network":"x"})", "/network"},
+      {"group is an array", R"({"network":{"dns":[]}})", "/network/dns"},
+      {"singleton is an array", R"({"network":{"dns":{"config":[]}}})", "/network/dns/config"},
+      {"instances are an object", R"({"storage":{"nfs":{"mounts":{}}}})", "/storage/nfs/mounts"},
+      {"instance is a string", R"({"storage":{"nfs":{"mounts":["a"]}}})", "/storage/nfs/mounts/0"},
       {"instance without identity after a valid one",
-       R"({"storage":{"nfs":{"mounts":[{"name":"a"},{"server":"s"}]}}})"},
-      {"identity is not a string", R"({"network":{"interfaces":{"vnic":[{"name":["vnic0"]}]}}})"},
-      {"key without schema", R"({"no":{"such":{"key":{}}}})", "2021 Schema object not found: /no/such/key"},
-      {"key without schema in a profile", R"({"profile":{"network":{"nope":{"x":{}}}}})",
+       R"({"storage":{"nfs":{"mounts":[{"name":"a"},{"server":"s"}]}}})", "/storage/nfs/mounts/1"},
+      {"identity is not a string", R"({"network":{"interfaces":{"vnic":[{"name":["vnic0"]}]}}})",
+       "/network/interfaces/vnic/0"},
+      {"key without schema", R"({"no":{"such":{"key":{}}}})", "", "2021 Schema object not found: /no/such/key"},
+      {"key without schema in a profile", R"({"profile":{"network":{"nope":{"x":{}}}}})", "",
        "2021 Schema object not found: /network/nope/x"},
   };
   const auto storeText = [] {
@@ -88,10 +92,15 @@ TEST_F(DriftStoreTest, MalformedDocumentsThrowBeforeAnyReportAndLeaveTheStoreUnt
     hoxcm_test::RecordingHandler handler;
     const auto walk = [&] { ComputeDrift(desired, desired.GetAllocator(), handler, Parse("{}")); };
     EXPECT_EQ(hoxcm_test::Failure(walk), c.failure) << c.what;
+    EXPECT_EQ(hoxcm_test::FaultPlace(walk), c.place) << c.what;
     EXPECT_EQ(handler.calls, hoxcm_test::Calls{}) << c.what;
     HoxConfigManager::ComplianceResult result;
-    EXPECT_EQ(hoxcm_test::Failure([&] { HoxConfigManager::CheckCompliance(desired, result); }), c.failure) << c.what;
-    EXPECT_EQ(hoxcm_test::Failure([&] { HoxConfigManager::GenerateApplyTasks(desired); }), c.failure) << c.what;
+    const auto compliance = [&] { HoxConfigManager::CheckCompliance(desired, result); };
+    EXPECT_EQ(hoxcm_test::Failure(compliance), c.failure) << c.what;
+    EXPECT_EQ(hoxcm_test::FaultPlace(compliance), c.place) << c.what;
+    const auto tasks = [&] { HoxConfigManager::GenerateApplyTasks(desired); };
+    EXPECT_EQ(hoxcm_test::Failure(tasks), c.failure) << c.what;
+    EXPECT_EQ(hoxcm_test::FaultPlace(tasks), c.place) << c.what;
     EXPECT_EQ(storeText(), before) << c.what;
   }
 }

@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <filesystem>
+#include <cstdlib>
 #include <functional>
 #include <string>
 
@@ -29,6 +30,37 @@ std::string Refusal(const std::function<void()>& f) {
     return std::to_string(e.error()) + ": " + e.what();
   }
   return "no error";
+}
+
+TEST(FilesTest, TheDocumentLimitIsRaisedOnlyByAWellFormedOverride) {
+  // Given HOX_MAX_DOCUMENT_MIB, documents and exchange files should take its
+  // limit, other kinds keep theirs, and an unusable value changes nothing.
+  TempRoot root;
+  root.WriteFile("/doc.json", std::string((1u << 20) + 1, ' '));
+  const char* const previous = std::getenv("HOX_MAX_DOCUMENT_MIB");
+  const std::string saved = previous != nullptr ? previous : "";
+  const struct {
+    const char* value;
+    std::size_t document;
+  } cases[] = {
+      {"", HoxPlatform::kMaxDocumentFileSize},  {"512", std::size_t{512} << 20},
+      {"0", HoxPlatform::kMaxDocumentFileSize}, {"12x", HoxPlatform::kMaxDocumentFileSize},
+      {"-1", HoxPlatform::kMaxDocumentFileSize}, {"99999999", HoxPlatform::kMaxDocumentFileSize},
+  };
+  for (const auto& c : cases) {
+    ::setenv("HOX_MAX_DOCUMENT_MIB", c.value, 1);
+    EXPECT_EQ(HoxPlatform::MaxFileSize(FileKind::Document), c.document) << c.value;
+    EXPECT_EQ(HoxPlatform::MaxFileSize(FileKind::PluginExchange), c.document) << c.value;
+    EXPECT_EQ(HoxPlatform::MaxFileSize(FileKind::Manifest), HoxPlatform::kMaxManifestFileSize) << c.value;
+  }
+  ::setenv("HOX_MAX_DOCUMENT_MIB", "1", 1);
+  EXPECT_EQ(Refusal([&] { HoxPlatform::ReadFile(root.Path("/doc.json"), FileKind::Document); }),
+            "0: cannot read " + root.Path("/doc.json") + ": larger than 1 MiB (HOX_MAX_DOCUMENT_MIB raises it)");
+  if (previous != nullptr) {
+    ::setenv("HOX_MAX_DOCUMENT_MIB", saved.c_str(), 1);
+  } else {
+    ::unsetenv("HOX_MAX_DOCUMENT_MIB");
+  }
 }
 
 TEST(FilesTest, ReadsRefuseEverythingButARegularFileWithinItsLimit) {

@@ -26,6 +26,18 @@ inline Thrown ThrownBy(const std::function<void()>& f) {
   return {};
 }
 
+// Where the document fault thrown by `f` was found ("/network/dns"); empty
+// when the exception says no place, or nothing was thrown.
+inline std::string FaultPlace(const std::function<void()>& f) {
+  try {
+    f();
+  } catch (const HoxConfigStore::ConfigStoreException& e) {
+    return e.GetLocation() != nullptr ? e.GetLocation()->documentPath : "";
+  } catch (const std::exception&) {
+  }
+  return "";
+}
+
 // The same as one text, "code message" ("0 " when nothing was thrown).
 inline std::string Failure(const std::function<void()>& f) {
   const Thrown thrown = ThrownBy(f);

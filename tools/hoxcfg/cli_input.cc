@@ -28,9 +28,10 @@ std::string ReadArgument(const std::string& path) {
     if (n < 0 && errno == EINTR) continue;  // a signal interrupted the read
     if (n < 0) throw Failure(std::strerror(errno), "", kExitUsage, InFile(path));
     if (n == 0) return text;
-    if (text.size() + static_cast<std::size_t>(n) > HoxPlatform::kMaxDocumentFileSize) {
-      throw Failure("larger than " + std::to_string(HoxPlatform::kMaxDocumentFileSize >> 20) + " MiB", "", kExitUsage,
-                    InFile(path));
+    const std::size_t limit = HoxPlatform::MaxFileSize(HoxPlatform::FileKind::Document);
+    if (text.size() + static_cast<std::size_t>(n) > limit) {
+      throw Failure("larger than " + std::to_string(limit >> 20) + " MiB",
+                    "set HOX_MAX_DOCUMENT_MIB to read larger documents", kExitUsage, InFile(path));
     }
     text.append(buffer, static_cast<std::size_t>(n));
   }

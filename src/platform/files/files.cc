@@ -73,7 +73,10 @@ std::string ReadOpened(const FileDescriptor& fd, const std::string& path, FileKi
   struct stat st {};
   if (::fstat(fd.get(), &st) != 0) Fail("read", path, errno);
   if (!S_ISREG(st.st_mode)) Refuse("read", path, std::string("not a regular file (") + KindOf(st.st_mode) + ")");
-  const auto tooLarge = [&] { Refuse("read", path, "larger than " + SizeText(limit)); };
+  const auto tooLarge = [&] {
+    const bool overridable = kind == FileKind::Document || kind == FileKind::PluginExchange;
+    Refuse("read", path, "larger than " + SizeText(limit) + (overridable ? " (HOX_MAX_DOCUMENT_MIB raises it)" : ""));
+  };
   if (st.st_size > 0 && static_cast<std::size_t>(st.st_size) > limit) tooLarge();
   std::string text;
   // The size is a hint only: files under /sys report a size they do not
@@ -228,7 +231,25 @@ FileError::FileError(std::string_view action, std::string path, int error, std::
       error_(error),
       reason_(std::move(reason)) {}
 
+namespace {
+
+// HOX_MAX_DOCUMENT_MIB in bytes; 0 when unset or unusable.
+std::size_t DocumentOverride() {
+  const char* text = std::getenv("HOX_MAX_DOCUMENT_MIB");
+  if (text == nullptr || *text == '\0') return 0;
+  char* end = nullptr;
+  errno = 0;
+  const unsigned long long mib = std::strtoull(text, &end, 10);
+  if (errno != 0 || *end != '\0' || *text == '-' || mib == 0 || mib > kMaxDocumentMibOverride) return 0;
+  return static_cast<std::size_t>(mib) << 20;
+}
+
+}  // namespace
+
 std::size_t MaxFileSize(FileKind kind) {
+  if (kind == FileKind::Document || kind == FileKind::PluginExchange) {
+    if (const std::size_t override = DocumentOverride()) return override;
+  }
   switch (kind) {
     case FileKind::Document: return kMaxDocumentFileSize;
     case FileKind::Manifest: return kMaxManifestFileSize;
