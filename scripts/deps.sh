@@ -6,6 +6,8 @@ HOXCM_DEBIAN_PACKAGES=(
   rapidjson-dev libboost-filesystem-dev libboost-graph-dev libsqlite3-dev sqlite3 libmd-dev
   libgtest-dev libgmock-dev libbenchmark-dev libcli11-dev json-schema-test-suite
   time
+  # The fuzz targets (scripts/fuzz.sh) and clang-tidy (scripts/tidy.sh).
+  clang-14 libclang-rt-14-dev clang-tidy-14
 )
 
 hoxcm_install_deps() {

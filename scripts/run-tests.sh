@@ -3,6 +3,8 @@
 # machine it first installs the Debian packages it needs.
 #   scripts/run-tests.sh            the default preset (release with debug info)
 #   scripts/run-tests.sh asan       the same suite under AddressSanitizer + UBSan
+#   scripts/run-tests.sh tsan       the test programs that run threads, under
+#                                   ThreadSanitizer (the preset names them)
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 cd "$top"
