@@ -1,8 +1,11 @@
 #include "foundation/json_parse.h"
 
 #include <algorithm>
+#include <charconv>
+#include <cmath>
 #include <cstdint>
 #include <cstring>
+#include <limits>
 
 #include <rapidjson/memorystream.h>
 #include <rapidjson/reader.h>
@@ -22,7 +25,41 @@ class DepthLimitedBuilder {
   bool Int64(int64_t i) { return doc_.Int64(i); }
   bool Uint64(uint64_t u) { return doc_.Uint64(u); }
   bool Double(double d) { return doc_.Double(d); }
-  bool RawNumber(const char* s, rapidjson::SizeType n, bool copy) { return doc_.RawNumber(s, n, copy); }
+  // Numbers arrive as their text: the reader's own conversion reads some
+  // decimals as a neighbouring double (0.30000000000000004, 7e22), and its
+  // exact conversion misreads a zero with a large exponent. Integers are kept
+  // as the reader would keep them; other numbers are rounded correctly, so a
+  // value reads back from the text the library writes for it.
+  bool RawNumber(const char* s, rapidjson::SizeType n, bool /*copy*/) {
+    const char* const end = s + n;
+    const bool negative = *s == '-';
+    const char* const digits = negative ? s + 1 : s;
+    if (std::none_of(digits, end, [](char c) { return c == '.' || c == 'e' || c == 'E'; })) {
+      std::uint64_t u = 0;
+      const auto [stop, error] = std::from_chars(digits, end, u);
+      if (error == std::errc() && stop == end) {
+        if (!negative) return u <= 0xFFFFFFFFu ? doc_.Uint(static_cast<unsigned>(u)) : doc_.Uint64(u);
+        if (u <= 0x80000000u) return doc_.Int(static_cast<int>(-static_cast<std::int64_t>(u)));
+        if (u <= 0x8000000000000000u) return doc_.Int64(static_cast<std::int64_t>(~u + 1));
+      }
+    }
+    double d = 0;
+    const auto [stop, error] = std::from_chars(s, end, d);
+    if (error == std::errc() && stop == end) return doc_.Double(d);
+    // Out of range: beyond the largest double is refused, as the reader
+    // refuses it; below the smallest reads as zero (or the nearest
+    // subnormal), as the reader reads it.
+    long double wide = 0;
+    const auto [wideStop, wideError] = std::from_chars(s, end, wide);
+    const bool tooBig = wideError == std::errc() && wideStop == end
+                            ? std::fabs(wide) > std::numeric_limits<double>::max()
+                            : LargeExponent(digits, end);
+    if (tooBig) {
+      numberTooBig_ = true;
+      return false;
+    }
+    return doc_.Double(wideError == std::errc() ? static_cast<double>(wide) : (negative ? -0.0 : 0.0));
+  }
   bool String(const char* s, rapidjson::SizeType n, bool copy) { return doc_.String(s, n, copy); }
   bool StartObject() { return Enter() && doc_.StartObject(); }
   bool Key(const char* s, rapidjson::SizeType n, bool copy) { return doc_.Key(s, n, copy); }
@@ -36,6 +73,7 @@ class DepthLimitedBuilder {
     return doc_.EndArray(n);
   }
   bool TooDeep() const { return tooDeep_; }
+  bool NumberTooBig() const { return numberTooBig_; }
 
  private:
   bool Enter() {
@@ -45,16 +83,28 @@ class DepthLimitedBuilder {
     }
     return true;
   }
+  // For a number even a long double cannot hold: whether it is huge rather
+  // than tiny ("1e99999" rather than "1e-99999" or "0.000…1").
+  static bool LargeExponent(const char* digits, const char* end) {
+    const char* e = std::find_if(digits, end, [](char c) { return c == 'e' || c == 'E'; });
+    if (e != end) return e + 1 == end || e[1] != '-';
+    return *digits != '0';
+  }
+
   Document& doc_;
   unsigned depth_ = 0;
   bool tooDeep_ = false;
+  bool numberTooBig_ = false;
 };
 
-constexpr unsigned kParseFlags = rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag;
+// Numbers as text, converted by the builder: a number must read back as the
+// value whose text the library wrote (the store keeps values as text).
+constexpr unsigned kParseFlags =
+    rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag | rapidjson::kParseNumbersAsStringsFlag;
 // Pure ASCII text is valid UTF-8 by definition; checking it a word at a time
 // is far cheaper than the reader's per-character validation, which dominates
 // the parsing of the store's many small values.
-constexpr unsigned kAsciiParseFlags = rapidjson::kParseIterativeFlag;
+constexpr unsigned kAsciiParseFlags = rapidjson::kParseIterativeFlag | rapidjson::kParseNumbersAsStringsFlag;
 
 bool IsAscii(const char* text, std::size_t size) {
   std::size_t i = 0;
@@ -107,6 +157,7 @@ bool ParseJson(const char* text, std::size_t size, Document& doc, std::string* e
 bool ParseJson(const char* text, std::size_t size, Document& doc, ErrorLocation* where) {
   bool ok = false;
   bool tooDeep = false;
+  bool numberTooBig = false;
   bool trailingNul = false;
   rapidjson::ParseResult result;
   auto generator = [&](Document& target) {
@@ -116,6 +167,7 @@ bool ParseJson(const char* text, std::size_t size, Document& doc, ErrorLocation*
     result = IsAscii(text, size) ? reader.Parse<kAsciiParseFlags>(stream, builder)
                                  : reader.Parse<kParseFlags>(stream, builder);
     tooDeep = builder.TooDeep();
+    numberTooBig = builder.NumberTooBig();
     ok = !result.IsError();
     // The reader takes a NUL byte for the end of the text: a document
     // followed by a NUL and anything else must not pass as that document.
@@ -128,9 +180,10 @@ bool ParseJson(const char* text, std::size_t size, Document& doc, ErrorLocation*
   };
   doc.Populate(generator);
   if (!ok && where != nullptr) {
-    where->reason = tooDeep       ? "nesting deeper than " + std::to_string(kMaxJsonDepth) + " levels"
-                    : trailingNul ? std::string("a NUL byte after the document")
-                                  : Clause(rapidjson::GetParseError_En(result.Code()));
+    where->reason = tooDeep        ? "nesting deeper than " + std::to_string(kMaxJsonDepth) + " levels"
+                    : numberTooBig ? Clause(rapidjson::GetParseError_En(rapidjson::kParseErrorNumberTooBig))
+                    : trailingNul  ? std::string("a NUL byte after the document")
+                                   : Clause(rapidjson::GetParseError_En(result.Code()));
     Locate(text, size, result.Offset(), *where);
   }
   if (!ok) doc.SetNull();

@@ -82,6 +82,28 @@ TEST(DocumentsTest, ParsersRefuseMalformedInputOfEveryKindWithoutCrashing) {
   EXPECT_EQ(doc["v"].GetStringLength(), unterminated.size() - 1);
 }
 
+TEST(DocumentsTest, NumbersKeepTheirValueThroughTheirText) {
+  // Given numbers at the edges of what a document holds, parsing the text
+  // the library writes for them should give the same values: the store keeps
+  // values as text, and a value that moved by its last digit would drift
+  // forever after an apply.
+  for (const char* text : {"[-9446744073709551616, 18446744073709551616, 123456789012345678901234567890]",
+                           "[1e308, 1.7976931348623157e308, 5e-324, 2.2250738585072014e-308, 0.1, -0.0]",
+                           "[0.30000000000000004, 9007199254740993, 1.0000000000000002, 4.35e-7, 7e22]",
+                           "[0e307, -0e308, 1e-400, -2147483648, 4294967296, -9223372036854775808]"}) {
+    Document document;
+    ParseDocument(text, document);
+    Document again;
+    ParseDocument(JsonToString(document), again);
+    EXPECT_EQ(again, document) << text << " wrote " << JsonToString(document);
+  }
+  // Zeros stay zero whatever their exponent; integers keep their kind.
+  EXPECT_EQ(JsonToString(Parse("[0e307, -0e308, 1e-400, -0, 3000000000, -3000000000]")),
+            "[0.0,-0.0,0.0,0,3000000000,-3000000000]");
+  EXPECT_TRUE(Parse("[-3000000000]")[0].IsInt64());
+  EXPECT_EQ(Failure([] { Parse("[1e400]"); }), "2080 Failed to parse JSON String");
+}
+
 TEST(DocumentsTest, ParseFailuresCarryTheirLocationBesideTheFixedText) {
   // Given malformed text, the exception should keep code 2080 and its text
   // and carry the line, the column (in characters) and the parser's reason;
