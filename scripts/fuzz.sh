@@ -5,7 +5,7 @@
 #   scripts/fuzz.sh TARGET [SECONDS] one target (document, drift, manifest,
 #                                    plugin_exchange, schema)
 #   scripts/fuzz.sh all SECONDS      every target, SECONDS each
-# The seed corpora in tests/fuzz/corpus/ are only read; inputs the fuzzer
+# The seed corpora in fuzz/corpus/ are only read; inputs the fuzzer
 # finds go to build/fuzz/corpus/TARGET, crashing inputs to
 # build/fuzz/findings/TARGET. Exits non-zero on the first finding.
 set -euo pipefail
@@ -37,7 +37,7 @@ for target in "${targets[@]}"; do
   echo "fuzz_$target: ${seconds}s"
   # -rss_limit_mb: a reader that ignores its bound shows as a finding, not
   # as a machine out of memory. -timeout: one input must not take seconds.
-  if ! "$out/tests/fuzz/fuzz_$target" "$out/corpus/$target" "tests/fuzz/corpus/$target" \
+  if ! "$out/fuzz/fuzz_$target" "$out/corpus/$target" "fuzz/corpus/$target" \
       -max_total_time="$seconds" -rss_limit_mb=2048 -timeout=10 -print_final_stats=1 \
       -artifact_prefix="$out/findings/$target/" >"$log" 2>&1; then
     tail -n 40 "$log" >&2
