@@ -11,11 +11,6 @@
 
 using namespace HoxConfigManager;
 
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-  hoxcm_fuzz::Root();
-  return 0;
-}
-
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   const std::string_view input = hoxcm_fuzz::Text(data, size);
   const std::size_t nul = input.find('\0');

@@ -7,11 +7,6 @@
 
 using namespace HoxConfigManager;
 
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-  hoxcm_fuzz::Root();
-  return 0;
-}
-
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   const std::string path = hoxcm_fuzz::WriteInput("manifest.json", hoxcm_fuzz::Text(data, size));
   hoxcm_fuzz::Refusable([&] {

@@ -9,11 +9,6 @@
 
 using namespace HoxConfigManager;
 
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-  hoxcm_fuzz::Root();
-  return 0;
-}
-
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   const std::string path = hoxcm_fuzz::WriteInput("exchange.json", hoxcm_fuzz::Text(data, size));
   PluginRequest request;

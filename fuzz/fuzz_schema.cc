@@ -19,11 +19,6 @@ const char* const kInstances[] = {
 
 }  // namespace
 
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-  hoxcm_fuzz::Root();
-  return 0;
-}
-
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   const std::string path = hoxcm_fuzz::WriteInput("key.json", hoxcm_fuzz::Text(data, size));
   const HoxSchemaStore::SchemaObjectId id("network", "interfaces", "vnic");

@@ -19,7 +19,8 @@
 
 namespace hoxcm_fuzz {
 
-// The root, created at the first call; it lives until the process exits.
+// The root, created at the first call (LLVMFuzzerInitialize, defined with
+// it, makes the call); it lives until the process exits.
 const std::string& Root();
 
 // Writes `data` to a file below the root named `name` and returns its path.

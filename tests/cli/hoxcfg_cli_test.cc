@@ -77,6 +77,8 @@ TEST_F(HoxcfgCliTest, FileProblemsNameTheFileTheReasonAndThePosition) {
   root_.WriteFile("/schema.json", R"({"type": "object", "properties": {}})");
   root_.WriteFile("/mistyped.json", R"({"network": {"dns": []}})");
   root_.WriteFile("/nameless.json", R"({"network": {"interfaces": {"vnic": [{"name": "vnic0"}, {"mtu": 1500}]}}})");
+  const std::string wrongType = ": error 2000: Invalid JSON: a value has the wrong type; `hoxcfg schema-check --host` "
+                                "on the document says which\n";
   const std::string parseFault = ":2:7: error 2080: Failed to parse JSON String: missing a colon after a name of object member\n";
   const struct {
     std::string args, err;
@@ -92,12 +94,8 @@ TEST_F(HoxcfgCliTest, FileProblemsNameTheFileTheReasonAndThePosition) {
                                       "document: check a document against it with `hoxcfg schema-check SCHEMA "
                                       "DOCUMENT`\n"},
       {"compliance /dev/zero", "hoxcfg: /dev/zero: not a regular file (a character device)\n"},
-      {"compliance " + r + "/mistyped.json", "hoxcfg: " + r + "/mistyped.json: /network/dns: error 2000: Invalid JSON: "
-                                             "a value has the wrong type; `hoxcfg schema-check --host` on the document "
-                                             "says which\n"},
-      {"drift " + r + "/nameless.json", "hoxcfg: " + r + "/nameless.json: /network/interfaces/vnic/1: error 2000: "
-                                        "Invalid JSON: a value has the wrong type; `hoxcfg schema-check --host` on the "
-                                        "document says which\n"},
+      {"compliance " + r + "/mistyped.json", "hoxcfg: " + r + "/mistyped.json: /network/dns" + wrongType},
+      {"drift " + r + "/nameless.json", "hoxcfg: " + r + "/nameless.json: /network/interfaces/vnic/1" + wrongType},
   };
   for (const auto& c : cases) {
     const HoxcfgOutcome o = Run(c.args);
