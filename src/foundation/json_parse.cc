@@ -60,9 +60,9 @@ class DepthLimitedBuilder {
     }
     return doc_.Double(wideError == std::errc() ? static_cast<double>(wide) : (negative ? -0.0 : 0.0));
   }
-  bool String(const char* s, rapidjson::SizeType n, bool copy) { return doc_.String(s, n, copy); }
+  bool String(const char* s, rapidjson::SizeType n, bool copy) { return Text(s, n) && doc_.String(s, n, copy); }
   bool StartObject() { return Enter() && doc_.StartObject(); }
-  bool Key(const char* s, rapidjson::SizeType n, bool copy) { return doc_.Key(s, n, copy); }
+  bool Key(const char* s, rapidjson::SizeType n, bool copy) { return Text(s, n) && doc_.Key(s, n, copy); }
   bool EndObject(rapidjson::SizeType n) {
     --depth_;
     return doc_.EndObject(n);
@@ -73,6 +73,7 @@ class DepthLimitedBuilder {
     return doc_.EndArray(n);
   }
   bool TooDeep() const { return tooDeep_; }
+  bool LoneSurrogate() const { return loneSurrogate_; }
   bool NumberTooBig() const { return numberTooBig_; }
 
  private:
@@ -83,6 +84,21 @@ class DepthLimitedBuilder {
     }
     return true;
   }
+  // The reader turns an escaped low surrogate without its high one
+  // ("\udc00") into the bytes of a surrogate, which are not UTF-8: the
+  // document would not read back from its own text. Such bytes (0xED then
+  // 0xA0 or more) come only from escapes: raw text is checked as UTF-8, or
+  // is ASCII.
+  bool Text(const char* s, rapidjson::SizeType n) {
+    for (const char* p = s; (p = static_cast<const char*>(std::memchr(p, 0xED, s + n - p))) != nullptr; ++p) {
+      if (p + 1 < s + n && static_cast<unsigned char>(p[1]) >= 0xA0) {
+        loneSurrogate_ = true;
+        return false;
+      }
+    }
+    return true;
+  }
+
   // For a number even a long double cannot hold: whether it is huge rather
   // than tiny ("1e99999" rather than "1e-99999" or "0.000…1").
   static bool LargeExponent(const char* digits, const char* end) {
@@ -95,6 +111,7 @@ class DepthLimitedBuilder {
   unsigned depth_ = 0;
   bool tooDeep_ = false;
   bool numberTooBig_ = false;
+  bool loneSurrogate_ = false;
 };
 
 // Numbers as text, converted by the builder: a number must read back as the
@@ -158,6 +175,7 @@ bool ParseJson(const char* text, std::size_t size, Document& doc, ErrorLocation*
   bool ok = false;
   bool tooDeep = false;
   bool numberTooBig = false;
+  bool loneSurrogate = false;
   bool trailingNul = false;
   rapidjson::ParseResult result;
   auto generator = [&](Document& target) {
@@ -168,6 +186,7 @@ bool ParseJson(const char* text, std::size_t size, Document& doc, ErrorLocation*
                                  : reader.Parse<kParseFlags>(stream, builder);
     tooDeep = builder.TooDeep();
     numberTooBig = builder.NumberTooBig();
+    loneSurrogate = builder.LoneSurrogate();
     ok = !result.IsError();
     // The reader takes a NUL byte for the end of the text: a document
     // followed by a NUL and anything else must not pass as that document.
@@ -182,6 +201,7 @@ bool ParseJson(const char* text, std::size_t size, Document& doc, ErrorLocation*
   if (!ok && where != nullptr) {
     where->reason = tooDeep        ? "nesting deeper than " + std::to_string(kMaxJsonDepth) + " levels"
                     : numberTooBig ? Clause(rapidjson::GetParseError_En(rapidjson::kParseErrorNumberTooBig))
+                    : loneSurrogate ? Clause(rapidjson::GetParseError_En(rapidjson::kParseErrorStringUnicodeSurrogateInvalid))
                     : trailingNul  ? std::string("a NUL byte after the document")
                                    : Clause(rapidjson::GetParseError_En(result.Code()));
     Locate(text, size, result.Offset(), *where);

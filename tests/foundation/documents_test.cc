@@ -61,6 +61,8 @@ TEST(DocumentsTest, ParsersRefuseMalformedInputOfEveryKindWithoutCrashing) {
       "\"\xff\xfe\"",                  // invalid UTF-8
       "{\"\xc3\x28\": 1}",             // invalid UTF-8 in a member name
       "\"\xed\xa0\x80\"",              // encoded surrogate
+      "[\"a\\ude03\"]",                 // escaped low surrogate alone
+      "{\"\\udc00\\ud800\": 1}",         // low then high surrogate in a name
       std::string("\"a\0b\"", 5),      // NUL inside a string
       std::string("{} \0 {}", 7),       // NUL and more after the document
   };
