@@ -1,6 +1,6 @@
 // The document parser. Every input is either refused with 2080 and a
 // location inside the text, or parsed into a document whose compact text
-// parses back to an equal document.
+// reads back as the same document.
 #include <hoxcm/documents.h>
 
 #include "fuzz/fuzz_support.h"
@@ -21,10 +21,12 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     hoxcm_fuzz::Check(!where->reason.empty(), "a parse failure without reason");
     return 0;
   }
+  // Compared as text: members with the same name (which JSON allows) make
+  // RapidJSON's equality of values unreliable.
   const std::string compact = JsonToString(document);
   Document again;
   hoxcm_fuzz::Refusable([&] { ParseDocument(compact, again); });
   hoxcm_fuzz::Check(!again.IsNull() || document.IsNull(), "the compact text of a parsed document does not parse");
-  hoxcm_fuzz::Check(again == document, "a document differs from the parse of its compact text");
+  hoxcm_fuzz::Check(JsonToString(again) == compact, "a document's text reads back as another document");
   return 0;
 }
