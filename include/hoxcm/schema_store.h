@@ -69,10 +69,11 @@ class HOXCM_API SchemaObject {
                                            bool& propertyLevel) const = 0;
   // The key's JSON schema: an "object" schema for a singleton, an "array"
   // schema whose "items" describe one instance for a multi-instance key.
-  // Properties may carry "sensitive": true.
+  // Properties may carry "sensitive": true. Local references ("$ref":
+  // "#/definitions/...") anywhere in the key's schemas resolve against it.
   virtual const rapidjson::Value& GetJsonSchema() const = 0;
   // The schema of one instance (the "items" of a multi-instance key, the
-  // whole schema of a singleton).
+  // whole schema of a singleton), a part of GetJsonSchema().
   virtual const rapidjson::Value& GetInstanceSchema() const = 0;
   // The key's configuration differs from host to host (addresses, names):
   // it belongs to a host's own section when a document is split per host.

@@ -10,6 +10,8 @@
 #include <hoxcm/json.h>
 #include <hoxcm/schema_store.h>
 
+#include "foundation/schema_refs.h"
+
 namespace HoxSchemaStore {
 namespace {
 
@@ -55,6 +57,14 @@ void GenerateSchemaDocument(const rapidjson::Value& value, const std::shared_ptr
       auto schema = store.Find(item.component.GetString(), item.group.GetString(), item.key.GetString());
       if (!schema) return;
       rapidjson::Value keySchema(schema->GetJsonSchema(), a);
+      // The key's references name places in its own schema, which now sits
+      // three levels down.
+      std::string fragment;
+      for (const rapidjson::Value* name : {&item.component, &item.group, &item.key}) {
+        fragment += "/properties";
+        HoxConfigManager::detail::AppendReferenceToken(fragment, {name->GetString(), name->GetStringLength()});
+      }
+      HoxConfigManager::detail::RebaseReferences(keySchema, fragment, a);
       // Host-specific keys are told apart when a document is split per host.
       if (schema->IsHostSpecific()) keySchema.AddMember("hostSpecific", true, a);
       keys->AddMember(rapidjson::Value(item.key, a), keySchema, a);
@@ -88,7 +98,11 @@ bool GenerateHostDocumentSchema(const Value& document, Document& out) {
     if (store->Find(id.component, id.group, id.key)) return;
     CSLogger::Log(CSLogger::kError, "Schema not found for %s", id.toString().c_str());
     Value error(rapidjson::kObjectType);
-    error.AddMember("field", Value(item.Path(), a), a);
+    std::string field;
+    for (const Value* name : {&item.component, &item.group, &item.key}) {
+      detail::AppendPointerToken(field, {name->GetString(), name->GetStringLength()});
+    }
+    error.AddMember("field", Value(field, a), a);
     error.AddMember("errId", static_cast<int>(JsonValidator::VALIDATION_ERR_UNKNOWN_KEY), a);
     Value args(rapidjson::kArrayType);
     args.PushBack(Value(id.toString(), a), a);

@@ -7,7 +7,7 @@
 
 #include <hoxcm/schema_store.h>
 
-#include "platform/schema/ref_check.h"
+#include "foundation/schema_refs.h"
 
 namespace JsonValidator::detail {
 namespace {
@@ -50,7 +50,7 @@ class SubjectWalk {
   // False when the budget ran out.
   bool Walk(const Value& doc, const Value* node, std::vector<std::string>& tokens) {
     if (--budget_ < 0) return false;
-    node = ResolveLocalReference(root_, node);
+    node = HoxConfigManager::detail::FollowReferences(root_, node);
     if (node == nullptr || !node->IsObject()) return true;
     auto pattern = node->FindMember("pattern");
     if (pattern != node->MemberEnd() && doc.IsString() && doc.GetStringLength() > kMaxPatternSubject) {
@@ -214,7 +214,7 @@ bool GuardPatternSubjects(const Value& schema, const Value& document, const std:
   guarded.CopyFrom(document, guarded.GetAllocator());
   for (const Subject& s : subjects) {
     Finding f;
-    for (const auto& t : s.tokens) f.field += "/" + t;
+    for (const auto& t : s.tokens) HoxConfigManager::detail::AppendPointerToken(f.field, t);
     f.field = path + f.field;
     f.code = VALIDATION_ERR_PATTERN;
     f.args.push_back(s.tokens.empty() ? std::string() : s.tokens.back());

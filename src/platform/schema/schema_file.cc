@@ -14,7 +14,7 @@
 
 #include "foundation/json_parse.h"
 #include "platform/schema/pattern_guard.h"
-#include "platform/schema/ref_check.h"
+#include "foundation/schema_refs.h"
 #include "platform/schema/valijson.h"
 
 namespace HoxSchemaStore::detail {
@@ -194,7 +194,7 @@ void CheckCompiles(const rapidjson::Value& schema) {
     }
   };
   ForEachSubschema(schema, Location(), false, visit);
-  if (std::string loop = JsonValidator::detail::FindReferenceLoop(schema); !loop.empty()) Fail(loop);
+  if (std::string unusable = HoxConfigManager::detail::CheckReferences(schema); !unusable.empty()) Fail(unusable);
   try {
     valijson::Schema compiled;
     valijson::SchemaParser parser(valijson::SchemaParser::kDraft4);
@@ -356,7 +356,11 @@ KeySchema::KeySchema(Definition definition, std::unique_ptr<Pool> pool, rapidjso
     schema_.SetObject();
     schema_.AddMember("type", "array", *pool_);
     schema_.AddMember("items", instanceSchema, *pool_);
-    instance_ = &schema_.FindMember("items")->value;
+    rapidjson::Value& items = schema_.FindMember("items")->value;
+    // References in the instance schema name places in it; they resolve
+    // against the key's schema, where it sits below "items".
+    HoxConfigManager::detail::RebaseReferences(items, "/items", *pool_);
+    instance_ = &items;
   } else {
     schema_ = instanceSchema;
     instance_ = &schema_;

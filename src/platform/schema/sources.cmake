@@ -2,7 +2,6 @@
 list(APPEND HOXCM_SOURCES
   src/platform/schema/host_document_schema.cc
   src/platform/schema/pattern_guard.cc
-  src/platform/schema/ref_check.cc
   src/platform/schema/schema_file.cc
   src/platform/schema/schema_store.cc
   src/platform/schema/validator.cc

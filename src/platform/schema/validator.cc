@@ -7,8 +7,8 @@
 #include <hoxcm/json.h>
 #include <hoxcm/schema_store.h>
 
+#include "foundation/schema_refs.h"
 #include "platform/schema/pattern_guard.h"
-#include "platform/schema/ref_check.h"
 #include "platform/schema/validator_errors.h"
 #include "platform/schema/valijson.h"
 
@@ -60,8 +60,7 @@ std::string ContextToPath(const std::string& base, const std::vector<std::string
   // The first element names the root ("<root>"); the others are "[name]".
   for (std::size_t i = 1; i < context.size(); ++i) {
     const std::string& part = context[i];
-    path += '/';
-    path += part.size() >= 2 ? part.substr(1, part.size() - 2) : part;
+    HoxConfigManager::detail::AppendPointerToken(path, part.size() >= 2 ? part.substr(1, part.size() - 2) : part);
   }
   return path;
 }
@@ -110,16 +109,18 @@ std::string ExpectedType(const Value& schema, const std::string& base, const std
 }
 
 void RunEngine(const Value& schema, const Value& document, const std::string& path, std::vector<Finding>& out) {
+  // A reference the engine cannot resolve in the schema itself would send
+  // it after a document it never fetches, or round in circles.
+  if (std::string unusable = HoxConfigManager::detail::CheckReferences(schema); !unusable.empty()) {
+    out.push_back(SchemaInvalid(path, unusable));
+    return;
+  }
   if (std::string overlong = detail::FindOverlongPattern(schema); !overlong.empty()) {
     out.push_back(SchemaInvalid(path, overlong));
     return;
   }
   rapidjson::Document guarded;
   const Value& subject = detail::GuardPatternSubjects(schema, document, path, guarded, out) ? guarded : document;
-  if (std::string loop = detail::FindReferenceLoop(schema); !loop.empty()) {
-    out.push_back(SchemaInvalid(path, loop));
-    return;
-  }
   valijson::ValidationResults results;
   try {
     const auto run = [&] {
@@ -166,7 +167,7 @@ class UnionWalk {
   UnionWalk(const Value& root, int depth, std::vector<Finding>& out) : root_(root), depth_(depth), out_(out) {}
 
   void Walk(const Value& doc, const Value* node, const std::string& path) {
-    node = detail::ResolveLocalReference(root_, node);
+    node = HoxConfigManager::detail::FollowReferences(root_, node);
     if (node == nullptr || !node->IsObject()) return;
     auto tag = node->FindMember("unionTag");
     if (tag != node->MemberEnd() && tag->value.IsString() && doc.IsObject()) CheckUnion(doc, *node, tag->value, path);
@@ -184,7 +185,10 @@ class UnionWalk {
           if (p != props->value.MemberEnd()) child = &p->value;
         }
         if (child == nullptr && extra != node->MemberEnd() && extra->value.IsObject()) child = &extra->value;
-        if (child != nullptr) Walk(m.value, child, path + "/" + m.name.GetString());
+        if (child == nullptr) continue;
+        std::string childPath = path;
+        HoxConfigManager::detail::AppendPointerToken(childPath, {m.name.GetString(), m.name.GetStringLength()});
+        Walk(m.value, child, childPath);
       }
     } else if (doc.IsArray()) {
       auto items = node->FindMember("items");
@@ -207,7 +211,8 @@ class UnionWalk {
     auto variants = node.FindMember("oneOf");
     if (variants == node.MemberEnd() || !variants->value.IsArray()) return;
     Finding f;
-    f.field = path + "/" + tag;
+    f.field = path;
+    HoxConfigManager::detail::AppendPointerToken(f.field, tag);
     f.code = VALIDATION_ERR_UNION_TAG;
     f.args.push_back(tag);
     auto value = doc.FindMember(tagName);

@@ -5,6 +5,8 @@
 
 #include <hoxcm/schema_store.h>
 
+#include "foundation/schema_refs.h"
+
 namespace JsonValidator {
 namespace {
 
@@ -95,8 +97,17 @@ std::string QuotedName(const std::string& text) {
 namespace detail {
 
 std::string LastSegment(const std::string& field) {
-  std::size_t slash = field.rfind('/');
-  return slash == std::string::npos ? field : field.substr(slash + 1);
+  const std::size_t slash = field.rfind('/');
+  const std::string token = slash == std::string::npos ? field : field.substr(slash + 1);
+  std::string name;
+  for (std::size_t i = 0; i < token.size(); ++i) {
+    if (token[i] == '~' && i + 1 < token.size() && (token[i + 1] == '0' || token[i + 1] == '1')) {
+      name.push_back(token[++i] == '0' ? '~' : '/');
+    } else {
+      name.push_back(token[i]);
+    }
+  }
+  return name;
 }
 
 bool ClassifyEngineError(const std::string& path, const std::string& description, Finding& out) {
@@ -122,7 +133,8 @@ bool ClassifyEngineError(const std::string& path, const std::string& description
   if (out.code == VALIDATION_ERR_REQUIRED || out.code == VALIDATION_ERR_ADDITIONAL_PROPERTIES ||
       out.code == VALIDATION_ERR_DEPENDENCIES) {
     const std::string name = QuotedName(description);
-    out.field = path + "/" + name;
+    out.field = path;
+    HoxConfigManager::detail::AppendPointerToken(out.field, name);
     out.args.push_back(name);
   } else {
     out.args.push_back(LastSegment(path));

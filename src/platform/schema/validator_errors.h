@@ -9,7 +9,7 @@
 namespace JsonValidator::detail {
 
 struct Finding {
-  std::string field;              // "/a/b/0", below the caller's context
+  std::string field;              // "/a/b/0", below the caller's context; a JSON pointer (RFC 6901)
   int code = 0;                   // VALIDATION_ERR_CODES
   std::vector<std::string> args;  // first: the name of the faulty member
   std::string text;               // human text; never holds a value of the document
@@ -20,7 +20,8 @@ struct Finding {
 // child's own report carries the finding.
 bool ClassifyEngineError(const std::string& path, const std::string& description, Finding& out);
 
-// Last segment of a field ("" for the root).
+// The member name that the last token of a field stands for ("" for the
+// root).
 std::string LastSegment(const std::string& field);
 
 }  // namespace JsonValidator::detail
