@@ -3,7 +3,7 @@
 # when something is missing.
 HOXCM_DEBIAN_PACKAGES=(
   build-essential cmake pkg-config ccache python3
-  rapidjson-dev libboost-filesystem-dev libboost-graph-dev libsqlite3-dev sqlite3 libmd-dev
+  rapidjson-dev libboost-filesystem-dev libboost-graph-dev libsqlite3-dev sqlite3 libmd-dev libre2-dev
   libgtest-dev libgmock-dev libbenchmark-dev libcli11-dev json-schema-test-suite
   time
   # The fuzz targets (scripts/fuzz.sh) and clang-tidy (scripts/tidy.sh).

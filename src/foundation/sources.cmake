@@ -7,6 +7,7 @@ list(APPEND HOXCM_SOURCES
   src/foundation/documents.cc
   src/foundation/errors.cc
   src/foundation/json_parse.cc
+  src/foundation/pattern.cc
   src/foundation/schema_refs.cc
   src/foundation/strings.cc
   src/foundation/task.cc

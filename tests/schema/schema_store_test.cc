@@ -115,7 +115,12 @@ TEST(SchemaStoreTest, MalformedFilesAreReportedWithTheirPathAndHideNothingElse) 
        "must be of the property's type \"integer\""},
       {"bad/x/trigger_kind", withProperty(R"({"type": "array", "rebootRequired": {"SET": []}})"),
        "need a property of type integer, number, boolean or string"},
-      {"bad/x/regex", withProperty(R"({"type": "string", "pattern": "(["})"), "invalid regular expression"},
+      {"bad/x/regex", withProperty(R"({"type": "string", "pattern": "(["})"), "cannot be used"},
+      // Constructs only a backtracking matcher offers, and a back-reference
+      // number that overflowed the standard library's regex compiler.
+      {"bad/x/lookahead", withProperty(R"x({"type": "string", "pattern": "^(?=a)"})x"), "cannot be used"},
+      {"bad/x/backreference", withProperty(R"({"type": "string", "pattern": "\\88888888888888888888"})"),
+       "cannot be used"},
       {"bad/x/long_regex", withProperty(R"({"type": "string", "pattern": ")" + std::string(200000, 'a') + "\"}"),
        "longer than 4096 bytes"},
       {"bad/x/engine", R"({"multiInstance": false, "schema": {"type": "object", "minLength": "x"}})", "not usable"},

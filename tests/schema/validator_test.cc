@@ -11,6 +11,7 @@
 #include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
 
+#include "platform/schema/patterns.h"
 #include "support/json.h"
 #include "support/temp_root.h"
 
@@ -177,15 +178,42 @@ TEST(ValidatorTest, HostDocumentReportsEveryFaultyItemWithoutSensitiveValues) {
   EXPECT_EQ(JsonToString(result).find("tiny-secret"), std::string::npos);
 }
 
-TEST(ValidatorTest, LongStringsNeverReachThePatternMatcher) {
-  // Given strings far longer than a backtracking matcher can take on a
-  // stack, the validator should report those under a pattern and leave the
-  // others to the usual checks, without crashing.
-  const std::string huge(200000, 'a');
+TEST(ValidatorTest, PatternsMatchInTimeLinearInTheSubject) {
+  // Given patterns on which a backtracking matcher takes exponential time
+  // (or recurses once per character) and long subjects that make them fail
+  // at the very end, validation should report each mismatch, whatever the
+  // length; constructs only backtracking offers make the schema unusable.
+  const std::string many(200000, 'a');
   const Document schema = Parse(R"({"properties": {
-      "name": {"type": "string", "pattern": "^(a|b)*$"},
-      "cert": {"type": "string", "maxLength": 300000},
-      "tags": {"type": "object", "patternProperties": {"^[a-z]+$": {"type": "string"}}}}})");
-  const Document doc = Parse(R"({"name":")" + huge + R"(","cert":")" + huge + R"(","tags":{")" + huge + R"(":"x"}})");
-  EXPECT_EQ(Check(schema, doc), (Findings{{"/name", 8}, {"/tags/" + huge, 8}}));
+      "name": {"type": "string", "pattern": "^(a+)+$"},
+      "when": {"type": "string", "format": "date-time"},
+      "tags": {"type": "object", "patternProperties": {"^(a|aa)+$": {"type": "integer"}},
+               "additionalProperties": false}}})");
+  const Document doc = Parse(R"({"name":")" + many + R"(!","when":")" + many + R"(","tags":{")" + many +
+                             R"(!":1,")" + many + R"(":"x"}})");
+  Findings found = Check(schema, doc);
+  std::sort(found.begin(), found.end());
+  EXPECT_EQ(found, (Findings{{"/name", 8}, {"/tags/" + many, 2}, {"/tags/" + many + "!", 10}, {"/when", 14}}));
+  for (const char* pattern : {R"(^[A-Za-z5-9]([A-Za-z0-9.-]?{0,252})$)", R"((a)\\1)", R"(^(?!x))", R"(a{1001})"}) {
+    EXPECT_EQ(Check(Parse(std::string(R"({"pattern": ")") + pattern + R"("})"), Parse(R"x("aaaa)")x")),
+              (Findings{{"", 31}}))
+        << pattern;
+  }
+}
+
+TEST(ValidatorTest, OneValidationHasABoundedCost) {
+  // Given a schema whose alternatives double the work at every level,
+  // validation should stop at its budget with an unusable-schema finding.
+  std::string definitions = R"("l0": {"type": "string"})";
+  for (int level = 1; level <= 40; ++level) {
+    const std::string below = R"({"$ref": "#/definitions/l)" + std::to_string(level - 1) + R"("})";
+    definitions += R"(, "l)" + std::to_string(level) + R"(": {"anyOf": [)" + below + ", " + below + "]}";
+  }
+  const Document parsed = Parse(R"({"definitions": {)" + definitions + R"(}, "$ref": "#/definitions/l40"})");
+  JsonValidator::detail::ValidationBudget budget(100000);
+  Document result;
+  JsonValidator::Validate(parsed, Parse("true"), result, {}, "");
+  ASSERT_EQ(result.Size(), 1u);
+  EXPECT_EQ(result[0]["errId"].GetInt(), 31);
+  EXPECT_NE(std::string(result[0]["error"].GetString()).find("more than 100000 steps"), std::string::npos);
 }

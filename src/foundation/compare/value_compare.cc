@@ -8,7 +8,7 @@
 
 #include <hoxcm/config_document.h>
 
-#include "foundation/regex_limits.h"
+#include "foundation/pattern.h"
 
 namespace HoxConfigManager::compare {
 
@@ -105,37 +105,22 @@ const Value* PatternPropertySchema(const Value& schema, std::string_view name, P
   const Value* patterns = FindByName(schema, "patternProperties");
   if (patterns == nullptr || !patterns->IsObject()) return nullptr;
   const Value* found = nullptr;
-  const std::string subject(name);
   for (auto it = patterns->MemberBegin(); it != patterns->MemberEnd(); ++it) {
     if (!it->value.IsObject()) continue;
     const bool sensitive = IsTrueMember(it->value, "sensitive");
     if (!sensitive && found != nullptr) continue;
-    // The matcher recurses with the length of the subject and the compiler
-    // with that of the pattern: past the limits that are safe on any stack,
-    // a sensitive pattern is taken to match and any other not to.
-    bool matches = sensitive;
-    if (subject.size() <= HoxConfigManager::detail::kSmallSubject &&
-        it->name.GetStringLength() <= HoxConfigManager::detail::kMaxPatternLength) {
-      std::optional<std::regex> local;
-      std::optional<std::regex>* compiled = &local;
-      bool fresh = true;
-      if (cache != nullptr) {
-        auto [slot, inserted] =
-            cache->try_emplace(std::string_view(it->name.GetString(), it->name.GetStringLength()));
-        compiled = &slot->second;
-        fresh = inserted;
-      }
-      if (fresh) {
-        try {
-          compiled->emplace(it->name.GetString(), it->name.GetStringLength());
-        } catch (const std::regex_error&) {
-        }
-      }
-      try {
-        if (compiled->has_value()) matches = std::regex_search(subject, **compiled);
-      } catch (const std::regex_error&) {
-      }
+    std::shared_ptr<const HoxConfigManager::detail::SchemaPattern> local;
+    const std::shared_ptr<const HoxConfigManager::detail::SchemaPattern>* compiled = &local;
+    if (cache != nullptr) {
+      auto [slot, inserted] = cache->try_emplace(NameOf(it->name));
+      if (inserted) slot->second = HoxConfigManager::detail::SchemaPattern::Get(NameOf(it->name));
+      compiled = &slot->second;
+    } else {
+      local = HoxConfigManager::detail::SchemaPattern::Get(NameOf(it->name));
     }
+    // A pattern that cannot be used is taken to match when it is sensitive,
+    // so that a secret is never shown for want of it, and not otherwise.
+    const bool matches = *compiled ? (*compiled)->Search(name) : sensitive;
     if (!matches) continue;
     if (sensitive) return &it->value;
     found = &it->value;

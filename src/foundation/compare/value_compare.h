@@ -22,12 +22,13 @@
 #include <cstring>
 #include <memory>
 #include <optional>
-#include <regex>
 #include <string_view>
 #include <unordered_map>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/json.h>
+
+#include "foundation/pattern.h"
 
 namespace HoxConfigManager::compare {
 
@@ -128,13 +129,12 @@ class MemberIndex {
 
 // The schema that a "patternProperties" entry of `schema` gives member
 // `name`, or null. A sensitive entry wins over others, and a sensitive entry
-// whose pattern cannot be compiled, or that would be applied to a name too
-// long to match safely, is taken to match, so that a secret is never shown
-// for want of a usable pattern.
+// whose pattern cannot be compiled is taken to match, so that a secret is
+// never shown for want of a usable pattern.
 // `cache`, when given, keeps the compiled patterns, keyed by their text so
-// that keys sharing a pattern compile it once (the keys view the schemas'
+// that keys sharing a pattern look it up once (the keys view the schemas'
 // names: the cache must not outlive them).
-using PatternCache = std::unordered_map<std::string_view, std::optional<std::regex>>;
+using PatternCache = std::unordered_map<std::string_view, std::shared_ptr<const HoxConfigManager::detail::SchemaPattern>>;
 const rapidjson::Value* PatternPropertySchema(const rapidjson::Value& schema, std::string_view name,
                                               PatternCache* cache = nullptr);
 

@@ -2,18 +2,15 @@
 
 #include <algorithm>
 #include <initializer_list>
-#include <mutex>
-#include <regex>
 #include <set>
 #include <string_view>
-#include <unordered_set>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/files.h>
 #include <hoxcm/json.h>
 
 #include "foundation/json_parse.h"
-#include "platform/schema/pattern_guard.h"
+#include "foundation/pattern.h"
 #include "foundation/schema_refs.h"
 #include "platform/schema/valijson.h"
 
@@ -78,31 +75,6 @@ std::vector<std::string> GetOperations(const rapidjson::Value& root, const char*
   return ops;
 }
 
-// The patterns that compiled, for the life of the process. Schemas share
-// their patterns (addresses, names, identifiers), and compiling one costs
-// more than reading and checking the rest of a schema file; a refused
-// pattern is not remembered, so every file that holds it is refused.
-class CompiledPatterns {
- public:
-  bool Contains(const std::string& pattern) {
-    std::lock_guard<std::mutex> lock(mutex_);
-    return patterns_.count(pattern) != 0;
-  }
-  void Add(const std::string& pattern) {
-    std::lock_guard<std::mutex> lock(mutex_);
-    patterns_.insert(pattern);
-  }
-
- private:
-  std::mutex mutex_;
-  std::unordered_set<std::string> patterns_;
-};
-
-CompiledPatterns& KnownPatterns() {
-  static CompiledPatterns patterns;
-  return patterns;
-}
-
 // Where a subschema sits ("#/properties/a/items"). The text is built only
 // for a message: building it for every node of every file cost more than
 // the checks themselves.
@@ -130,17 +102,10 @@ class Location {
 std::string_view NameOf(const rapidjson::Value& name) { return {name.GetString(), name.GetStringLength()}; }
 
 void CheckRegex(const std::string& pattern, const Location& where) {
-  if (pattern.size() > JsonValidator::detail::kMaxPatternLength) {
-    Fail("regular expression at " + where.Text() + " is longer than " +
-         std::to_string(JsonValidator::detail::kMaxPatternLength) + " bytes");
+  std::string why;
+  if (!HoxConfigManager::detail::SchemaPattern::Get(pattern, &why)) {
+    Fail("regular expression at " + where.Text() + ": " + why);
   }
-  if (KnownPatterns().Contains(pattern)) return;
-  try {
-    std::regex compiled(pattern);
-  } catch (const std::regex_error& e) {
-    Fail("invalid regular expression at " + where.Text() + ": " + e.what());
-  }
-  KnownPatterns().Add(pattern);
 }
 
 // Applies `visit` to every subschema of `node` reachable through the draft-4

@@ -8,7 +8,7 @@
 #include <hoxcm/schema_store.h>
 
 #include "foundation/schema_refs.h"
-#include "platform/schema/pattern_guard.h"
+#include "platform/schema/patterns.h"
 #include "platform/schema/validator_errors.h"
 #include "platform/schema/valijson.h"
 
@@ -115,29 +115,19 @@ void RunEngine(const Value& schema, const Value& document, const std::string& pa
     out.push_back(SchemaInvalid(path, unusable));
     return;
   }
-  if (std::string overlong = detail::FindOverlongPattern(schema); !overlong.empty()) {
-    out.push_back(SchemaInvalid(path, overlong));
+  if (std::string refused = detail::CheckPatterns(schema); !refused.empty()) {
+    out.push_back(SchemaInvalid(path, refused));
     return;
   }
-  rapidjson::Document guarded;
-  const Value& subject = detail::GuardPatternSubjects(schema, document, path, guarded, out) ? guarded : document;
   valijson::ValidationResults results;
   try {
-    const auto run = [&] {
-      valijson::Schema compiled;
-      valijson::SchemaParser parser(valijson::SchemaParser::kDraft4);
-      valijson::adapters::RapidJsonAdapter schemaAdapter(schema);
-      parser.populateSchema(schemaAdapter, compiled);
-      valijson::Validator validator;
-      valijson::adapters::RapidJsonAdapter target(subject);
-      validator.validate(compiled, target, &results);
-    };
-    // Short strings cannot exhaust any stack; spare the thread for them.
-    if (detail::HasStringsLongerThan(subject, detail::kSmallSubject)) {
-      detail::RunOnLargeStack(run);
-    } else {
-      run();
-    }
+    valijson::Schema compiled;
+    valijson::SchemaParser parser(valijson::SchemaParser::kDraft4);
+    valijson::adapters::RapidJsonAdapter schemaAdapter(schema);
+    parser.populateSchema(schemaAdapter, compiled);
+    valijson::Validator validator;
+    valijson::adapters::RapidJsonAdapter target(document);
+    validator.validate(compiled, target, &results);
   } catch (const std::exception& e) {
     out.push_back(SchemaInvalid(path, e.what()));
     return;
@@ -308,6 +298,7 @@ std::size_t Depth(const std::string& field, const std::string& context) {
 
 int Validate(const Value& schema, const Value& document, rapidjson::Document& result, const std::set<int>& ignored,
              const std::string& context) {
+  const detail::ValidationBudget budget(detail::BudgetFor(document));
   std::vector<Finding> findings;
   ValidateValue(schema, document, context, 0, findings);
   return WriteFindings(findings, ignored, result);
@@ -315,6 +306,7 @@ int Validate(const Value& schema, const Value& document, rapidjson::Document& re
 
 int ValidateCMDocument(const Value& schema, const Value& document, rapidjson::Document& result,
                        const std::set<int>& ignored, const std::string& context) {
+  const detail::ValidationBudget budget(detail::BudgetFor(document));
   std::vector<Finding> findings;
   ValidateValue(schema, document, context, 0, findings);
   for (Finding& f : findings) {
