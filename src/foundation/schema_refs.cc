@@ -222,4 +222,16 @@ void AppendReferenceToken(std::string& fragment, std::string_view name) { Append
 
 void AppendPointerToken(std::string& pointer, std::string_view name) { AppendToken(pointer, name, false); }
 
+std::string PointerTokenName(std::string_view token) {
+  std::string name;
+  for (std::size_t i = 0; i < token.size(); ++i) {
+    if (token[i] == '~' && i + 1 < token.size() && (token[i + 1] == '0' || token[i + 1] == '1')) {
+      name.push_back(token[++i] == '0' ? '~' : '/');
+    } else {
+      name.push_back(token[i]);
+    }
+  }
+  return name;
+}
+
 }  // namespace HoxConfigManager::detail

@@ -62,5 +62,8 @@ void AppendReferenceToken(std::string& fragment, std::string_view name);
 // Appends "/" and `name` as a JSON pointer token (RFC 6901: "~" as "~0", "/"
 // as "~1"), the form of the paths in validation findings.
 void AppendPointerToken(std::string& pointer, std::string_view name);
+// The member name a JSON pointer token stands for ("~1dev~1sda" is
+// "/dev/sda").
+std::string PointerTokenName(std::string_view token);
 
 }  // namespace HoxConfigManager::detail

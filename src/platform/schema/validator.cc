@@ -75,15 +75,18 @@ std::string ExpectedType(const Value& schema, const std::string& base, const std
   while (start < field.size()) {
     std::size_t end = field.find('/', start + 1);
     if (end == std::string::npos) end = field.size();
-    const std::string segment = field.substr(start + 1, end - start - 1);
+    const std::string segment = HoxConfigManager::detail::PointerTokenName(field.substr(start + 1, end - start - 1));
     start = end;
-    node = detail::ResolveLocalReference(schema, node);
+    node = HoxConfigManager::detail::FollowReferences(schema, node);
     if (node == nullptr || !node->IsObject()) return std::string();
     const auto props = node->FindMember("properties");
     const auto items = node->FindMember("items");
     const auto extra = node->FindMember("additionalProperties");
-    if (props != node->MemberEnd() && props->value.IsObject() && props->value.HasMember(segment.c_str())) {
-      node = &props->value[segment.c_str()];
+    const Value name(rapidjson::StringRef(segment.data(), static_cast<rapidjson::SizeType>(segment.size())));
+    const auto named = props != node->MemberEnd() && props->value.IsObject() ? props->value.FindMember(name)
+                                                                              : node->MemberEnd();
+    if (props != node->MemberEnd() && props->value.IsObject() && named != props->value.MemberEnd()) {
+      node = &named->value;
     } else if (items != node->MemberEnd() && items->value.IsObject() && !segment.empty() &&
                segment.find_first_not_of("0123456789") == std::string::npos) {
       node = &items->value;
@@ -93,7 +96,7 @@ std::string ExpectedType(const Value& schema, const std::string& base, const std
       return std::string();
     }
   }
-  node = detail::ResolveLocalReference(schema, node);
+  node = HoxConfigManager::detail::FollowReferences(schema, node);
   if (node == nullptr || !node->IsObject()) return std::string();
   const auto type = node->FindMember("type");
   if (type == node->MemberEnd()) return std::string();

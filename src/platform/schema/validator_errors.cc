@@ -98,16 +98,7 @@ namespace detail {
 
 std::string LastSegment(const std::string& field) {
   const std::size_t slash = field.rfind('/');
-  const std::string token = slash == std::string::npos ? field : field.substr(slash + 1);
-  std::string name;
-  for (std::size_t i = 0; i < token.size(); ++i) {
-    if (token[i] == '~' && i + 1 < token.size() && (token[i + 1] == '0' || token[i + 1] == '1')) {
-      name.push_back(token[++i] == '0' ? '~' : '/');
-    } else {
-      name.push_back(token[i]);
-    }
-  }
-  return name;
+  return HoxConfigManager::detail::PointerTokenName(slash == std::string::npos ? field : field.substr(slash + 1));
 }
 
 bool ClassifyEngineError(const std::string& path, const std::string& description, Finding& out) {
