@@ -46,8 +46,10 @@ class HOXCM_API ConfigStoreDocument {
   static std::size_t HashValue(const rapidjson::Value& value, const rapidjson::Value& schema);
   // Order-insensitive equality of two arrays of primitive values.
   static bool IsEqualPrimitiveArray(const rapidjson::Value& a, const rapidjson::Value& b);
-  // Compact JSON of `value` with every property that `schema` marks
-  // "sensitive" replaced by "******", at any depth.
+  // Compact JSON of `value` with every value that `schema` makes sensitive
+  // replaced by "******", at any depth: marked "sensitive" itself, inside a
+  // sensitive object or array, or through any combinator branch, reference
+  // ("#..." against `schema`), pattern property or additional schema.
   static std::string RedactAndSerializeValue(const rapidjson::Value& schema, const rapidjson::Value& value);
   // Adds an item: a singleton (empty identifier) as doc[C][G][K], an instance
   // appended to the array doc[C][G][K]. Under "profile" when it exists.

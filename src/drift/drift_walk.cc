@@ -5,6 +5,7 @@
 #include <functional>
 #include <optional>
 #include <string_view>
+#include <unordered_map>
 #include <vector>
 
 #include <hoxcm/documents.h>
@@ -12,6 +13,8 @@
 #include <hoxcm/host.h>
 
 #include "drift/host_matcher.h"
+#include "drift/reported_schema.h"
+#include "foundation/compare/schema_view.h"
 #include "foundation/compare/value_compare.h"
 
 namespace HoxConfigManager {
@@ -23,6 +26,7 @@ using detail::kNone;
 using compare::MemberIndex;
 using compare::NameOf;
 using compare::SameBytes;
+using compare::SchemaView;
 using HoxConfigStore::ConfigStoreObjectId;
 using HoxSchemaStore::SchemaObject;
 using rapidjson::SizeType;
@@ -71,6 +75,15 @@ class DriftWalk {
                    const std::shared_ptr<SchemaObject>& schema, const std::string& itemPath) {
     path_ = itemPath;
     instanceId_ = &id.instanceId;
+    // Where a bare schema node shows whether a value is sensitive, handlers
+    // get the comparison's nodes as they are; otherwise schemas that carry
+    // what decides masking (reported_schema.h).
+    auto known = secretKeys_.find(schema.get());
+    if (known == secretKeys_.end()) {
+      known = secretKeys_.emplace(schema.get(), compare::NeedsRootToTellSecrets(schema->GetJsonSchema())).first;
+    }
+    view_.reset();
+    if (known->second) view_.emplace(schema->GetJsonSchema(), schema->GetInstanceSchema());
     if (schema->IsMultiInstance()) {
       CompareInstances(desired, host, id, schema);
     } else {
@@ -96,11 +109,19 @@ class DriftWalk {
     record->AddMember(Value(name.data(), static_cast<SizeType>(name.size()), allocator_), marker, allocator_);
   }
 
-  void Report(const Value& desired, const Value& host, const Value& schemaNode, ACTION action, Value* record,
-              std::string_view name) {
-    handler_.PropertyDrift(desired, host, schemaNode, path_, action);
+  // The schema node handed to the handler with a drifted property.
+  const Value& Reported(const Value& schemaNode, const SchemaView* view, const Value& desired, const Value& host) {
+    if (view == nullptr) return schemaNode;
+    return detail::ReportedSchema(*view, schemaNode, desired, host, reported_);
+  }
+
+  void Report(const Value& desired, const Value& host, const Value& schemaNode, const SchemaView* view, ACTION action,
+              Value* record, std::string_view name) {
+    handler_.PropertyDrift(desired, host, Reported(schemaNode, view, desired, host), path_, action);
     if (record != nullptr) Mark(record, name, NewRecord(action));
   }
+
+  const SchemaView* ViewOrNull() const { return view_ ? &*view_ : nullptr; }
 
   void CompareSingle(const Value& desired, const Value& host, ConfigStoreObjectId& id,
                      const std::shared_ptr<SchemaObject>& schema) {
@@ -126,7 +147,7 @@ class DriftWalk {
     const Value& d = desiredAbsent ? EmptyObject() : desired;
     const Value& h = host.IsObject() ? host : EmptyObject();
     Value record;
-    if (CompareMembers(d, h, node, driftRecords_ ? &record : nullptr) && consolidated_) {
+    if (CompareMembers(d, h, node, driftRecords_ ? &record : nullptr, ViewOrNull()) && consolidated_) {
       handler_.Set(desired, host, id, schema, path_, record);
     }
   }
@@ -136,8 +157,12 @@ class DriftWalk {
   // only `h` holds, in its order. True when anything differed. Which members
   // count, and under which schema, is the comparer's member pass: the rule
   // of equality itself.
-  bool CompareMembers(const Value& d, const Value& h, const Value& schema, Value* record) {
+  bool CompareMembers(const Value& d, const Value& h, const Value& schema, Value* record, const SchemaView* view) {
     bool differed = false;
+    // The view of a member, when the key needs views.
+    const auto member = [&](std::string_view name) {
+      return view != nullptr ? std::optional<SchemaView>(view->Member(name)) : std::nullopt;
+    };
     cmp_.Members(
         d, h, schema,
         [&](std::string_view name, const Value& dv, const Value* hv, const Value& childSchema) {
@@ -145,29 +170,32 @@ class DriftWalk {
           const bool desiredUnset = cmp_.IsUnset(dv, childSchema);
           if (hostUnset && desiredUnset) return true;
           const PathSegment segment(path_, name);
+          const std::optional<SchemaView> childView = member(name);
+          const SchemaView* cv = childView ? &*childView : nullptr;
           if (hostUnset || desiredUnset) {
-            Report(dv, hv != nullptr ? *hv : NullValue(), childSchema, hostUnset ? ADD : DELETE, record, name);
+            Report(dv, hv != nullptr ? *hv : NullValue(), childSchema, cv, hostUnset ? ADD : DELETE, record, name);
             differed = true;
           } else if (dv.IsObject() && hv->IsObject()) {
             Value sub;
-            if (CompareMembers(dv, *hv, childSchema, record != nullptr ? &sub : nullptr)) {
+            if (CompareMembers(dv, *hv, childSchema, record != nullptr ? &sub : nullptr, cv)) {
               differed = true;
               if (record != nullptr) Mark(record, name, sub.IsNull() ? NewRecord(SET) : std::move(sub));
             }
           } else if (dv.IsArray() && hv->IsArray() && cmp_.HoldsObjects(childSchema, dv, *hv)) {
-            if (CompareObjectArrays(dv, *hv, childSchema)) {
+            if (CompareObjectArrays(dv, *hv, childSchema, cv)) {
               differed = true;
               Mark(record, name, NewRecord(SET));
             }
           } else if (!cmp_.Equal(dv, *hv, childSchema)) {
-            Report(dv, *hv, childSchema, SET, record, name);
+            Report(dv, *hv, childSchema, cv, SET, record, name);
             differed = true;
           }
           return true;
         },
         [&](std::string_view name, const Value& hv, const Value& childSchema) {
           const PathSegment segment(path_, name);
-          Report(NullValue(), hv, childSchema, DELETE, record, name);
+          const std::optional<SchemaView> childView = member(name);
+          Report(NullValue(), hv, childSchema, childView ? &*childView : nullptr, DELETE, record, name);
           differed = true;
           return true;
         });
@@ -177,7 +205,10 @@ class DriftWalk {
   // Elements of arrays of objects are matched, not compared by position: an
   // unmatched desired element is an addition at its own index, an unmatched
   // host element a removal numbered after the desired elements.
-  bool CompareObjectArrays(const Value& d, const Value& h, const Value& schema) {
+  bool CompareObjectArrays(const Value& d, const Value& h, const Value& schema, const SchemaView* view) {
+    const auto element = [&](SizeType index) {
+      return view != nullptr ? std::optional<SchemaView>(view->Element(index)) : std::nullopt;
+    };
     HostMatcher<std::uint64_t, std::function<std::uint64_t(SizeType)>> matcher(
         h.Size(), [&](SizeType j) { return cmp_.Hash(h[j], cmp_.Items(schema, h[j])); });
     bool differed = false;
@@ -187,7 +218,9 @@ class DriftWalk {
                                       [&] { return cmp_.Hash(d[i], items); });
       if (j == kNone) {
         const PathSegment segment(path_, i);
-        handler_.PropertyDrift(d[i], NullValue(), items, path_, ADD);
+        const std::optional<SchemaView> elementView = element(i);
+        handler_.PropertyDrift(d[i], NullValue(),
+                               Reported(items, elementView ? &*elementView : nullptr, d[i], NullValue()), path_, ADD);
         differed = true;
       }
     }
@@ -195,7 +228,10 @@ class DriftWalk {
     for (SizeType j = 0; j < h.Size(); ++j) {
       if (matcher.matched()[j]) continue;
       const PathSegment segment(path_, next++);
-      handler_.PropertyDrift(NullValue(), h[j], cmp_.Items(schema, h[j]), path_, DELETE);
+      const std::optional<SchemaView> elementView = element(j);
+      handler_.PropertyDrift(NullValue(), h[j],
+                             Reported(cmp_.Items(schema, h[j]), elementView ? &*elementView : nullptr, NullValue(), h[j]),
+                             path_, DELETE);
       differed = true;
     }
     return differed;
@@ -271,7 +307,7 @@ class DriftWalk {
             return;
           }
           Value record;
-          if (CompareMembers(d[i], h[j], node, driftRecords_ ? &record : nullptr) && consolidated_) {
+          if (CompareMembers(d[i], h[j], node, driftRecords_ ? &record : nullptr, ViewOrNull()) && consolidated_) {
             handler_.Set(d[i], h[j], id, schema, path_, record);
           }
         });
@@ -324,6 +360,11 @@ class DriftWalk {
   const bool driftRecords_;
   const bool perProperty_;
   compare::ValueComparer cmp_;
+  // Whether each key met needs views to tell its secrets, and the view of
+  // the item being compared when it does.
+  std::unordered_map<const SchemaObject*, bool> secretKeys_;
+  std::optional<SchemaView> view_;
+  Document reported_;
   // The path of what is being compared, grown and shrunk as the walk descends.
   std::string path_;
   const std::string* instanceId_ = nullptr;

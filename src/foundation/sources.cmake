@@ -2,6 +2,7 @@
 # comparison: JSON and C++ only, nothing of the operating system.
 list(APPEND HOXCM_SOURCES
   src/foundation/compare/redact.cc
+  src/foundation/compare/schema_view.cc
   src/foundation/compare/value_compare.cc
   src/foundation/config_document.cc
   src/foundation/documents.cc
