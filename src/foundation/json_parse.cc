@@ -6,6 +6,9 @@
 #include <cstdint>
 #include <cstring>
 #include <limits>
+#include <string_view>
+#include <unordered_set>
+#include <vector>
 
 #include <rapidjson/memorystream.h>
 #include <rapidjson/reader.h>
@@ -123,6 +126,69 @@ constexpr unsigned kParseFlags =
 // the parsing of the store's many small values.
 constexpr unsigned kAsciiParseFlags = rapidjson::kParseIterativeFlag | rapidjson::kParseNumbersAsStringsFlag;
 
+// Objects this small are checked for repeated names pair by pair.
+constexpr rapidjson::SizeType kPairwiseMembers = 8;
+
+bool HasRepeatedName(const Value& object) {
+  const rapidjson::SizeType count = object.MemberCount();
+  if (count < 2) return false;
+  const auto name = [](const Value& n) { return std::string_view(n.GetString(), n.GetStringLength()); };
+  if (count <= kPairwiseMembers) {
+    for (auto i = object.MemberBegin(); i != object.MemberEnd(); ++i) {
+      for (auto j = i + 1; j != object.MemberEnd(); ++j) {
+        if (name(i->name) == name(j->name)) return true;
+      }
+    }
+    return false;
+  }
+  std::unordered_set<std::string_view> seen;
+  seen.reserve(count);
+  for (auto it = object.MemberBegin(); it != object.MemberEnd(); ++it) {
+    if (!seen.insert(name(it->name)).second) return true;
+  }
+  return false;
+}
+
+// True when some object below `value` names a member twice. The nesting
+// limit bounds the recursion.
+bool HasRepeatedNames(const Value& value) {
+  if (value.IsObject()) {
+    if (HasRepeatedName(value)) return true;
+    for (auto it = value.MemberBegin(); it != value.MemberEnd(); ++it) {
+      if (HasRepeatedNames(it->value)) return true;
+    }
+  } else if (value.IsArray()) {
+    for (const Value& element : value.GetArray()) {
+      if (HasRepeatedNames(element)) return true;
+    }
+  }
+  return false;
+}
+
+// Reads the text again to find the first repeated member name in text order;
+// the reader stops just after it. Run only once a repeat is known to exist.
+class RepeatFinder : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, RepeatFinder> {
+ public:
+  bool StartObject() {
+    names_.emplace_back();
+    return true;
+  }
+  bool Key(const char* s, rapidjson::SizeType n, bool) {
+    if (names_.back().emplace(s, n).second) return true;
+    repeated_.assign(s, n);
+    return false;
+  }
+  bool EndObject(rapidjson::SizeType) {
+    names_.pop_back();
+    return true;
+  }
+  const std::string& Repeated() const { return repeated_; }
+
+ private:
+  std::vector<std::unordered_set<std::string>> names_;
+  std::string repeated_;
+};
+
 bool IsAscii(const char* text, std::size_t size) {
   std::size_t i = 0;
   for (; i + sizeof(std::uint64_t) <= size; i += sizeof(std::uint64_t)) {
@@ -177,6 +243,8 @@ bool ParseJson(const char* text, std::size_t size, Document& doc, ErrorLocation*
   bool numberTooBig = false;
   bool loneSurrogate = false;
   bool trailingNul = false;
+  bool repeat = false;
+  std::string repeated;
   rapidjson::ParseResult result;
   auto generator = [&](Document& target) {
     DepthLimitedBuilder builder(target);
@@ -198,11 +266,22 @@ bool ParseJson(const char* text, std::size_t size, Document& doc, ErrorLocation*
     return ok;
   };
   doc.Populate(generator);
+  // A member named twice would be read as the one or the other depending on
+  // who looks; the text is refused instead.
+  if (ok && HasRepeatedNames(doc)) {
+    RepeatFinder finder;
+    rapidjson::MemoryStream stream(text, size);
+    result = rapidjson::Reader().Parse<rapidjson::kParseIterativeFlag>(stream, finder);
+    repeated = finder.Repeated();
+    repeat = true;
+    ok = false;
+  }
   if (!ok && where != nullptr) {
     where->reason = tooDeep        ? "nesting deeper than " + std::to_string(kMaxJsonDepth) + " levels"
                     : numberTooBig ? Clause(rapidjson::GetParseError_En(rapidjson::kParseErrorNumberTooBig))
                     : loneSurrogate ? Clause(rapidjson::GetParseError_En(rapidjson::kParseErrorStringUnicodeSurrogateInvalid))
                     : trailingNul  ? std::string("a NUL byte after the document")
+                    : repeat       ? "member \"" + repeated + "\" appears twice in one object"
                                    : Clause(rapidjson::GetParseError_En(result.Code()));
     Locate(text, size, result.Offset(), *where);
   }

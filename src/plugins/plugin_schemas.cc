@@ -188,7 +188,10 @@ void ValidateAllPlugins(std::string_view pluginDirectory, std::string_view schem
       continue;
     }
     Document manifest;
-    if (!detail::ParseJson(text.data(), text.size(), manifest)) {
+    std::string reason;
+    if (!detail::ParseJson(text.data(), text.size(), manifest, &reason)) {
+      // The finding's text is fixed (the path only); the reason goes to the log.
+      CSLogger::Log(CSLogger::kError, "Plugin manifest %s: %s", file.c_str(), reason.c_str());
       record(file, "Failed to parse the data from file " + Quoted(file));
       continue;
     }

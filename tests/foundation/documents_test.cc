@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <cstdlib>
 #include <string>
 #include <tuple>
 
@@ -82,6 +83,8 @@ TEST(DocumentsTest, ParsersRefuseMalformedInputOfEveryKindWithoutCrashing) {
   EXPECT_NO_THROW(ParseDocument(atLimit, doc));
   ParseDocument("{\"v\":" + unterminated + "\"}", doc);
   EXPECT_EQ(doc["v"].GetStringLength(), unterminated.size() - 1);
+  // The same name in different objects is no repeat.
+  EXPECT_NO_THROW(ParseDocument("{\"a\":{\"x\":1},\"b\":{\"x\":1},\"c\":[{\"x\":1},{\"x\":1}]}", doc));
 }
 
 TEST(DocumentsTest, NumbersKeepTheirValueThroughTheirText) {
@@ -120,6 +123,12 @@ TEST(DocumentsTest, ParseFailuresCarryTheirLocationBesideTheFixedText) {
       {"{\"a\": 1,\n \"\xc3\xa9\": [1, 2", 2, 12, "missing a comma or ']' after an array element"},
       {"[\"\xff\"]", 1, 3, "invalid encoding in string"},
       {std::string(kMaxJsonDepth + 1, '['), 1, kMaxJsonDepth + 1, "nesting deeper than 512 levels"},
+      // A member named twice, in a nested, a wide and an empty-named case;
+      // the location is just after the second name.
+      {"{\"a\": {\"b\": 1,\n \"b\": 2}}", 2, 5, "member \"b\" appears twice in one object"},
+      {"[{\"1\":1,\"2\":2,\"3\":3,\"4\":4,\"5\":5,\"6\":6,\"7\":7,\"8\":8,\"9\":9,\"3\":0}]", 1, 60,
+       "member \"3\" appears twice in one object"},
+      {"{\"\":1,\"\":1}", 1, 9, "member \"\" appears twice in one object"},
   };
   for (const auto& c : cases) {
     Document doc;
