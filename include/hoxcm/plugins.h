@@ -131,6 +131,23 @@ struct HOXCM_API TaskMap {
   std::vector<DesiredConfigInput> inputs;
 };
 
+// A fault in the apply order that the manifests declare: an apply group that
+// does not exist, a "depends" name that nothing provides, or a cycle.
+struct HOXCM_API ApplyOrderFault {
+  std::string text;                    // what is wrong, naming the plugins by id and the names involved
+  std::vector<std::string> manifests;  // the manifests of the plugins involved
+};
+
+// The faults that keep `plugins` (one registry's plugins, in path order) from
+// having an apply order; empty when BuildDependencies can order them. Cycles
+// are given with their names in order, each running after the next.
+HOXCM_API std::vector<ApplyOrderFault> FindApplyOrderFaults(const std::vector<std::shared_ptr<Plugin>>& plugins);
+
+// The same for the installed plugins of `type` (APPLY or APPLY_BOOT), without
+// building a registry that would refuse them. Throws what reading a manifest
+// throws.
+HOXCM_API std::vector<ApplyOrderFault> CheckApplyOrder(PluginType type);
+
 // The registry of installed plugins for one kind of run.
 class HOXCM_API PluginManager {
  public:

@@ -1,6 +1,7 @@
 // PluginManager: the registry of installed plugins and the order in which
 // apply operations run.
 #include <algorithm>
+#include <map>
 #include <stdexcept>
 
 #include <boost/graph/adjacency_list.hpp>
@@ -30,35 +31,168 @@ std::string ObjectKey(const HoxConfigStore::ConfigStoreObjectId& id) {
   return id.component + "/" + id.group + "/" + id.key;
 }
 
+std::string Quoted(const std::string& s) { return "\"" + s + "\""; }
+
+// The manifests below `directory`, in path order. An unreadable manifest
+// fails the registry, as a malformed one does: a plugin missing from it
+// would silently not run.
+std::vector<std::string> ManifestFiles(const std::string& directory) {
+  // A host without plugins has no directory: an empty registry.
+  if (!HoxPlatform::IsDirectory(directory)) return {};
+  // Symbolic links to directories are not followed, so a link loop cannot
+  // trap the walk; a directory that happens to end in ".json" is walked,
+  // not read.
+  HoxPlatform::ListOptions options;
+  options.suffix = ".json";
+  HoxPlatform::DirectoryListing listing = HoxPlatform::ListFiles(directory, options);
+  for (const auto& problem : listing.problems) {
+    const std::string text = "Plugin manifest " + problem.path + " cannot be read: " + problem.reason;
+    CSLogger::Log(CSLogger::kError, "%s", text.c_str());
+    throw ConfigManagerException(kPluginFailureCode, text.c_str());
+  }
+  return std::move(listing.files);
+}
+
+// The apply operations a plugin adds to the order.
+std::vector<PluginApplyOperation> OrderedOperations(const Plugin& plugin) {
+  const long version = plugin.GetVersion();
+  if (version >= 0 && version <= 2) return plugin.GetOperations();
+  if (version != 3) return {};
+  PluginApplyOperation op;
+  plugin.GetRemediateOperation(op);
+  return {op};
+}
+
+// The order's table as BuildDependencies fills it (a later operation with the
+// same "provides" replaces an earlier one's list), with the plugin behind
+// each name, so that every fault can name the plugins involved.
+class OrderTable {
+ public:
+  explicit OrderTable(const std::vector<std::shared_ptr<Plugin>>& plugins) {
+    for (const auto& [group, before] : GroupTable()) after_[group] = before;
+    for (const auto& plugin : plugins) {
+      const std::string group = plugin->GetApplyGroup();
+      const auto known = GroupTable().find(group);
+      const auto operations = OrderedOperations(*plugin);
+      if (known == GroupTable().end() && !operations.empty()) {
+        faults_.push_back({"plugin " + Quoted(plugin->GetId()) + " names the apply group " + Quoted(group) +
+                               ", which is not one of system-early, network, storage, system",
+                           {plugin->GetPath()}});
+      }
+      for (const auto& op : operations) {
+        auto& list = after_[op.provides];
+        list.clear();
+        if (known != GroupTable().end()) {
+          after_[group].push_back(op.provides);
+          list = known->second;
+        }
+        list.insert(list.end(), op.depends.begin(), op.depends.end());
+        provider_[op.provides] = plugin.get();
+      }
+    }
+  }
+
+  std::vector<ApplyOrderFault> Faults() {
+    for (const auto& [name, list] : after_) {
+      for (const std::string& other : list) {
+        if (after_.count(other) != 0) continue;
+        const Plugin* plugin = provider_.at(name);
+        faults_.push_back({"plugin " + Quoted(plugin->GetId()) + ": " + Quoted(name) + " depends on " +
+                               Quoted(other) + ", which no plugin provides and which is not an apply group",
+                           {plugin->GetPath()}});
+      }
+    }
+    FindCycles();
+    return std::move(faults_);
+  }
+
+ private:
+  enum class Mark { kNew, kOnPath, kDone };
+
+  // Depth first from every name in name order; an edge back to a name on the
+  // current path closes a cycle, reported once with its names in order.
+  void FindCycles() {
+    std::map<std::string, Mark> marks;
+    std::vector<std::string> path;
+    for (const auto& entry : after_) Visit(entry.first, marks, path);
+  }
+
+  void Visit(const std::string& name, std::map<std::string, Mark>& marks, std::vector<std::string>& path) {
+    Mark& mark = marks[name];
+    if (mark != Mark::kNew) return;
+    mark = Mark::kOnPath;
+    path.push_back(name);
+    for (const std::string& other : after_[name]) {
+      if (after_.count(other) == 0) continue;
+      if (marks[other] == Mark::kOnPath) {
+        ReportCycle(std::vector<std::string>(std::find(path.begin(), path.end(), other), path.end()));
+      } else {
+        Visit(other, marks, path);
+      }
+    }
+    path.pop_back();
+    marks[name] = Mark::kDone;
+  }
+
+  void ReportCycle(const std::vector<std::string>& members) {
+    std::string chain;
+    std::vector<std::string> plugins, manifests;
+    for (const std::string& name : members) {
+      chain += name + " -> ";
+      const auto it = provider_.find(name);
+      if (it == provider_.end()) continue;
+      const std::string id = Quoted(it->second->GetId());
+      if (std::find(plugins.begin(), plugins.end(), id) == plugins.end()) plugins.push_back(id);
+      if (std::find(manifests.begin(), manifests.end(), it->second->GetPath()) == manifests.end()) {
+        manifests.push_back(it->second->GetPath());
+      }
+    }
+    std::string ids;
+    for (const std::string& id : plugins) ids += (ids.empty() ? "" : ", ") + id;
+    faults_.push_back({"the apply order has a cycle: " + chain + members.front() +
+                           " (each runs after the next), declared by the plugins " + ids,
+                       manifests});
+  }
+
+  std::map<std::string, std::vector<std::string>> after_;
+  std::map<std::string, const Plugin*> provider_;
+  std::vector<ApplyOrderFault> faults_;
+};
+
 }  // namespace
+
+std::vector<ApplyOrderFault> FindApplyOrderFaults(const std::vector<std::shared_ptr<Plugin>>& plugins) {
+  return OrderTable(plugins).Faults();
+}
+
+std::vector<ApplyOrderFault> CheckApplyOrder(PluginType type) {
+  std::vector<std::shared_ptr<Plugin>> plugins;
+  for (const std::string& file : ManifestFiles(PluginDirectory())) {
+    auto plugin = std::make_shared<Plugin>(file.c_str());
+    if (plugin->CheckType(type)) plugins.push_back(std::move(plugin));
+  }
+  return FindApplyOrderFaults(plugins);
+}
 
 PluginManager::PluginManager(PluginType type) : directory(PluginDirectory()) { Load(type); }
 
 void PluginManager::Load(PluginType type) {
-  // A host without plugins has no directory: an empty registry.
-  if (HoxPlatform::IsDirectory(directory)) {
-    // Symbolic links to directories are not followed, so a link loop cannot
-    // trap the walk; a directory that happens to end in ".json" is walked,
-    // not read. Manifests load in path order, which fixes the order in
-    // which Find returns the owners of an object.
-    HoxPlatform::ListOptions options;
-    options.suffix = ".json";
-    const HoxPlatform::DirectoryListing listing = HoxPlatform::ListFiles(directory, options);
-    // An unreadable manifest fails the registry, as a malformed one does:
-    // a plugin missing from it would silently not run.
-    for (const auto& problem : listing.problems) {
-      const std::string text = "Plugin manifest " + problem.path + " cannot be read: " + problem.reason;
-      CSLogger::Log(CSLogger::kError, "%s", text.c_str());
-      throw ConfigManagerException(kPluginFailureCode, text.c_str());
-    }
-    for (const std::string& file : listing.files) ProcessJson(file.c_str(), type);
-  }
+  // Manifests load in path order, which fixes the order in which Find
+  // returns the owners of an object.
+  for (const std::string& file : ManifestFiles(directory)) ProcessJson(file.c_str(), type);
   if (type != APPLY && type != APPLY_BOOT) return;
   try {
     BuildDependencies();
   } catch (const std::exception& e) {
     CSLogger::Log(CSLogger::kError, "Failed to process dependencies %s", e.what());
-    ThrowException<ConfigManagerException>(PluginDependencyGraphFailed);
+    // The first fault found, with its manifest, tells the reader where to look.
+    ErrorLocation where;
+    const auto faults = FindApplyOrderFaults(GetPlugins());
+    if (!faults.empty()) {
+      where.file = faults.front().manifests.empty() ? std::string() : faults.front().manifests.front();
+      where.reason = faults.front().text;
+    }
+    ThrowExceptionAt<ConfigManagerException>(where, PluginDependencyGraphFailed);
   }
 }
 
@@ -123,14 +257,7 @@ void PluginManager::BuildDependencies() {
   for (const auto& [path, plugin] : plugins) {
     CSLogger::Log(CSLogger::kDetail, "Processing operations in %s", path.c_str());
     const std::string group = plugin->GetApplyGroup();
-    const long version = plugin->GetVersion();
-    if (version >= 0 && version <= 2) {
-      for (const auto& op : plugin->GetOperations()) ProcessOperation(op, group, table);
-    } else if (version == 3) {
-      PluginApplyOperation op;
-      plugin->GetRemediateOperation(op);
-      ProcessOperation(op, group, table);
-    }
+    for (const auto& op : OrderedOperations(*plugin)) ProcessOperation(op, group, table);
   }
 
   std::unordered_map<std::string, std::size_t> index;

@@ -47,22 +47,54 @@ TEST_F(PluginManagerTest, OperationsRunInsideTheirGroupAfterWhatTheyDependOn) {
   ExpectChain(order, {"system-early", "C", "B", "network", "storage", "SET:ntp", "system"});
 }
 
-TEST_F(PluginManagerTest, OrderFailuresBecomeTheGraphError) {
+TEST_F(PluginManagerTest, OrderFailuresBecomeTheGraphErrorNamingTheirManifests) {
+  // Given manifests that declare no usable order, the apply and boot
+  // registries should fail with the graph error located in the faulty
+  // manifest, and the check should name every plugin involved (a cycle with
+  // its names in order).
+  const std::string a = "a/plugin.json", b = "b/plugin.json";
   const struct {
     const char* what;
     std::vector<std::pair<std::string, std::string>> manifests;
+    std::vector<std::string> faults;  // the text of each fault, its first manifest after a '@'
   } cases[] = {
-      {"unknown group", {{"a/plugin.json", V3Manifest("python", {"network:dns:config"}, "late", "A", {})}}},
-      {"dangling name", {{"a/plugin.json", V3Manifest("python", {"network:dns:config"}, "network", "A", {"Z"})}}},
+      {"unknown group",
+       {{a, V3Manifest("python", {"network:dns:config"}, "late", "A", {})}},
+       {"plugin \"a\" names the apply group \"late\", which is not one of system-early, network, "
+        "storage, system@" + a}},
+      {"dangling name",
+       {{a, V3Manifest("python", {"network:dns:config"}, "network", "A", {"Z"})}},
+       {"plugin \"a\": \"A\" depends on \"Z\", which no plugin provides and which is not an apply "
+        "group@" + a}},
       {"cycle",
-       {{"a/plugin.json", V3Manifest("python", {"network:dns:config"}, "network", "A", {"B"})},
-        {"b/plugin.json", V3Manifest("python", {"network:routes:static"}, "network", "B", {"A"})}}},
+       {{a, V3Manifest("python", {"network:dns:config"}, "network", "A", {"B"})},
+        {b, V3Manifest("python", {"network:routes:static"}, "network", "B", {"A"})}},
+       {"the apply order has a cycle: A -> B -> A (each runs after the next), declared by the plugins "
+        "\"a\", \"b\"@" + a}},
+      {"cycle through a group",
+       {{a, V3Manifest("python", {"network:dns:config"}, "network", "A", {"storage"})}},
+       {"the apply order has a cycle: A -> storage -> network -> A (each runs after the next), declared by the "
+        "plugins \"a\"@" + a}},
   };
   for (const auto& c : cases) {
     std::filesystem::remove_all(root.Path(kModules));
     for (const auto& [path, text] : c.manifests) Manifest(path, text);
     for (PluginType type : {APPLY, APPLY_BOOT}) {
-      EXPECT_EQ(ThrownBy([&] { PluginManager m(type); }).code, PluginDependencyGraphFailed) << c.what;
+      try {
+        PluginManager m(type);
+        ADD_FAILURE() << c.what;
+      } catch (const ConfigManagerException& e) {
+        EXPECT_EQ(e.GetErrorCode(), PluginDependencyGraphFailed) << c.what;
+        ASSERT_NE(e.GetLocation(), nullptr) << c.what;
+        EXPECT_EQ(e.GetLocation()->reason + "@" + e.GetLocation()->file,
+                  c.faults.front().substr(0, c.faults.front().find('@')) + "@" + root.Path(kModules + a))
+            << c.what;
+      }
+      std::vector<std::string> found;
+      for (const auto& fault : CheckApplyOrder(type)) {
+        found.push_back(fault.text + "@" + fault.manifests.front().substr(root.Path(kModules).size()));
+      }
+      EXPECT_EQ(found, c.faults) << c.what;
     }
     // Managers that never order apply operations do not care.
     EXPECT_EQ(ThrownBy([] { PluginManager m(IMPACT); }).code, 0) << c.what;

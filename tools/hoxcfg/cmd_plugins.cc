@@ -109,6 +109,27 @@ std::string ManifestFinding(const rapidjson::Value& finding) {
   return HoxConfigManager::JsonToString(finding);
 }
 
+// Adds to `report` each fault of the apply order the manifests declare, under
+// its first manifest; a fault of both the apply and the boot-time order is
+// listed once.
+void AddOrderFaults(rapidjson::Document& report) {
+  auto& a = report.GetAllocator();
+  std::vector<std::string> seen;
+  for (PluginType type : {APPLY, APPLY_BOOT}) {
+    for (const ApplyOrderFault& fault : CheckApplyOrder(type)) {
+      if (std::find(seen.begin(), seen.end(), fault.text) != seen.end()) continue;
+      seen.push_back(fault.text);
+      std::string text = (type == APPLY_BOOT ? "in the boot-time order: " : "") + fault.text;
+      for (std::size_t i = 1; i < fault.manifests.size(); ++i) {
+        text += (i == 1 ? "; see also " : ", ") + HoxPlatform::StripHostRoot(fault.manifests[i]);
+      }
+      rapidjson::Value errors(rapidjson::kArrayType);
+      errors.PushBack(rapidjson::Value(text, a), a);
+      AddValidationError(report, fault.manifests.empty() ? std::string() : fault.manifests.front(), errors);
+    }
+  }
+}
+
 }  // namespace
 
 void RegisterPluginCommands(CLI::App& app, GlobalOptions& options) {
@@ -122,13 +143,18 @@ void RegisterPluginCommands(CLI::App& app, GlobalOptions& options) {
                     /*list=*/true});
     return kExitOk;
   });
-  auto* check = AddCommand(*plugins, "check", "Check every manifest against the manifest schema of its version",
+  auto* check = AddCommand(*plugins, "check",
+                           "Check every manifest against the manifest schema of its version, and the apply order "
+                           "they declare",
                            {{kExitOk, "every manifest is valid"},
                             {kExitNegative, "some are not: each finding is listed"},
                             {kExitUsage, kUsageStatus}});
   SetAction(check, options, Needs::kHost, [&options] {
     auto report = std::make_shared<rapidjson::Document>();
     ValidateAllPlugins(PluginDirectory(), PluginSchemaDirectory(), *report);
+    // A manifest its schema refuses may not load at all; its findings say
+    // enough until it is fixed.
+    if (report->Empty()) AddOrderFaults(*report);
     // Host paths, as everywhere else in the output.
     for (auto& entry : report->GetArray()) {
       entry["file"].SetString(HoxPlatform::StripHostRoot(entry["file"].GetString()), report->GetAllocator());
