@@ -211,7 +211,7 @@ TEST_F(HoxcfgCliTest, EveryCommandThatPrintsHasItsJsonShape) {
     std::string args;
     std::vector<const char*> members;
   } cases[] = {
-      {"init --sample", {"root", "steps"}},
+      {"init --sample --reset", {"root", "steps"}},
       {"maintenance status", {"maintenanceMode"}},
       {"maintenance exit", {"maintenanceMode", "changed"}},
       {"schemas", {"keys", "errors"}},

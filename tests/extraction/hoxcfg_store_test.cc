@@ -38,8 +38,19 @@ TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExportsToAPrivateFile) {
   const auto* uuid = rapidjson::Pointer("/metadata/reference_host/uuid").Get(doc);
   ASSERT_NE(uuid, nullptr);
   EXPECT_STREQ(uuid->GetString(), "4c4c4544-0042-3510-8053-b4c04f4e3132");
-  // Run twice, init leaves the same host.
-  EXPECT_EQ(Run("init --sample").exitCode, 0);
+  // A second init, with or without the sample, refuses to touch the host
+  // and names the flag that replaces it; --reset does replace it.
+  StoreSql("UPDATE config_item SET value = '{\"hostname\":\"changed\"}' WHERE name = 'hostname'");
+  const std::string changed = Run("export").out;
+  ASSERT_NE(changed, exported.out);
+  for (const char* again : {"init --sample", "init", "init --sample --json"}) {
+    const HoxcfgOutcome refused = Run(again);
+    EXPECT_EQ(refused.exitCode, 2) << again;
+    EXPECT_NE(refused.err.find("a host already exists at " + root_.path()), std::string::npos) << refused.err;
+    EXPECT_NE(refused.err.find("--reset"), std::string::npos) << refused.err;
+    EXPECT_EQ(Run("export").out, changed) << again;
+  }
+  EXPECT_EQ(Run("init --sample --reset").exitCode, 0);
   EXPECT_EQ(Run("export").out, exported.out);
 
   const std::string file = root_.Path("/tmp/host.json");

@@ -157,6 +157,8 @@ void SetAction(CLI::App* command, GlobalOptions& options, Needs needs, std::func
 // Throws Failure "no host at ROOT: run `hoxcfg init --root ROOT`" (exit 2)
 // unless the root holds a host (its configuration store).
 void RequireHost();
+// True when the root holds a host: its configuration store exists.
+bool HostExists();
 
 // The whole tool: builds the application with `registrars` (each adds its
 // commands), parses the line and runs the command. Returns the exit status.

@@ -253,10 +253,14 @@ void SetAction(CLI::App* command, GlobalOptions& options, Needs needs, std::func
   });
 }
 
+bool HostExists() {
+  std::error_code ec;
+  return std::filesystem::is_regular_file(HoxPlatform::HostPath(HoxPlatform::HostPaths::kStore), ec);
+}
+
 void RequireHost() {
   const std::string root = HoxPlatform::HostRoot();
-  std::error_code ec;
-  if (!std::filesystem::is_regular_file(HoxPlatform::HostPath(HoxPlatform::HostPaths::kStore), ec)) {
+  if (!HostExists()) {
     throw Failure("no host at " + root, "run `hoxcfg init --root " + root + "`");
   }
 }

@@ -44,12 +44,19 @@ void RegisterInit(CLI::App& app, GlobalOptions& options) {
                          {{kExitOk, "the host root is ready"}, {kExitUsage, kUsageStatus}});
   auto sample = std::make_shared<bool>(false);
   auto force = std::make_shared<bool>(false);
+  auto reset = std::make_shared<bool>(false);
   cmd->add_flag("--sample", *sample, "Also load the sample host: configuration, host facts, SSH and auto-deployment files");
   cmd->add_flag("--force", *force, "Allow initialising the real root /");
-  SetAction(cmd, options, Needs::kNothing, [&options, sample, force] {
+  cmd->add_flag("--reset", *reset,
+                "Replace the host already at the root: its installed files and, with --sample, its configuration");
+  SetAction(cmd, options, Needs::kNothing, [&options, sample, force, reset] {
     const std::string root = HoxPlatform::HostRoot();
     if (root == "/" && !*force) {
       throw Failure("refusing to initialise the real root /", "pass --root DIR, or --force to mean it");
+    }
+    // A second init by mistake must not wipe the host's configuration.
+    if (HostExists() && !*reset) {
+      throw Failure("a host already exists at " + root + "; nothing was changed", "pass --reset to replace it");
     }
     auto steps = std::make_shared<std::vector<std::string>>(InitHostRoot(LocateProductFiles(), *sample));
     AuditChange(*sample ? "host root initialised with the sample host" : "host root initialised");
