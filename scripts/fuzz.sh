@@ -8,6 +8,8 @@
 # The seed corpora in fuzz/corpus/ are only read; inputs the fuzzer
 # finds go to build/fuzz/corpus/TARGET, crashing inputs to
 # build/fuzz/findings/TARGET. Exits non-zero on the first finding.
+# HOX_FUZZ_SEED=N fixes libFuzzer's seed (CI does, so that a red run is
+# reproducible with the same command); unset or 0, each run draws its own.
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 cd "$top"
@@ -38,7 +40,7 @@ for target in "${targets[@]}"; do
   # -rss_limit_mb: a reader that ignores its bound shows as a finding, not
   # as a machine out of memory. -timeout: one input must not take seconds.
   if ! "$out/fuzz/fuzz_$target" "$out/corpus/$target" "fuzz/corpus/$target" \
-      -max_total_time="$seconds" -rss_limit_mb=2048 -timeout=10 -print_final_stats=1 \
+      -max_total_time="$seconds" -seed="${HOX_FUZZ_SEED:-0}" -rss_limit_mb=2048 -timeout=10 -print_final_stats=1 \
       -artifact_prefix="$out/findings/$target/" >"$log" 2>&1; then
     tail -n 40 "$log" >&2
     echo "fuzz_$target: FINDING (input and log in $out/findings/$target/)" >&2
