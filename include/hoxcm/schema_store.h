@@ -106,6 +106,9 @@ class HOXCM_API SchemaStore {
   virtual std::vector<SchemaObjectId> ListKeys() const = 0;
   // Schema files that failed to load: "path: reason", one per file.
   virtual std::vector<std::string> GetLoadErrors() const = 0;
+  // True, with the file and the reason, when the key's schema file was
+  // refused (when the key was looked up); false otherwise.
+  virtual bool GetLoadError(const SchemaObjectId& id, std::string& file, std::string& reason) const;
 };
 
 // Per-store cache used by GenerateSchemaDocument.
@@ -119,6 +122,12 @@ class HOXCM_API SchemaCache {
 HOXCM_API std::shared_ptr<SchemaObject> GetSchema(const std::string& component, const std::string& group,
                                                   const std::string& key,
                                                   const std::shared_ptr<SchemaStore>& store);
+
+// Throws SchemaNotFound 2021 naming `what` (the item path, or "c:g:k") for
+// the key `id`, which has no schema in `store`. When the key's file was
+// refused, the exception's location names the file and the reason.
+[[noreturn]] HOXCM_API void ThrowSchemaNotFound(const SchemaStore* store, const SchemaObjectId& id,
+                                                const std::string& what);
 
 // Builds into `out` the JSON schema of a host document shaped like `value`
 // (components, groups, keys): an object schema whose properties follow the

@@ -57,7 +57,7 @@ std::vector<DesiredConfigInput> GenerateBootTimeTasks(const Document& desired) {
     if (!schema) {
       CSLogger::Log(CSLogger::kError, "Schema not found for %s:%s:%s", id.component.c_str(), id.group.c_str(),
                     id.key.c_str());
-      ThrowException<SchemaNotFound>(SchemaObjectNotFound, item.Path());
+      HoxSchemaStore::ThrowSchemaNotFound(store.get(), {id.component, id.group, id.key}, item.Path());
     }
     CSLogger::Log(CSLogger::kInfo, "Remediating configuration for %s", id.toString().c_str());
     if (!schema->IsMultiInstance()) {

@@ -422,7 +422,7 @@ void computeComponents(const Value& source, const Value& other, Allocator& alloc
       if (!schema) {
         CSLogger::Log(CSLogger::kError, "Schema not found for %s:%s:%s", id.component.c_str(), id.group.c_str(),
                       id.key.c_str());
-        ThrowException<SchemaNotFound>(SchemaObjectNotFound, path);
+        HoxSchemaStore::ThrowSchemaNotFound(store_.get(), {id.component, id.group, id.key}, path);
       }
       if (!reverse_) {
         walk_.CompareItem(item.value, otherItem != nullptr ? *otherItem : NullValue(), id, schema, path);

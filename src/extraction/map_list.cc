@@ -62,7 +62,8 @@ class SchemaLookup {
       // A stored item without a schema cannot be cleaned, identified or
       // validated: refuse the extraction rather than guess.
       if (!schema_) {
-        ThrowException<SchemaNotFound>(SchemaObjectNotFound, SchemaObjectId(component, group, key).toString());
+        const SchemaObjectId id(component, group, key);
+        HoxSchemaStore::ThrowSchemaNotFound(store_.get(), id, id.toString());
       }
       component_ = component;
       group_ = group;

@@ -103,5 +103,61 @@ TEST_F(HoxcfgStoreTest, ErrorsPrintTheCodeAndNothingOnStdout) {
   EXPECT_NE(refused.err.find("refusing"), std::string::npos) << refused.err;
 }
 
+TEST_F(HoxcfgStoreTest, InitFromAnExportMakesACopyOfTheHost) {
+  // Given the export of the sample host, a root initialised from it should
+  // take the reference host's identity, export the same document and comply
+  // with it; a schema file that turns bad is named when its key is used.
+  InitSample();
+  const std::string exported = root_.Path("/tmp/host.json");
+  ASSERT_EQ(Run("export -o " + exported).exitCode, 0);
+  const std::string copy = "--root " + root_.Path("/copy");
+  const HoxcfgOutcome init = Run("init " + copy + " --from " + exported);
+  ASSERT_EQ(init.exitCode, 0) << init.err;
+  EXPECT_NE(init.out.find("host identity 4c4c4544-0042-3510-8053-b4c04f4e3132 (the document's reference host)"),
+            std::string::npos)
+      << init.out;
+  EXPECT_EQ(Run("export " + copy).out, Run("export").out);
+  EXPECT_EQ(Run("compliance " + copy + " " + exported).out, "compliant\n");
+
+  const std::string dns = "/copy/usr/lib/tarvik/configmanager/schemas/network/dns/config.json";
+  root_.WriteFile(dns, R"({"multiInstance": false, "schema": )");
+  const HoxcfgOutcome broken = Run("compliance " + copy + " " + exported);
+  EXPECT_EQ(broken.exitCode, 2);
+  EXPECT_EQ(broken.err.rfind("hoxcfg: " + root_.Path(dns) + ": error 2021: ", 0), 0u) << broken.err;
+  EXPECT_NE(broken.err.find("not valid JSON"), std::string::npos) << broken.err;
+}
+
+TEST_F(HoxcfgStoreTest, InitChecksEverySchemaFileAndLoadsADocumentWholeOrNotAtAll) {
+  // Given a schema tree with a refused file, init should list it (exit 1),
+  // and a document with keys that have no usable schema should be refused
+  // with those keys named, leaving the user configuration as it was.
+  root_.CopyTree("data/sample-host/schemas", "/tmp/schemas");
+  root_.WriteFile("/tmp/schemas/bad/x/key.json", R"({"multiInstance": false})");
+  const std::string schemas = " --schemas " + root_.Path("/tmp/schemas");
+  const HoxcfgOutcome init = Run("init" + schemas);
+  EXPECT_EQ(init.exitCode, 1);
+  EXPECT_NE(init.out.find("refused schema file " + root_.Path(std::string(HoxPlatform::HostPaths::kSchemaDirectory)) + "/bad/x/key.json: "), std::string::npos)
+      << init.out;
+  EXPECT_EQ(Run("schemas --check").exitCode, 1);
+
+  Document doc = SampleDocument("user-config.json");
+  auto& a = doc.GetAllocator();
+  for (const char* component : {"none", "bad"}) {
+    Value group(rapidjson::kObjectType), key(rapidjson::kObjectType);
+    key.AddMember("key", Value(rapidjson::kObjectType), a);
+    group.AddMember("x", key, a);
+    doc.AddMember(Value(component, a), group, a);
+  }
+  root_.WriteFile("/tmp/doc.json", JsonToString(doc));
+  const HoxcfgOutcome refused = Run("init --reset --from " + root_.Path("/tmp/doc.json") + schemas);
+  EXPECT_EQ(refused.exitCode, 2);
+  for (const char* named : {"no usable schema for 2 of its", "/none/x/key, /bad/x/key (its schema file was refused: ",
+                            "nothing was loaded"}) {
+    EXPECT_NE(refused.err.find(named), std::string::npos) << named << ": " << refused.err;
+  }
+  EXPECT_EQ(Run("show user --compact").out, "{\"profile\":{}}\n");
+  EXPECT_EQ(Run("init --sample --from " + root_.Path("/tmp/doc.json")).exitCode, 2);
+}
+
 }  // namespace
 }  // namespace hoxcm_test

@@ -81,13 +81,32 @@ void RegisterSchemas(CLI::App& app, GlobalOptions& options) {
                          {{kExitOk, "every schema file loaded"},
                           {kExitNegative, "some failed to load: they are listed"},
                           {kExitUsage, kUsageStatus}});
-  SetAction(cmd, options, Needs::kHost, [&options] {
+  auto check = std::make_shared<bool>(false);
+  cmd->add_flag("--check", *check, "Only check every schema file: list the ones that fail to load");
+  SetAction(cmd, options, Needs::kHost, [&options, check] {
     auto store = HoxSchemaStore::SchemaStore::GetStore();
     if (!store) {
       HoxConfigManager::ThrowException<HoxConfigManager::ConfigManagerException>(
           HoxConfigManager::SchemaStoreAccessFailed);
     }
+    // Every file is read and checked here, as a lookup of its key would.
     const std::vector<std::string> errors = store->GetLoadErrors();
+    if (*check) {
+      const std::size_t loaded = store->ListKeys().size();
+      Print(options, {[loaded, errors] {
+                        std::string text = std::to_string(loaded) + " keys loaded, " +
+                                           (errors.empty() ? "no" : std::to_string(errors.size())) +
+                                           " schema files refused\n";
+                        for (const std::string& e : errors) text += "  " + e + "\n";
+                        return text;
+                      },
+                      [errors] {
+                        rapidjson::Document list(rapidjson::kArrayType);
+                        for (const std::string& e : errors) list.PushBack(rapidjson::Value(e, list.GetAllocator()), list.GetAllocator());
+                        return CheckShape("errors", list);
+                      }});
+      return errors.empty() ? kExitOk : kExitNegative;
+    }
     Print(options, {[store, errors] {
                       Table table({"ITEM", "INSTANCES", "IDENTITY"});
                       for (const auto& id : store->ListKeys()) {

@@ -41,15 +41,24 @@ void RedactDocument(rapidjson::Document& doc) {
 
 void RegisterInit(CLI::App& app, GlobalOptions& options) {
   auto* cmd = AddCommand(app, "init", "Create a host root: store, schemas, manifest schemas, runners, plugins",
-                         {{kExitOk, "the host root is ready"}, {kExitUsage, kUsageStatus}});
-  auto sample = std::make_shared<bool>(false);
+                         {{kExitOk, "the host root is ready"},
+                          {kExitNegative, "it is, but schema files were refused: each is listed"},
+                          {kExitUsage, kUsageStatus}});
+  auto request = std::make_shared<InitRequest>();
   auto force = std::make_shared<bool>(false);
   auto reset = std::make_shared<bool>(false);
-  cmd->add_flag("--sample", *sample, "Also load the sample host: configuration, host facts, SSH and auto-deployment files");
+  cmd->add_flag("--sample", request->sample, "Also load the sample host: configuration, host facts, SSH and auto-deployment files");
+  cmd->add_option("--from", request->from,
+                  "Load DOCUMENT, a host document (as export writes it), as the user configuration "
+                  "('-': standard input)")
+      ->type_name("DOCUMENT");
+  cmd->add_option("--schemas", request->schemas, "Install the key schemas of DIR instead of the sample host's")
+      ->type_name("DIR");
   cmd->add_flag("--force", *force, "Allow initialising the real root /");
   cmd->add_flag("--reset", *reset,
-                "Replace the host already at the root: its installed files and, with --sample, its configuration");
-  SetAction(cmd, options, Needs::kNothing, [&options, sample, force, reset] {
+                "Replace the host already at the root: its installed files and, with --sample or --from, its "
+                "configuration");
+  SetAction(cmd, options, Needs::kNothing, [&options, request, force, reset] {
     const std::string root = HoxPlatform::HostRoot();
     if (root == "/" && !*force) {
       throw Failure("refusing to initialise the real root /", "pass --root DIR, or --force to mean it");
@@ -58,23 +67,28 @@ void RegisterInit(CLI::App& app, GlobalOptions& options) {
     if (HostExists() && !*reset) {
       throw Failure("a host already exists at " + root + "; nothing was changed", "pass --reset to replace it");
     }
-    auto steps = std::make_shared<std::vector<std::string>>(InitHostRoot(LocateProductFiles(), *sample));
-    AuditChange(*sample ? "host root initialised with the sample host" : "host root initialised");
-    Print(options, {[steps] {
+    auto report = std::make_shared<InitReport>(InitHostRoot(LocateProductFiles(), *request));
+    AuditChange(request->sample          ? "host root initialised with the sample host"
+                : !request->from.empty() ? "host root initialised from " + request->from
+                                         : "host root initialised");
+    Print(options, {[report] {
                       std::string text;
-                      for (const std::string& line : *steps) text += line + "\n";
+                      for (const std::string& line : report->steps) text += line + "\n";
                       return text;
                     },
-                    [steps, root] {
+                    [report, root] {
                       rapidjson::Document out(rapidjson::kObjectType);
                       auto& a = out.GetAllocator();
                       rapidjson::Value list(rapidjson::kArrayType);
-                      for (const std::string& line : *steps) list.PushBack(rapidjson::Value(line, a), a);
+                      for (const std::string& line : report->steps) list.PushBack(rapidjson::Value(line, a), a);
+                      rapidjson::Value refused(rapidjson::kArrayType);
+                      for (const std::string& e : report->refusedSchemas) refused.PushBack(rapidjson::Value(e, a), a);
                       out.AddMember("root", rapidjson::Value(root, a), a);
                       out.AddMember("steps", list, a);
+                      out.AddMember("refusedSchemas", refused, a);
                       return out;
                     }});
-    return kExitOk;
+    return report->refusedSchemas.empty() ? kExitOk : kExitNegative;
   });
 }
 

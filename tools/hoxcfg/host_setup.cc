@@ -1,6 +1,7 @@
 #include "hoxcfg/host_setup.h"
 
 #include <filesystem>
+#include <optional>
 #include <string_view>
 #include <system_error>
 
@@ -10,6 +11,8 @@
 #include <hoxcm/host.h>
 #include <hoxcm/host_documents.h>
 #include <hoxcm/schema_store.h>
+
+#include <rapidjson/pointer.h>
 
 #include "hoxcfg/cli.h"
 
@@ -43,24 +46,23 @@ void MakeDirs(const std::string& path, mode_t mode = 0755) {
 // Installs a copy of `from` at `to` with `mode`. The new file replaces the
 // old one atomically: a reader (a plugin run, a schema load) sees the old
 // file or the whole new one, never a partial copy.
-void CopyFile(const std::string& from, const std::string& to, mode_t mode, FileKind kind) {
+void CopyFile(const std::string& from, const std::string& to, mode_t mode, FileKind kind,
+              HoxPlatform::Durability durability = HoxPlatform::Durability::kDurable) {
   MakeDirs(fs::path(to).parent_path().string());
-  Checked([&] {
-    HoxPlatform::WriteFileAtomically(to, HoxPlatform::ReadFile(from, kind), mode,
-                                     HoxPlatform::Durability::kDurable);
-  });
+  Checked([&] { HoxPlatform::WriteFileAtomically(to, HoxPlatform::ReadFile(from, kind), mode, durability); });
 }
 
 // Copies the regular files below `from` to `to`, keeping the relative layout
 // and replacing files that exist. Returns the number of files copied.
-int CopyTree(const std::string& from, const std::string& to, mode_t mode, FileKind kind) {
+int CopyTree(const std::string& from, const std::string& to, mode_t mode, FileKind kind,
+             HoxPlatform::Durability durability = HoxPlatform::Durability::kDurable) {
   const HoxPlatform::DirectoryListing listing = HoxPlatform::ListFiles(from);
   if (!listing.problems.empty()) {
     const auto& problem = listing.problems.front();
     throw Failure("cannot copy " + problem.path + ": " + problem.reason);
   }
   for (const std::string& file : listing.files) {
-    CopyFile(file, (fs::path(to) / fs::path(file).lexically_relative(from)).string(), mode, kind);
+    CopyFile(file, (fs::path(to) / fs::path(file).lexically_relative(from)).string(), mode, kind, durability);
   }
   return static_cast<int>(listing.files.size());
 }
@@ -68,6 +70,8 @@ int CopyTree(const std::string& from, const std::string& to, mode_t mode, FileKi
 constexpr mode_t kExecutable = 0755;
 constexpr mode_t kReadable = 0644;
 constexpr mode_t kPrivate = 0600;
+// Keys named in full when a document is refused for keys without schema.
+constexpr std::size_t kMaxListed = 10;
 
 std::string InstallRunner(const std::string& from, const char* name) {
   const std::string target = Under(std::string(HostPaths::kRunnerDirectory) + "/" + name);
@@ -126,6 +130,100 @@ std::vector<std::string> InstallSampleHost(const std::string& sampleDir) {
   return report;
 }
 
+// Installs the schema files: `tree` when given, else the sample host's.
+// A tree may hold tens of thousands of files: each is replaced atomically,
+// but not flushed to disk one by one, which would take minutes.
+std::string InstallSchemas(const std::string& tree, const std::string& sampleDir) {
+  const std::string from = tree.empty() ? sampleDir + "/schemas" : tree;
+  if (!IsDir(from)) return "skipped schemas: none shipped (looked in " + from + ")";
+  const int count = CopyTree(from, Under(HostPaths::kSchemaDirectory), kReadable, FileKind::Schema,
+                             HoxPlatform::Durability::kAtomic);
+  return "installed schemas: " + std::to_string(count) + " files" + (tree.empty() ? "" : " from " + tree);
+}
+
+// Reads every schema file, as the drift walk, validation and the boot path
+// would one by one: a broken file is named now, not when its key is used.
+std::vector<std::string> CheckSchemas(std::vector<std::string>& refused) {
+  auto store = HoxSchemaStore::SchemaStore::GetStore();
+  if (!store) return {"skipped the schema check: no schema directory"};
+  refused = store->GetLoadErrors();
+  const std::size_t keys = store->ListKeys().size();
+  std::vector<std::string> report{"checked the schema files: " + std::to_string(keys) + " keys, " +
+                                  (refused.empty() ? "none" : std::to_string(refused.size())) + " refused"};
+  for (const std::string& error : refused) report.push_back("refused schema file " + error);
+  return report;
+}
+
+// The host this root stands for: the document's reference host when it names
+// one (its host-specific sections are then this host's), else the sample
+// host's identity when the root has none. Host facts default to the sample's.
+std::vector<std::string> InstallHostIdentity(const rapidjson::Value& document, const std::string& sampleDir) {
+  std::vector<std::string> report;
+  const rapidjson::Value* uuid = rapidjson::Pointer("/metadata/reference_host/uuid").Get(document);
+  const std::string identity = Under(HostPaths::kProductUuid);
+  if (uuid != nullptr && uuid->IsString() && uuid->GetStringLength() > 0) {
+    MakeDirs(fs::path(identity).parent_path().string());
+    Checked([&] {
+      HoxPlatform::WriteFileAtomically(identity, std::string(uuid->GetString()) + "\n", kReadable,
+                                       HoxPlatform::Durability::kDurable);
+    });
+    report.push_back("host identity " + std::string(uuid->GetString()) + " (the document's reference host)");
+  } else if (!IsFile(identity) && !IsFile(Under(HostPaths::kMachineId))) {
+    CopyFile(sampleDir + "/product_uuid", identity, kReadable, FileKind::HostFile);
+    report.push_back("installed the sample host's identity (the document names no reference host)");
+  }
+  if (!IsFile(Under(HostPaths::kHostFacts))) {
+    CopyFile(sampleDir + "/host-facts.json", Under(HostPaths::kHostFacts), kReadable, FileKind::HostFile);
+    report.push_back("installed the sample host's facts");
+  }
+  return report;
+}
+
+// Loads the items of `file` (as it applies to this host) as the user
+// configuration, replacing it. Every key must have a schema that loads:
+// otherwise nothing is loaded and the keys are named.
+std::string LoadHostDocument(rapidjson::Document file, const std::string& path) {
+  namespace Shape = HoxConfigManager::DocumentShape;
+  rapidjson::Document doc;
+  InDocument(path, [&] { HoxConfigManager::CreateMergedDocument(std::move(file), doc); });
+  auto store = HoxSchemaStore::SchemaStore::GetStore();
+  if (!store) {
+    HoxConfigManager::ThrowException<HoxConfigManager::ConfigManagerException>(
+        HoxConfigManager::SchemaStoreAccessFailed);
+  }
+  std::vector<std::string> missing;
+  std::size_t keys = 0;
+  std::size_t items = 0;
+  InDocument(path, [&] {
+    Shape::ForEachItem(Shape::Unwrap(static_cast<const rapidjson::Value&>(doc)), [&](const Shape::Item<const rapidjson::Value>& item) {
+      ++keys;
+      if (store->Find(item.component.GetString(), item.group.GetString(), item.key.GetString())) {
+        items += item.value.IsArray() ? item.value.Size() : 1;
+        return;
+      }
+      // A key whose file was refused is named with the reason.
+      std::string line = item.Path(), file, reason;
+      if (store->GetLoadError({item.component.GetString(), item.group.GetString(), item.key.GetString()}, file,
+                              reason)) {
+        line += " (its schema file was refused: " + reason + ")";
+      }
+      missing.push_back(std::move(line));
+    });
+  });
+  if (!missing.empty()) {
+    std::string list;
+    for (std::size_t i = 0; i < missing.size() && i < kMaxListed; ++i) list += (i == 0 ? "" : ", ") + missing[i];
+    if (missing.size() > kMaxListed) list += ", and " + std::to_string(missing.size() - kMaxListed) + " more";
+    throw Failure("no usable schema for " + std::to_string(missing.size()) + " of its " + std::to_string(keys) +
+                      " keys: " + list,
+                  "install their schemas (--schemas DIR) or leave them out; nothing was loaded", kExitUsage,
+                  InFile(path));
+  }
+  InDocument(path, [&] { HoxConfigStore::ImportConfiguration(HoxConfigStore::ConfigKind::User, doc); });
+  return "loaded " + std::to_string(items) + " items of " + std::to_string(keys) + " keys from " + path +
+         " as the user configuration";
+}
+
 }  // namespace
 
 ProductFiles LocateProductFiles() {
@@ -153,14 +251,26 @@ ProductFiles LocateProductFiles() {
   return files;
 }
 
-std::vector<std::string> InitHostRoot(const ProductFiles& files, bool sample) {
+InitReport InitHostRoot(const ProductFiles& files, const InitRequest& request) {
   const std::string sampleDir = files.dataDir + "/sample-host";
-  if (sample && !IsDir(sampleDir)) {
+  if (request.sample && (!request.from.empty() || !request.schemas.empty())) {
+    throw Failure("--sample loads the sample host with its own schemas", "leave out --from and --schemas");
+  }
+  if (!request.schemas.empty() && !IsDir(request.schemas)) {
+    throw Failure("no schema directory at " + request.schemas, "name a directory of <component>/<group>/<key>.json");
+  }
+  if ((request.sample || !request.from.empty()) && !IsDir(sampleDir)) {
     throw Failure("the sample host is not shipped (looked in " + sampleDir + ")");
   }
-  std::vector<std::string> report;
-  report.push_back("host root " + HoxPlatform::HostRoot() + " (product files from " +
-                   (files.fromBuildTree ? "the build tree" : "the installation") + ")");
+  // A document that cannot be loaded refuses the command before the root
+  // is touched.
+  std::optional<rapidjson::Document> document;
+  if (!request.from.empty()) document = ReadConfigurationDocument(request.from);
+
+  InitReport report;
+  auto& steps = report.steps;
+  steps.push_back("host root " + HoxPlatform::HostRoot() + " (product files from " +
+                  (files.fromBuildTree ? "the build tree" : "the installation") + ")");
   for (std::string_view dir : {HostPaths::kSchemaDirectory, HostPaths::kManifestDirectory,
                                HostPaths::kManifestSchemaDirectory, HostPaths::kRunnerDirectory,
                                HostPaths::kLifecycleDirectory, HostPaths::kStoreDirectory}) {
@@ -168,33 +278,31 @@ std::vector<std::string> InitHostRoot(const ProductFiles& files, bool sample) {
   }
   MakeDirs(fs::path(Under(HostPaths::kHostFacts)).parent_path().string());
 
-  const std::string schemas = files.dataDir + "/sample-host/schemas";
-  if (IsDir(schemas)) {
-    report.push_back("installed schemas: " +
-                     std::to_string(CopyTree(schemas, Under(HostPaths::kSchemaDirectory), kReadable, FileKind::Schema)) +
-                     " files");
-  } else {
-    report.push_back("skipped schemas: none shipped (looked in " + schemas + ")");
-  }
+  steps.push_back(InstallSchemas(request.schemas, sampleDir));
   const std::string manifestSchemas = files.dataDir + "/plugin_schemas";
   if (IsDir(manifestSchemas)) {
-    report.push_back("installed manifest schemas: " +
-                     std::to_string(CopyTree(manifestSchemas, Under(HostPaths::kManifestSchemaDirectory), kReadable,
-                                             FileKind::ManifestSchema)) +
-                     " files");
+    steps.push_back("installed manifest schemas: " +
+                    std::to_string(CopyTree(manifestSchemas, Under(HostPaths::kManifestSchemaDirectory), kReadable,
+                                            FileKind::ManifestSchema)) +
+                    " files");
   } else {
-    report.push_back("skipped manifest schemas: none shipped (looked in " + manifestSchemas + ")");
+    steps.push_back("skipped manifest schemas: none shipped (looked in " + manifestSchemas + ")");
   }
-  report.push_back(InstallRunner(files.cppRunner, "cpp_plugin_runner"));
-  report.push_back(InstallRunner(files.pyRunner, "py_plugin_runner"));
-  report.push_back(InstallSamplePlugins(files));
+  steps.push_back(InstallRunner(files.cppRunner, "cpp_plugin_runner"));
+  steps.push_back(InstallRunner(files.pyRunner, "py_plugin_runner"));
+  steps.push_back(InstallSamplePlugins(files));
 
   const auto db = HoxConfigStore::GetDBStore(0, true);
   if (!db) throw Failure("cannot create the configuration store");
-  report.push_back("configuration store " + db->GetPath());
+  steps.push_back("configuration store " + db->GetPath());
+  for (std::string& line : CheckSchemas(report.refusedSchemas)) steps.push_back(std::move(line));
 
-  if (sample) {
-    for (std::string& line : InstallSampleHost(sampleDir)) report.push_back(std::move(line));
+  if (request.sample) {
+    for (std::string& line : InstallSampleHost(sampleDir)) steps.push_back(std::move(line));
+  }
+  if (document) {
+    for (std::string& line : InstallHostIdentity(*document, sampleDir)) steps.push_back(std::move(line));
+    steps.push_back(LoadHostDocument(std::move(*document), request.from));
   }
   return report;
 }

@@ -21,11 +21,28 @@ struct ProductFiles {
 // The build tree when this program runs from it, else the installation.
 ProductFiles LocateProductFiles();
 
-// Creates the host root under HOX_ROOT: directories, the store, the schemas,
-// the manifest schemas, the runners and the sample plugins found in `files`;
-// with `sample`, also the sample host's facts, DMI uuid, SSH files and its
-// user and default configuration. Returns one line per step, naming what it
-// skipped. Throws Failure or the library's exceptions on failure.
-std::vector<std::string> InitHostRoot(const ProductFiles& files, bool sample);
+// What init loads besides the product's files.
+struct InitRequest {
+  bool sample = false;  // the sample host: configuration, host facts, SSH files
+  std::string schemas;  // a schema tree installed instead of the sample host's
+  std::string from;     // a host document loaded as the user configuration
+};
+
+// One line per step, naming what was skipped; the schema files refused
+// when every file was checked ("path: reason").
+struct InitReport {
+  std::vector<std::string> steps;
+  std::vector<std::string> refusedSchemas;
+};
+
+// Creates the host root under HOX_ROOT: directories, the store, the schemas
+// (the request's tree or the sample host's), the manifest schemas, the
+// runners and the sample plugins found in `files`, then checks every schema
+// file. With `sample`, also the sample host's facts, DMI uuid, SSH files and
+// its user and default configuration. With `from`, the host document's items
+// become the user configuration, all or none: a key without a usable schema
+// refuses the document before anything is loaded. Throws Failure or the
+// library's exceptions on failure.
+InitReport InitHostRoot(const ProductFiles& files, const InitRequest& request);
 
 }  // namespace hoxcfg

@@ -34,6 +34,7 @@ std::size_t SchemaObjectIdHash::operator()(const SchemaObjectId& id) const {
 SchemaObject::~SchemaObject() = default;
 bool SchemaObject::IsHostSpecific() const { return false; }
 SchemaStore::~SchemaStore() = default;
+bool SchemaStore::GetLoadError(const SchemaObjectId&, std::string&, std::string&) const { return false; }
 SchemaCache::~SchemaCache() = default;
 
 namespace detail {
@@ -142,7 +143,7 @@ const DirectorySchemaStore::Entry& DirectorySchemaStore::Loaded(const SchemaObje
   entry.schema = LoadSchemaFile(path, id, reason);
   if (!entry.schema) {
     CSLogger::Log(CSLogger::kError, "Schema file %s was not loaded: %s", path.c_str(), reason.c_str());
-    entry.error = path + ": " + reason;
+    entry.error = std::move(reason);
   }
   entry.loaded.store(true, std::memory_order_release);
   return entry;
@@ -168,20 +169,27 @@ std::vector<std::string> DirectorySchemaStore::GetLoadErrors() const {
   CheckAll();
   std::vector<std::string> errors = layoutErrors_;
   for (const auto& [id, entry] : index_) {
-    if (!entry.error.empty()) errors.push_back(entry.error);
+    if (!entry.error.empty()) errors.push_back(FilePath(id) + ": " + entry.error);
   }
   std::sort(errors.begin(), errors.end());
   return errors;
+}
+
+bool DirectorySchemaStore::GetLoadError(const SchemaObjectId& id, std::string& file, std::string& reason) const {
+  auto it = index_.find(id);
+  if (it == index_.end() || !it->second.loaded.load(std::memory_order_acquire) || it->second.error.empty()) {
+    return false;
+  }
+  file = FilePath(id);
+  reason = it->second.error;
+  return true;
 }
 
 std::string DirectorySchemaStore::GetSchemaInfo(const std::string& component, const std::string& group,
                                                 const std::string& key) const {
   const SchemaObjectId id(component, group, key);
   auto schema = FindKey(id);
-  if (!schema) {
-    HoxConfigManager::ThrowException<HoxConfigManager::SchemaNotFound>(HoxConfigManager::SchemaObjectNotFound,
-                                                                       id.toString());
-  }
+  if (!schema) ThrowSchemaNotFound(this, id, id.toString());
   rapidjson::StringBuffer buffer;
   rapidjson::Writer<rapidjson::StringBuffer> writer(buffer);
   writer.StartObject();
@@ -221,6 +229,15 @@ std::vector<SchemaObjectId> DirectorySchemaStore::ListKeys() const {
 std::shared_ptr<SchemaStore> SchemaStore::GetStore() { return detail::GetRootEntry().store; }
 
 std::shared_ptr<SchemaCache> SchemaStore::GetCache() { return detail::GetRootEntry().cache; }
+
+void ThrowSchemaNotFound(const SchemaStore* store, const SchemaObjectId& id, const std::string& what) {
+  HoxConfigManager::ErrorLocation where;
+  if (store != nullptr && store->GetLoadError(id, where.file, where.reason)) {
+    HoxConfigManager::ThrowExceptionAt<HoxConfigManager::SchemaNotFound>(std::move(where),
+                                                                         HoxConfigManager::SchemaObjectNotFound, what);
+  }
+  HoxConfigManager::ThrowException<HoxConfigManager::SchemaNotFound>(HoxConfigManager::SchemaObjectNotFound, what);
+}
 
 std::shared_ptr<SchemaObject> GetSchema(const std::string& component, const std::string& group, const std::string& key,
                                         const std::shared_ptr<SchemaStore>& store) {

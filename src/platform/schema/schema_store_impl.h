@@ -40,6 +40,7 @@ class DirectorySchemaStore final : public SchemaStore {
   std::set<SchemaObjectId> GetMutableDefaultIds() const override;
   std::vector<SchemaObjectId> ListKeys() const override;
   std::vector<std::string> GetLoadErrors() const override;
+  bool GetLoadError(const SchemaObjectId& id, std::string& file, std::string& reason) const override;
 
   // Null when the key has no file or its file was refused (the refusal is
   // logged with the file's path when the key is first looked up).
@@ -56,7 +57,7 @@ class DirectorySchemaStore final : public SchemaStore {
   struct Entry {
     mutable std::atomic<bool> loaded{false};
     mutable std::shared_ptr<KeySchema> schema;  // null when the file was refused
-    mutable std::string error;                  // "path: reason" when it was
+    mutable std::string error;                  // why it was
   };
 
   const Entry& Loaded(const SchemaObjectId& id, const Entry& entry) const;
