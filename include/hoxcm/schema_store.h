@@ -2,9 +2,10 @@
 // read from one schema file per key below <root>/usr/lib/tarvik/configmanager/schemas/
 // (format: docs/schema-store.md), and the JSON schema validator.
 //
-// Schemas are loaded lazily, once per process and root, and are immutable
-// afterwards: SchemaStore, SchemaObject and the cache may be shared between
-// threads freely.
+// A root's store lists its schema files once per process; each key's file is
+// read and checked when the key is first looked up, and its schema is
+// immutable afterwards: SchemaStore, SchemaObject and the cache may be shared
+// between threads freely.
 #pragma once
 
 #include <cstddef>
