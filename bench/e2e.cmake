@@ -5,3 +5,6 @@ target_link_libraries(host_generate PRIVATE hoxcm_bench_docs)
 
 add_executable(parse_documents ${CMAKE_CURRENT_LIST_DIR}/parse_documents.cc)
 target_link_libraries(parse_documents PRIVATE hoxcm)
+
+add_executable(compliance_phases ${CMAKE_CURRENT_LIST_DIR}/compliance_phases.cc)
+target_link_libraries(compliance_phases PRIVATE hoxcm)
