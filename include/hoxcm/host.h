@@ -50,6 +50,8 @@ inline constexpr std::string_view kAutodeployWaiterNotify = "/etc/tarvik/autodep
 inline constexpr std::string_view kAutodeployFirewall = "/etc/tarvik/firewall/autodeploy.xml";
 // The system log's datagram socket: audit lines of changes to the host.
 inline constexpr std::string_view kSystemLog = "/dev/log";
+// The journal's socket for its native protocol: log records with fields.
+inline constexpr std::string_view kJournalSocket = "/run/systemd/journal/socket";
 
 // Every entry by a name of its own (the names of the script runner's copy).
 struct Entry {
@@ -80,6 +82,7 @@ inline constexpr Entry kTable[] = {
     {"autodeploy_waiter_notify", kAutodeployWaiterNotify},
     {"autodeploy_firewall", kAutodeployFirewall},
     {"system_log", kSystemLog},
+    {"journal_socket", kJournalSocket},
 };
 }  // namespace HostPaths
 
@@ -88,21 +91,54 @@ inline constexpr Entry kTable[] = {
 // The library's log. An embedding process hears only warnings and errors on
 // stderr unless it asks for more: the threshold and the destination come
 // from SetThreshold/SetDestination when called, else from HOX_LOG_LEVEL (-1
-// for none, 0 to 3 or error|warning|info|detail; default warning) and
-// HOX_LOG_SYSLOG (1 the system log instead of stderr, 2 both), read on every
-// call. The settings are process-wide; every function is thread-safe.
+// for none, 0 to 3 or error|warning|info|detail; default warning),
+// HOX_LOG_JOURNAL (1 the journal, 0 never) and HOX_LOG_SYSLOG (1 the system
+// log instead of stderr, 2 both), read on every call. A process that systemd
+// started with its stderr connected to the journal (JOURNAL_STREAM) writes
+// to the journal unless HOX_LOG_JOURNAL=0. Journal records carry their
+// priority, the identifier "hoxcm" (journalctl -t hoxcm) and the fields of
+// the thread's HoxPlatform::LogContext; a record the journal does not take
+// is written to stderr. The settings are process-wide; every function is
+// thread-safe.
 class HOXCM_API CSLogger {
  public:
   enum log_priority : int { kError = 0, kWarning = 1, kInfo = 2, kDetail = 3 };
-  enum class Destination { kStderr, kSyslog, kBoth };
+  enum class Destination { kStderr, kSyslog, kBoth, kJournal };
   // printf-style; one write per line.
   static void Log(int priority, const char* format, ...) __attribute__((format(printf, 2, 3)));
   static bool IsEnabled(int priority);
   // Lines up to `priority` are written (-1: none); overrides HOX_LOG_LEVEL.
   static void SetThreshold(int priority);
-  // Overrides HOX_LOG_SYSLOG.
+  // Overrides HOX_LOG_JOURNAL, HOX_LOG_SYSLOG and JOURNAL_STREAM.
   static void SetDestination(Destination destination);
+  // Whether records go to the journal now.
+  static bool WritesToJournal();
 };
+
+namespace HoxPlatform {
+
+// A structured field of the log records that this thread writes while the
+// context lives: the operation, the plugin or the configuration object being
+// worked on (journal fields HOXCM_OPERATION, HOXCM_PLUGIN, HOXCM_OBJECT).
+// Contexts nest: each restores the value it replaced when it ends. Values
+// name things (an operation, a plugin id, "component:group:key"), never
+// configuration values, so no secret reaches a field.
+class HOXCM_API LogContext final {
+ public:
+  enum class Field { kOperation, kPlugin, kObject };
+  LogContext(Field field, std::string value);
+  ~LogContext();
+  LogContext(const LogContext&) = delete;
+  LogContext& operator=(const LogContext&) = delete;
+  // This thread's current value of `field`; empty when none is set.
+  static const std::string& Current(Field field);
+
+ private:
+  const Field field_;
+  std::string previous_;
+};
+
+}  // namespace HoxPlatform
 
 namespace HoxPlatform {
 

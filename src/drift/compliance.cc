@@ -104,6 +104,7 @@ void CheckComplianceHandler::PropertyDrift(const Value& desired, const Value& cu
 }
 
 void CheckCompliance(Document& desired, ComplianceResult& result, std::shared_ptr<TaskHandle> task) {
+  const HoxPlatform::LogContext operation(HoxPlatform::LogContext::Field::kOperation, "CheckCompliance");
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "CheckCompliance");
   CheckComplianceHandler handler(&result);
   ComputeDrift(desired, desired.GetAllocator(), handler, std::nullopt);

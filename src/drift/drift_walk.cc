@@ -418,6 +418,7 @@ void computeComponents(const Value& source, const Value& other, Allocator& alloc
       ConfigStoreObjectId id(std::string(NameOf(item.component)), std::string(NameOf(item.group)),
                              std::string(NameOf(item.key)));
       const std::string path = DocumentShape::ItemPath(id.component, id.group, id.key);
+      const HoxPlatform::LogContext object(HoxPlatform::LogContext::Field::kObject, path);
       auto schema = HoxSchemaStore::GetSchema(id.component, id.group, id.key, store_);
       if (!schema) {
         CSLogger::Log(CSLogger::kError, "Schema not found for %s:%s:%s", id.component.c_str(), id.group.c_str(),

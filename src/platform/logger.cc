@@ -12,6 +12,8 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include "platform/journal.h"
+
 namespace {
 
 // Settings made through the API; kUnset defers to the environment.
@@ -46,24 +48,19 @@ const char* PriorityName(int priority) {
   }
 }
 
-int SyslogPriority(int priority) {
-  switch (priority) {
-    case CSLogger::kError: return LOG_ERR;
-    case CSLogger::kWarning: return LOG_WARNING;
-    case CSLogger::kInfo: return LOG_INFO;
-    default: return LOG_DEBUG;
-  }
-}
-
-// 0 stderr only, 1 syslog only, 2 both; HOX_LOG_SYSLOG unless set through the API.
-int SyslogMode() {
+// Where records go: HOX_LOG_JOURNAL, HOX_LOG_SYSLOG and JOURNAL_STREAM
+// unless set through the API.
+CSLogger::Destination CurrentDestination() {
   const int set = DestinationSetting().load(std::memory_order_relaxed);
-  if (set != kUnset) return set;
+  if (set != kUnset) return static_cast<CSLogger::Destination>(set);
+  const char* journal = std::getenv("HOX_LOG_JOURNAL");
+  if (journal != nullptr && std::strcmp(journal, "1") == 0) return CSLogger::Destination::kJournal;
   const char* s = std::getenv("HOX_LOG_SYSLOG");
-  if (s == nullptr) return 0;
-  if (std::strcmp(s, "1") == 0) return 1;
-  if (std::strcmp(s, "2") == 0) return 2;
-  return 0;
+  if (s != nullptr && std::strcmp(s, "1") == 0) return CSLogger::Destination::kSyslog;
+  if (s != nullptr && std::strcmp(s, "2") == 0) return CSLogger::Destination::kBoth;
+  const bool journalOff = journal != nullptr && std::strcmp(journal, "0") == 0;
+  if (!journalOff && HoxPlatform::StderrIsJournal()) return CSLogger::Destination::kJournal;
+  return CSLogger::Destination::kStderr;
 }
 
 }  // namespace
@@ -78,9 +75,10 @@ void CSLogger::SetThreshold(int priority) {
 }
 
 void CSLogger::SetDestination(Destination destination) {
-  const int mode = destination == Destination::kStderr ? 0 : destination == Destination::kSyslog ? 1 : 2;
-  DestinationSetting().store(mode, std::memory_order_relaxed);
+  DestinationSetting().store(static_cast<int>(destination), std::memory_order_relaxed);
 }
+
+bool CSLogger::WritesToJournal() { return CurrentDestination() == Destination::kJournal; }
 
 void CSLogger::Log(int priority, const char* format, ...) {
   if (format == nullptr || !IsEnabled(priority)) return;
@@ -98,9 +96,16 @@ void CSLogger::Log(int priority, const char* format, ...) {
   line += ": ";
   line += text;
   line += '\n';
-  const int mode = SyslogMode();
-  if (mode != 0) ::syslog(LOG_USER | SyslogPriority(priority), "%s", text);
-  if (mode != 1) {
+  const Destination destination = CurrentDestination();
+  bool toStderr = destination == Destination::kStderr || destination == Destination::kBoth;
+  if (destination == Destination::kSyslog || destination == Destination::kBoth) {
+    ::syslog(LOG_USER | HoxPlatform::JournalPriority(priority), "%s", text);
+  }
+  // A record the journal does not take is not lost: it goes to stderr.
+  if (destination == Destination::kJournal) {
+    toStderr = !HoxPlatform::SendToJournal(HoxPlatform::JournalRecord(priority, text));
+  }
+  if (toStderr) {
     const ssize_t written = ::write(STDERR_FILENO, line.data(), line.size());
     (void)written;
   }

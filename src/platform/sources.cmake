@@ -2,6 +2,7 @@
 list(APPEND HOXCM_SOURCES
   src/platform/failpoint.cc
   src/platform/logger.cc
+  src/platform/journal.cc
   src/platform/system_log.cc
   src/platform/paths.cc
 )

@@ -6,6 +6,7 @@
 
 #include <pwd.h>
 #include <sys/socket.h>
+#include <sys/time.h>
 #include <sys/un.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -18,6 +19,7 @@
 #include <vector>
 
 #include "platform/file_descriptor.h"
+#include "platform/local_socket.h"
 
 namespace HoxPlatform {
 namespace {
@@ -52,11 +54,17 @@ std::string OneLine(std::string_view text) {
   return line;
 }
 
-bool SendDatagram(const std::string& socketPath, const std::string& message) {
+}  // namespace
+
+bool SendLocalDatagram(const std::string& socketPath, std::string_view message, int waitMillis) {
   struct sockaddr_un address {};
   if (socketPath.size() >= sizeof address.sun_path) return false;
   FileDescriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
   if (socket.get() < 0) return false;
+  if (waitMillis > 0) {
+    const struct timeval limit {waitMillis / 1000, (waitMillis % 1000) * 1000};
+    ::setsockopt(socket.get(), SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit);
+  }
   address.sun_family = AF_UNIX;
   std::memcpy(address.sun_path, socketPath.c_str(), socketPath.size() + 1);
   ssize_t sent;
@@ -67,8 +75,6 @@ bool SendDatagram(const std::string& socketPath, const std::string& message) {
   return sent == static_cast<ssize_t>(message.size());
 }
 
-}  // namespace
-
 bool AuditLog(std::string_view program, std::string_view event) {
   char stamp[32] = "";
   const std::time_t now = std::time(nullptr);
@@ -78,8 +84,8 @@ bool AuditLog(std::string_view program, std::string_view event) {
   const std::string message = "<" + std::to_string(LOG_AUTHPRIV | LOG_NOTICE) + ">" + stamp + " " +
                               OneLine(program) + "[" + std::to_string(::getpid()) + "]: " + OneLine(event) +
                               " by " + OneLine(Who());
-  if (SendDatagram(HostPath(HostPaths::kSystemLog), message)) return true;
-  return HostRoot() != "/" && SendDatagram(std::string(HostPaths::kSystemLog), message);
+  if (SendLocalDatagram(HostPath(HostPaths::kSystemLog), message)) return true;
+  return HostRoot() != "/" && SendLocalDatagram(std::string(HostPaths::kSystemLog), message);
 }
 
 }  // namespace HoxPlatform

@@ -81,6 +81,7 @@ PluginLauncher::~PluginLauncher() {
 }
 
 void PluginLauncher::ForkPlugin(std::shared_ptr<PluginMonitor> monitor) {
+  const HoxPlatform::LogContext plugin(HoxPlatform::LogContext::Field::kPlugin, id);
   CSLogger::Log(CSLogger::kInfo, "Forking plugin for id=%s", id.c_str());
   const std::string program = HoxPlatform::HostPath(type == "python" ? HoxPlatform::HostPaths::kPythonRunner
                                                                       : HoxPlatform::HostPaths::kCppRunner);

@@ -37,6 +37,7 @@ Document CopyOf(const Document& source) {
 std::shared_ptr<CheckApplyResult> CheckApplyWith(Document& desired, const std::string& operationContext,
                                                  std::shared_ptr<TaskHandle> task, ImpactReasons* reasons,
                                                  LockingSource source) {
+  const HoxPlatform::LogContext operation(HoxPlatform::LogContext::Field::kOperation, "CheckApply");
   CSLogger::Log(CSLogger::kDetail, "CheckApply operation invoked.");
   if (!task) task = TaskHandle::Dummy();
   PluginRunner* runner = source(*task);
@@ -127,6 +128,7 @@ ApplyResult ApplySteps(const std::shared_ptr<CheckApplyResult>& check, const std
 
 ApplyResult ApplyWith(const std::shared_ptr<CheckApplyResult>& check, std::shared_ptr<TaskHandle> task,
                       LockingSource source) {
+  const HoxPlatform::LogContext operation(HoxPlatform::LogContext::Field::kOperation, "Apply");
   // The line says "completed" at entry; callers and their log readers
   // match it as it is.
   CSLogger::Log(CSLogger::kDetail, "Apply operation completed.");

@@ -111,6 +111,7 @@ void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& 
 void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& result,
             std::shared_ptr<TaskHandle> taskHandle, std::optional<Document> currentDocument, ImpactReasons* reasons,
             PluginRunner& runner) {
+  const HoxPlatform::LogContext operation(HoxPlatform::LogContext::Field::kOperation, "Impact");
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "Impact");
   std::shared_ptr<TaskHandle> task = taskHandle ? std::move(taskHandle) : TaskHandle::Dummy();
   ImpactHandler handler(reasons != nullptr);

@@ -228,6 +228,7 @@ void Validate(const Document& desiredDocument, const Document& schemaDocument, c
 void Validate(const Document& desiredDocument, const Document& schemaDocument, const std::string& taskId,
               ValidationResult& result, bool checkSchema, std::shared_ptr<TaskHandle> taskHandle,
               PluginRunner& runner) {
+  const HoxPlatform::LogContext operation(HoxPlatform::LogContext::Field::kOperation, "Validate");
   CSLogger::Log(CSLogger::kInfo, "ConfigManager Validate API invoked");
   std::shared_ptr<TaskHandle> task = taskHandle ? std::move(taskHandle) : TaskHandle::Dummy();
   const Value& root = DocumentShape::Unwrap(desiredDocument);

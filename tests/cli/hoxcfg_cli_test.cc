@@ -15,33 +15,11 @@
 #include <hoxcm/documents.h>
 #include <hoxcm/host_documents.h>
 
+#include "support/datagram_socket.h"
 #include "support/run_hoxcfg.h"
 
 namespace hoxcm_test {
 namespace {
-
-// The sandbox host's system log: a datagram socket at <root>/dev/log.
-class SystemLog {
- public:
-  explicit SystemLog(const TempRoot& root) : fd_(::socket(AF_UNIX, SOCK_DGRAM, 0)) {
-    root.WriteFile("/dev/.keep", "");
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    std::strncpy(address.sun_path, root.Path("/dev/log").c_str(), sizeof address.sun_path - 1);
-    EXPECT_EQ(::bind(fd_, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
-  }
-  ~SystemLog() { ::close(fd_); }
-  // The lines received so far.
-  std::vector<std::string> Lines() const {
-    std::vector<std::string> lines;
-    char buffer[2048];
-    for (ssize_t n; (n = ::recv(fd_, buffer, sizeof buffer, MSG_DONTWAIT)) > 0;) lines.emplace_back(buffer, n);
-    return lines;
-  }
-
- private:
-  const int fd_;
-};
 
 class HoxcfgCliTest : public ::testing::Test {
  protected:
@@ -151,7 +129,7 @@ TEST_F(HoxcfgCliTest, MaintenanceModeIsScriptableConfirmedAndAudited) {
   // status, a change should need --yes without a terminal, and each change
   // (not a repeated one) should leave one line in the host's system log.
   InitSample();
-  SystemLog log(root_);
+  DatagramSocket log(root_, "/dev/log");
   EXPECT_EQ(Run("maintenance status").out, "maintenance mode: off\n");
   const HoxcfgOutcome quiet = Run("maintenance status -q");
   EXPECT_EQ(quiet.exitCode, 1);
@@ -161,20 +139,20 @@ TEST_F(HoxcfgCliTest, MaintenanceModeIsScriptableConfirmedAndAudited) {
   EXPECT_EQ(refused.err,
             "hoxcfg: refusing to put the host into maintenance mode without a terminal to ask: pass --yes to confirm\n");
   EXPECT_EQ(Run("maintenance status").exitCode, 1);
-  EXPECT_TRUE(log.Lines().empty());
+  EXPECT_TRUE(log.Received().empty());
 
   const HoxcfgOutcome entered = Run("maintenance enter --yes");
   EXPECT_EQ(entered.exitCode, 0) << entered.err;
   EXPECT_EQ(entered.out, "maintenance mode: on\n");
   EXPECT_EQ(Run("-q maintenance status").exitCode, 0);
-  const std::vector<std::string> lines = log.Lines();
+  const std::vector<std::string> lines = log.Received();
   ASSERT_EQ(lines.size(), 1u);
   EXPECT_EQ(lines[0].rfind("<85>", 0), 0u) << lines[0];  // authpriv.notice
   EXPECT_NE(lines[0].find(" hoxcfg["), std::string::npos) << lines[0];
   EXPECT_NE(lines[0].find("]: maintenance mode entered at root " + root_.path() + " by user "), std::string::npos)
       << lines[0];
   EXPECT_EQ(Run("maintenance enter -y").out, "maintenance mode: on (unchanged)\n");
-  EXPECT_TRUE(log.Lines().empty());
+  EXPECT_TRUE(log.Received().empty());
 }
 
 TEST_F(HoxcfgCliTest, DriftAndComplianceAnswerByExitStatusAndSpellItemsOneWay) {

@@ -176,10 +176,13 @@ void ApplyGlobalOptions(GlobalOptions& options) {
     ::setenv("HOX_ROOT", options.root.c_str(), 1);
   }
   // The library's log is for diagnosis: the tool says itself what went
-  // wrong, and some lines the library logs as errors are not failures. It
-  // stays silent unless -v (or HOX_LOG_LEVEL) asks for it.
+  // wrong, and some lines the library logs as errors are not failures. On a
+  // terminal it stays silent unless -v (or HOX_LOG_LEVEL) asks for it; under
+  // systemd (or HOX_LOG_JOURNAL=1) the journal keeps its information lines.
   if (options.verbose > 0 && !options.quiet) {
     CSLogger::SetThreshold(options.verbose == 1 ? CSLogger::kInfo : CSLogger::kDetail);
+  } else if (std::getenv("HOX_LOG_LEVEL") == nullptr && CSLogger::WritesToJournal()) {
+    CSLogger::SetThreshold(CSLogger::kInfo);
   } else if (options.quiet || std::getenv("HOX_LOG_LEVEL") == nullptr) {
     CSLogger::SetThreshold(-1);
   }
