@@ -4,7 +4,8 @@ hoxcm_add_test(hoxcfg_cli_test
   cli/hoxcfg_boot_test.cc
   cli/hoxcfg_cli_test.cc
   cli/hoxcfg_docs_test.cc
-  cli/hoxcfg_item_test.cc)
+  cli/hoxcfg_item_test.cc
+  cli/journal_test.cc)
 if(TARGET hoxcfg)
   add_dependencies(hoxcfg_cli_test hoxcfg cpp_plugin_runner hoxcm_sample_network)
 endif()
@@ -15,4 +16,12 @@ if(TARGET hoxcfg)
   add_test(NAME systemd.units_verify
            COMMAND ${CMAKE_CURRENT_SOURCE_DIR}/cli/verify-units.sh ${CMAKE_BINARY_DIR}/systemd-test)
   set_tests_properties(systemd.units_verify PROPERTIES SKIP_RETURN_CODE 77)
+endif()
+
+# Man pages and bash completion, made from hoxcfg --help, against it.
+if(TARGET hoxcfg_help_pages)
+  find_package(Python3 REQUIRED COMPONENTS Interpreter)
+  add_test(NAME cli.man_pages_and_completion_follow_the_help
+    COMMAND Python3::Interpreter ${CMAKE_CURRENT_LIST_DIR}/help_pages_test.py $<TARGET_FILE:hoxcfg>
+            $<TARGET_FILE_DIR:hoxcfg>/man $<TARGET_FILE_DIR:hoxcfg>/completion/hoxcfg)
 endif()
