@@ -7,4 +7,4 @@ set_target_properties(hoxcm_sample_network PROPERTIES
   LIBRARY_OUTPUT_DIRECTORY ${CMAKE_BINARY_DIR}/sample-plugins/network)
 target_link_libraries(hoxcm_sample_network PRIVATE hoxcm)
 install(TARGETS hoxcm_sample_network
-  LIBRARY DESTINATION ${CMAKE_INSTALL_DATADIR}/hoxcm/sample-plugins/network)
+  LIBRARY DESTINATION ${HOXCM_INSTALL_SAMPLE_PLUGINDIR}/network)

@@ -86,18 +86,16 @@ std::string InstallSamplePlugins(const ProductFiles& files) {
   // Manifests, script modules and plugin libraries: readable by everyone,
   // as an installation leaves them.
   const int count = CopyTree(manifests, Under(HostPaths::kManifestDirectory), kReadable, FileKind::Program);
-  // Built C++ plugins sit in the build tree at the path they take below the
-  // manifest directory, beside their manifests; an installation ships them
-  // inside the manifest tree already.
+  // Built C++ plugins sit in a tree of their own (the build tree, or the
+  // installation's library directory) at the path they take below the
+  // manifest directory, beside their manifests.
   int libraries = 0;
   if (IsDir(files.pluginLibDir)) {
     libraries = CopyTree(files.pluginLibDir, Under(HostPaths::kManifestDirectory), kExecutable, FileKind::Program);
   }
   std::string line = "installed sample plugins: " + std::to_string(count) + " files";
-  if (files.fromBuildTree) {
-    line += libraries > 0 ? ", " + std::to_string(libraries) + " built plugin libraries"
-                          : "; skipped C++ plugin libraries: not built (looked in " + files.pluginLibDir + ")";
-  }
+  line += libraries > 0 ? ", " + std::to_string(libraries) + " C++ plugin libraries"
+                        : "; skipped C++ plugin libraries: none found (looked in " + files.pluginLibDir + ")";
   return line;
 }
 
@@ -238,15 +236,21 @@ ProductFiles LocateProductFiles() {
     files.cppRunner = buildDir + "/runners/cpp_plugin_runner";
     files.pyRunner = sourceDir + "/runners/py_plugin_runner";
     files.pluginLibDir = buildDir + "/sample-plugins";
+    files.manifestSchemaDir = files.dataDir + "/plugin_schemas";
   } else {
-    // An installation may have been moved (cmake --install --prefix): look
-    // beside the program first, then where it was configured to go.
-    const fs::path prefix = fs::path(exe).parent_path().parent_path();
-    const bool relocated = !ec && IsDir((prefix / "share/hoxcm").string());
-    files.dataDir = relocated ? (prefix / "share/hoxcm").string() : HOXCM_INSTALLED_DATA_DIR;
-    const std::string libexec = relocated ? (prefix / "libexec/hoxcm").string() : HOXCM_INSTALLED_LIBEXEC_DIR;
-    files.cppRunner = libexec + "/cpp_plugin_runner";
-    files.pyRunner = libexec + "/py_plugin_runner";
+    // The installed layout below the prefix is fixed at build time; the
+    // prefix itself is where this program is (an installation may have been
+    // moved, or unpacked below another root), else where it was configured.
+    fs::path prefix = !ec ? fs::path(exe).parent_path() : fs::path();
+    for (auto part = fs::path(HOXCM_INSTALL_BINDIR).begin(); part != fs::path(HOXCM_INSTALL_BINDIR).end(); ++part) {
+      prefix = prefix.parent_path();
+    }
+    if (prefix.empty() || !IsDir((prefix / HOXCM_INSTALL_DATADIR).string())) prefix = HOXCM_INSTALL_PREFIX;
+    files.dataDir = (prefix / HOXCM_INSTALL_DATADIR).string();
+    files.manifestSchemaDir = (prefix / HOXCM_INSTALL_MANIFEST_SCHEMADIR).string();
+    files.cppRunner = (prefix / HOXCM_INSTALL_RUNNERDIR / "cpp_plugin_runner").string();
+    files.pyRunner = (prefix / HOXCM_INSTALL_RUNNERDIR / "py_plugin_runner").string();
+    files.pluginLibDir = (prefix / HOXCM_INSTALL_SAMPLE_PLUGINDIR).string();
   }
   return files;
 }
@@ -279,7 +283,7 @@ InitReport InitHostRoot(const ProductFiles& files, const InitRequest& request) {
   MakeDirs(fs::path(Under(HostPaths::kHostFacts)).parent_path().string());
 
   steps.push_back(InstallSchemas(request.schemas, sampleDir));
-  const std::string manifestSchemas = files.dataDir + "/plugin_schemas";
+  const std::string& manifestSchemas = files.manifestSchemaDir;
   if (IsDir(manifestSchemas)) {
     steps.push_back("installed manifest schemas: " +
                     std::to_string(CopyTree(manifestSchemas, Under(HostPaths::kManifestSchemaDirectory), kReadable,

@@ -11,10 +11,11 @@ namespace hoxcfg {
 // Where the files that init installs come from. An empty path means "not
 // found"; init says so and goes on.
 struct ProductFiles {
-  std::string dataDir;       // sample-host/, plugin_schemas/, sample-plugins/
+  std::string dataDir;       // sample-host/, sample-plugins/ (their manifests and scripts)
+  std::string manifestSchemaDir;  // the manifest schemas
   std::string cppRunner;     // the C++ plugin runner program
   std::string pyRunner;      // the Python plugin runner script
-  std::string pluginLibDir;  // build tree only: C++ sample plugins, laid out as below apply_modules
+  std::string pluginLibDir;  // C++ sample plugins, laid out as below apply_modules
   bool fromBuildTree = false;
 };
 
