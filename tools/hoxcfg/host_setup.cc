@@ -242,9 +242,8 @@ ProductFiles LocateProductFiles() {
     // prefix itself is where this program is (an installation may have been
     // moved, or unpacked below another root), else where it was configured.
     fs::path prefix = !ec ? fs::path(exe).parent_path() : fs::path();
-    for (auto part = fs::path(HOXCM_INSTALL_BINDIR).begin(); part != fs::path(HOXCM_INSTALL_BINDIR).end(); ++part) {
-      prefix = prefix.parent_path();
-    }
+    const fs::path binDir(HOXCM_INSTALL_BINDIR);  // "bin": one level below the prefix
+    for (auto level = binDir.begin(); level != binDir.end(); ++level) prefix = prefix.parent_path();
     if (prefix.empty() || !IsDir((prefix / HOXCM_INSTALL_DATADIR).string())) prefix = HOXCM_INSTALL_PREFIX;
     files.dataDir = (prefix / HOXCM_INSTALL_DATADIR).string();
     files.manifestSchemaDir = (prefix / HOXCM_INSTALL_MANIFEST_SCHEMADIR).string();
