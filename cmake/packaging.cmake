@@ -86,10 +86,9 @@ set(CPACK_DEBIAN_DEV_DESCRIPTION [=[host configuration manager (development file
 Headers, the CMake package (find_package(hoxcm)) and the pkg-config file
 hoxcm.pc for programs and plugins built against the hoxcm library.]=])
 
-# Maintainer scripts: the systemd units' state on install and removal. The
-# units are those the runtime component installs (HOXCM_SYSTEMD_UNITS, the
-# names of the unit files).
-string(JOIN " " HOXCM_SYSTEMD_UNITS ${HOXCM_SYSTEMD_UNITS})
+# Maintainer scripts: the state of the systemd units that the runtime
+# component installs (systemd/units.cmake) on install and removal.
+string(JOIN " " HOXCM_SYSTEMD_UNITS ${HOXCM_UNITS})
 foreach(script IN ITEMS postinst postrm)
   configure_file("${CMAKE_CURRENT_LIST_DIR}/debian/${script}.in" "${CMAKE_CURRENT_BINARY_DIR}/debian/${script}" @ONLY
                  FILE_PERMISSIONS OWNER_READ OWNER_WRITE OWNER_EXECUTE GROUP_READ GROUP_EXECUTE WORLD_READ WORLD_EXECUTE)
