@@ -37,10 +37,13 @@ for path in usr/bin/hoxcfg usr/lib/tarvik/configmanager/bin/cpp_plugin_runner \
             usr/lib/"$multiarch"/libhoxcm.so usr/include/hoxcm/operations.h \
             usr/lib/"$multiarch"/cmake/hoxcm/hoxcmConfig.cmake usr/lib/"$multiarch"/pkgconfig/hoxcm.pc \
             usr/share/man/man1/hoxcfg.1.gz usr/share/bash-completion/completions/hoxcfg \
-            usr/share/doc/hoxcm/copyright; do
+            usr/share/doc/hoxcm/copyright usr/lib/systemd/system/hoxcm-boot.service \
+            usr/lib/systemd/system/hoxcm-bootstrap.service; do
   [ -e "$inst/$path" ] || fail "/$path is not installed"
 done
 ls "$inst"/usr/lib/tarvik/configmanager/plugin_schemas/*.json >/dev/null || fail "no manifest schemas installed"
+grep -q '^ExecStart=/usr/bin/hoxcfg ' "$inst/usr/lib/systemd/system/hoxcm-boot.service" ||
+  fail "the boot service does not run the installed hoxcfg"
 for dir in var/lib/tarvik/configstore var/tarvik/lifecycle; do
   [ "$(stat -c %a "$inst/$dir")" = 700 ] || fail "/$dir has mode $(stat -c %a "$inst/$dir"), not 700"
 done
