@@ -166,6 +166,7 @@ TEST(HoxcfgDocsTest, EveryJsonOutputHasTheDocumentedShape) {
   root.WriteFile("/tmp/desired.json", document);
   root.WriteFile("/tmp/schema.json", R"({"type": "object", "properties": {"mtu": {"type": "integer", "minimum": 1280}}})");
   root.WriteFile("/tmp/value.json", R"({"mtu": 9})");
+  root.WriteFile("/tmp/syslog.json", R"({"remoteHost": "logs.example.com", "port": 514, "protocol": "udp"})");
   root.WriteFile("/tmp/smartnic.json", R"({"smartnic": {"ports": {"uplink": {"mtu": 9000}}}})");
   const std::string desired = root.Path("/tmp/desired.json");
   // In order: what changes the host comes after what only reads it.
@@ -185,6 +186,9 @@ TEST(HoxcfgDocsTest, EveryJsonOutputHasTheDocumentedShape) {
       {"apply", "--yes apply " + desired},
       {"maintenance exit", "--yes maintenance exit"},
       {"history", "history"},
+      {"get", "get services/syslog/config"},
+      {"set", "--yes set services/syslog/config --file " + root.Path("/tmp/syslog.json")},
+      {"delete", "--yes delete services/syslog/config"},
       {"bootstrap", "--yes bootstrap " + desired},
       {"boot run", "--yes boot run"},
       {"boot complete", "--yes boot complete"},
