@@ -9,16 +9,8 @@ set -euo pipefail
 hoxcfg=$1
 export HOX_ROOT=$2
 
-show() {
-  echo
-  echo "== $1"
-  shift
-  echo "\$ hoxcfg $*"
-  set +e
-  "$hoxcfg" "$@"
-  echo "(exit $?)"
-  set -e
-}
+# shellcheck source=scripts/demo-show.sh
+source "$(dirname "$0")/demo-show.sh"
 
 # change DOCUMENT OUTPUT PYTHON: writes OUTPUT, the export DOCUMENT changed by
 # the Python statements (p is the profile, h this host's own section).

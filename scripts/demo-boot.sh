@@ -9,16 +9,8 @@ set -euo pipefail
 hoxcfg=$1
 export HOX_ROOT=$2
 
-show() {
-  echo
-  echo "== $1"
-  shift
-  echo "\$ hoxcfg $*"
-  set +e
-  "$hoxcfg" "$@"
-  echo "(exit $?)"
-  set -e
-}
+# shellcheck source=scripts/demo-show.sh
+source "$(dirname "$0")/demo-show.sh"
 
 autodeploy=("$HOX_ROOT/etc/tarvik/autodeploy/waiterNotify.json" "$HOX_ROOT/etc/tarvik/firewall/autodeploy.xml")
 "$hoxcfg" export --output "$HOX_ROOT/demo-boot-base.json"

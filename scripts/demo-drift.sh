@@ -9,16 +9,8 @@ hoxcfg=$1
 export HOX_ROOT=$2
 doc="$HOX_ROOT/demo-desired.json"
 
-show() {
-  echo
-  echo "== $1"
-  shift
-  echo "\$ hoxcfg $*"
-  set +e
-  "$hoxcfg" "$@"
-  echo "(exit $?)"
-  set -e
-}
+# shellcheck source=scripts/demo-show.sh
+source "$(dirname "$0")/demo-show.sh"
 
 "$hoxcfg" export --output "$doc"
 show "The exported document matches the host" compliance "$doc"

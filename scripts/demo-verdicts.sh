@@ -8,16 +8,8 @@ set -euo pipefail
 hoxcfg=$1
 export HOX_ROOT=$2
 
-show() {
-  echo
-  echo "== $1"
-  shift
-  echo "\$ hoxcfg $*"
-  set +e
-  "$hoxcfg" "$@"
-  echo "(exit $?)"
-  set -e
-}
+# shellcheck source=scripts/demo-show.sh
+source "$(dirname "$0")/demo-show.sh"
 
 # Writes the host's export, changed by the Python statements given, to FILE.
 changed() {
