@@ -171,7 +171,7 @@ TEST(HoxcfgDocsTest, EveryJsonOutputHasTheDocumentedShape) {
   const std::string desired = root.Path("/tmp/desired.json");
   // In order: what changes the host comes after what only reads it.
   const std::vector<std::pair<std::string, std::string>> runs = {
-      {"init", "--root " + fresh.path() + " init --sample"},
+      {"init", "--root " + fresh.path() + " init --sample --reset"},  // the temporary root has a store already
       {"schemas", "schemas"},
       {"schema-check", "schema-check " + root.Path("/tmp/schema.json") + " " + root.Path("/tmp/value.json")},
       {"plugins list", "plugins list"},
