@@ -20,11 +20,9 @@ namespace {
 // returns what it prints.
 std::string RunWithRunner(const std::string& code) {
   const std::string script =
-      "import importlib.machinery, importlib.util, json\n"
-      "loader = importlib.machinery.SourceFileLoader('runner', '" + SourcePath("runners/py_plugin_runner") + "')\n"
-      "spec = importlib.util.spec_from_loader('runner', loader)\n"
-      "runner = importlib.util.module_from_spec(spec)\n"
-      "loader.exec_module(runner)\n" + code;
+      "import json, runpy, types\n"
+      "runner = types.SimpleNamespace(**runpy.run_path('" + SourcePath("runners/py_plugin_runner") +
+      "', run_name='runner'))\n" + code;
   const std::string command = "python3 -c \"$HOXCM_SCRIPT\"";
   ::setenv("HOXCM_SCRIPT", script.c_str(), 1);
   std::unique_ptr<FILE, int (*)(FILE*)> pipe(::popen(command.c_str(), "r"), &::pclose);
