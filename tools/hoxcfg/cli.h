@@ -225,6 +225,10 @@ std::string ReportPathToItemName(const std::string& path, const rapidjson::Value
                                  const char* hostValue);
 // "a reboot", "maintenance mode" or "neither a reboot nor maintenance mode".
 const char* Requirement(int impact);
+// Adds an error's "id", "args" and "message" to `object`, as every command's
+// JSON spells an ErrorInfo.
+void AddErrorInfo(rapidjson::Value& object, const HoxConfigManager::ErrorInfo& error,
+                  rapidjson::Document::AllocatorType& a);
 // Why a document costs what it costs, one object a line and each of its
 // reasons below it, paths in the one spelling (`root`: the compared
 // document's root). Empty when nothing costs anything.

@@ -204,4 +204,13 @@ std::string ReasonsText(const HoxConfigManager::ImpactReasons& reasons, const ra
   return text;
 }
 
+void AddErrorInfo(rapidjson::Value& object, const HoxConfigManager::ErrorInfo& error,
+                  rapidjson::Document::AllocatorType& a) {
+  rapidjson::Value args(rapidjson::kArrayType);
+  for (const std::string& arg : error.args) args.PushBack(rapidjson::Value(arg, a), a);
+  object.AddMember("id", rapidjson::Value(error.id, a), a);
+  object.AddMember("args", args, a);
+  object.AddMember("message", rapidjson::Value(error.message, a), a);
+}
+
 }  // namespace hoxcfg

@@ -252,11 +252,7 @@ void RegisterApply(CLI::App& app, GlobalOptions& options) {
         body.AddMember("exitCode", outcome.exitCode, a);
         if (result && !result->errorInfo.id.empty()) {
           Value error(rapidjson::kObjectType);
-          error.AddMember("id", Value(result->errorInfo.id, a), a);
-          Value args(rapidjson::kArrayType);
-          for (const std::string& arg : result->errorInfo.args) args.PushBack(Value(arg, a), a);
-          error.AddMember("args", args, a);
-          error.AddMember("message", Value(result->errorInfo.message, a), a);
+          AddErrorInfo(error, result->errorInfo, a);
           body.AddMember("error", error, a);
         }
         PrintEvent("result", body);

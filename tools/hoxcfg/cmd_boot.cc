@@ -174,11 +174,7 @@ Answer BootStatusAnswer(std::shared_ptr<const Boot::BootApplyInfo> info) {
               rapidjson::Value entry(rapidjson::kObjectType);
               entry.AddMember("time", static_cast<int64_t>(e.time), a);
               entry.AddMember("localTime", rapidjson::Value(LocalTime(e.time, "%Y-%m-%dT%H:%M:%S%z"), a), a);
-              entry.AddMember("id", rapidjson::Value(e.errorInfo.id, a), a);
-              rapidjson::Value args(rapidjson::kArrayType);
-              for (const std::string& arg : e.errorInfo.args) args.PushBack(rapidjson::Value(arg, a), a);
-              entry.AddMember("args", args, a);
-              entry.AddMember("message", rapidjson::Value(e.errorInfo.message, a), a);
+              AddErrorInfo(entry, e.errorInfo, a);
               errors.PushBack(entry, a);
             }
             out.AddMember("errors", errors, a);

@@ -92,15 +92,10 @@ void RegisterValidate(CLI::App& app, GlobalOptions& options) {
       const std::string item = ReportPathToItemName(entry.field, root, nullptr);
       rapidjson::Value errors(rapidjson::kArrayType);
       for (const ErrorInfo& e : entry.errors) {
-        rapidjson::Value error(rapidjson::kObjectType), args(rapidjson::kArrayType);
+        rapidjson::Value error(rapidjson::kObjectType);
         std::string shown;
-        for (const std::string& arg : e.args) {
-          args.PushBack(rapidjson::Value(arg, a), a);
-          shown += (shown.empty() ? "" : ", ") + arg;
-        }
-        error.AddMember("id", rapidjson::Value(e.id, a), a);
-        error.AddMember("args", args, a);
-        error.AddMember("message", rapidjson::Value(e.message, a), a);
+        for (const std::string& arg : e.args) shown += (shown.empty() ? "" : ", ") + arg;
+        AddErrorInfo(error, e, a);
         error.AddMember("text", rapidjson::Value(Readable(e), a), a);
         errors.PushBack(error, a);
         text += FormatWhere(Where{*file, 0, 0, item}) + ": " + Readable(e) + " [" + e.id +
