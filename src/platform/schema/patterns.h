@@ -4,7 +4,7 @@
 // "^(a+)+$" takes seconds on a few dozen characters, and it recurses once per
 // character of the subject. For the one adapter the library uses, the
 // engine's "pattern", "patternProperties" and "format" checks are replaced
-// (explicit specializations declared in valijson.h) by checks that match
+// (explicit template instances declared in valijson.h) by checks that match
 // with SchemaPattern (RE2), in time linear in the subject.
 //
 // Every constraint the engine evaluates, and every byte it matches, is
