@@ -4,15 +4,10 @@
 #include <gtest/gtest.h>
 
 #include <signal.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
-#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <string>
-#include <thread>
-#include <vector>
 
 #include <hoxcm/config_store.h>
 #include <hoxcm/documents.h>
@@ -38,17 +33,10 @@ class HoxcfgBootTest : public ::testing::Test {
   HoxcfgBootTest() { EXPECT_EQ(Run("init --sample").exitCode, 0); }
   HoxcfgOutcome Run(const std::string& args) { return RunHoxcfg(root_, "--yes " + args); }
   // The sample host's export with the value at `pointer` (below "/profile")
-  // replaced by `json`; its path. By default a change that needs a reboot.
+  // replaced by `json`; by default a change that needs a reboot.
   std::string Document(const std::string& pointer = "/system/kernel/boot_options/hugepages",
                        const std::string& json = "4096") {
-    const std::string path = root_.Path("/boot.json");
-    EXPECT_EQ(Run("export -o " + path).exitCode, 0);
-    HoxConfigManager::Document doc, value;
-    HoxConfigManager::ParseDocument(root_.ReadFile("/boot.json"), doc);
-    HoxConfigManager::ParseDocument(json, value);
-    rapidjson::Pointer(("/profile" + pointer).c_str()).Set(doc, rapidjson::Value(value, doc.GetAllocator()));
-    root_.WriteFile("/boot.json", HoxConfigManager::JsonToString(doc));
-    return path;
+    return ExportWith(root_, "boot.json", {{pointer, json}});
   }
   bool Exists(const std::string& path) const { return std::filesystem::exists(root_.Path(path)); }
   std::string Staged() { return Run("show desired").out; }
@@ -67,16 +55,13 @@ class HoxcfgBootTest : public ::testing::Test {
 
 TEST_F(HoxcfgBootTest, ABootstrapThatNeedsARebootIsAppliedByTheNextBoot) {
   // Before the reboot: staged, both files moved into the store.
-  const HoxcfgOutcome staged = Run("bootstrap " + Document());
-  EXPECT_EQ(staged.exitCode, 3) << staged.err;
-  EXPECT_NE(staged.out.find("reboot the host"), std::string::npos) << staged.out;
+  RunSteps(root_, {{"--yes bootstrap " + Document(), 3, "reboot the host"}});
   EXPECT_FALSE(Exists(kWaiter));
   EXPECT_FALSE(Exists(kFirewall));
-  EXPECT_NE(Staged().find(R"("hugepages": 4096)"), std::string::npos);
+  EXPECT_TRUE(Has(Staged(), R"("hugepages": 4096)"));
 
   // After it: the boot service's two steps.
-  const HoxcfgOutcome run = Run("boot run");
-  EXPECT_EQ(run.exitCode, 0) << run.err;
+  RunSteps(root_, {{"--yes boot run", 0, ""}});
   EXPECT_EQ(Status(), "in progress (4)");
   EXPECT_EQ(Run("boot complete").exitCode, 0);
   EXPECT_EQ(Status(), "succeeded (0)");
@@ -86,12 +71,11 @@ TEST_F(HoxcfgBootTest, ABootstrapThatNeedsARebootIsAppliedByTheNextBoot) {
   HoxConfigManager::ParseDocument(root_.ReadFile(kWaiter), waiter);
   HoxConfigManager::ParseDocument(SampleFile(kWaiter), sample);
   EXPECT_EQ(waiter, sample);
-  EXPECT_NE(root_.ReadFile("/etc/tarvik/boot-options.conf").find("hugepages=4096"), std::string::npos);
-  EXPECT_EQ(Run("plan " + root_.Path("/boot.json")).exitCode, 0);  // the host complies
-  EXPECT_EQ(Staged().find("hugepages"), std::string::npos);         // consumed
-  const std::string history = Run("history --json").out;
-  EXPECT_NE(history.find(R"("kind": "bootstrap")"), std::string::npos) << history;
-  EXPECT_NE(history.find(R"("kind": "boot")"), std::string::npos) << history;
+  EXPECT_TRUE(Has(root_.ReadFile("/etc/tarvik/boot-options.conf"), "hugepages=4096"));
+  EXPECT_FALSE(Has(Staged(), "hugepages"));  // consumed
+  RunSteps(root_, {{"plan " + root_.Path("/boot.json"), 0, "compliant"},
+                   {"history --json", 0, R"("kind": "bootstrap")"},
+                   {"history --json", 0, R"("kind": "boot")"}});
 
   // A later boot finds nothing preserved and leaves the files alone.
   std::filesystem::remove(root_.Path(kFirewall));
@@ -106,7 +90,7 @@ TEST_F(HoxcfgBootTest, AKilledRunnerIsRecordedAsAFailureOnceTheBootIsComplete) {
   EXPECT_EQ(Run("boot complete").exitCode, 0);
   EXPECT_EQ(Status(),
             "failed com.tarvik.hox.settings.apply.plugin.unexpected.error com.tarvik.hox.settings.boot-restore.failed (1)");
-  EXPECT_NE(Run("boot status").out.find("[system kernel boot_options]"), std::string::npos);
+  EXPECT_TRUE(Has(Run("boot status").out, "[system kernel boot_options]"));
   // The files came back whatever became of the plugins.
   EXPECT_EQ(root_.ReadFile(kFirewall), SampleFile(kFirewall));
 }
@@ -116,41 +100,31 @@ TEST_F(HoxcfgBootTest, AKilledBootRunLosesNothingAndTheNextBootAppliesTheStagedC
   root_.WriteFile(kKernelPlugin,
                   "import os, time\n\ndef apply(request, host):\n"
                   "    open(os.path.join(host.root, 'started'), 'w').close()\n    time.sleep(2)\n");
-  const pid_t boot = ::fork();
-  if (boot == 0) {
-    const std::string command = "exec " + BuildPath("tools/hoxcfg") + " --yes boot run >/dev/null 2>&1";
-    ::execl("/bin/sh", "sh", "-c", command.c_str(), static_cast<char*>(nullptr));
-    ::_exit(127);
-  }
+  const pid_t boot = StartHoxcfg(root_, "--yes boot run", "boot");
   // Killed while the slow plugin runs; its runner finishes on its own.
-  for (int i = 0; i < 400 && !Exists("/started"); ++i) std::this_thread::sleep_for(std::chrono::milliseconds(50));
-  ASSERT_TRUE(Exists("/started"));
+  ASSERT_TRUE(WaitFor(root_, "/started", ""));
   ::kill(boot, SIGKILL);
-  int status = 0;
-  ::waitpid(boot, &status, 0);
+  ExitStatusOf(boot);
 
   EXPECT_EQ(root_.ReadFile(kFirewall), SampleFile(kFirewall));
-  EXPECT_NE(Staged().find(R"("hugepages": 4096)"), std::string::npos);
+  EXPECT_TRUE(Has(Staged(), R"("hugepages": 4096)"));
   root_.WriteFile(kKernelPlugin, kSampleKernelPlugin);
   EXPECT_EQ(Run("boot run").exitCode, 0);
   EXPECT_EQ(Run("boot complete").exitCode, 0);
   EXPECT_EQ(Status(), "succeeded (0)");
-  EXPECT_NE(root_.ReadFile("/etc/tarvik/boot-options.conf").find("hugepages=4096"), std::string::npos);
+  EXPECT_TRUE(Has(root_.ReadFile("/etc/tarvik/boot-options.conf"), "hugepages=4096"));
 }
 
 TEST_F(HoxcfgBootTest, AFirstBootDocumentIsConsumedAndADamagedRecordReported) {
   // A first-boot document applied at once is renamed, so it runs once.
-  const HoxcfgOutcome now = Run("bootstrap --consume " + Document("/network/dns/config/servers", R"(["10.20.0.12"])"));
-  EXPECT_EQ(now.exitCode, 0) << now.err;
+  RunSteps(root_, {{"--yes bootstrap --consume " + Document("/network/dns/config/servers", R"(["10.20.0.12"])"), 0, ""}});
   EXPECT_FALSE(Exists("/boot.json"));
   EXPECT_TRUE(Exists("/boot.json.applied"));
 
   // A damaged record is reported as such.
   HoxConfigStore::setBootApplyRecord("{");
   HoxConfigStore::SetBootComplete(true);
-  const HoxcfgOutcome damaged = Run("boot status");
-  EXPECT_EQ(damaged.exitCode, 2);
-  EXPECT_NE(damaged.err.find("the boot-apply record is damaged: error 2000"), std::string::npos) << damaged.err;
+  RunSteps(root_, {{"boot status", 2, "the boot-apply record is damaged: error 2000"}});
 }
 
 }  // namespace

@@ -158,17 +158,12 @@ TEST(HoxcfgDocsTest, EveryJsonOutputHasTheDocumentedShape) {
   // values, at every depth.
   TempRoot root, fresh;
   ASSERT_EQ(RunHoxcfg(root, "init --sample").exitCode, 0);
-  std::string document = RunHoxcfg(root, "export").out;
-  const std::string rules = "\"rules\": [";
-  ASSERT_NE(document.find(rules), std::string::npos);
-  document.insert(document.find(rules) + rules.size(),
-                  R"({"action": "allow", "name": "web", "port": 443, "protocol": "tcp"}, )");
-  root.WriteFile("/tmp/desired.json", document);
+  const std::string desired = ExportWith(
+      root, "desired.json", {{"/network/firewall/rules/-", R"({"action": "allow", "name": "web", "port": 443, "protocol": "tcp"})"}});
   root.WriteFile("/tmp/schema.json", R"({"type": "object", "properties": {"mtu": {"type": "integer", "minimum": 1280}}})");
   root.WriteFile("/tmp/value.json", R"({"mtu": 9})");
   root.WriteFile("/tmp/syslog.json", R"({"remoteHost": "logs.example.com", "port": 514, "protocol": "udp"})");
   root.WriteFile("/tmp/smartnic.json", R"({"smartnic": {"ports": {"uplink": {"mtu": 9000}}}})");
-  const std::string desired = root.Path("/tmp/desired.json");
   // In order: what changes the host comes after what only reads it.
   const std::vector<std::pair<std::string, std::string>> runs = {
       {"init", "--root " + fresh.path() + " init --sample --reset"},  // the temporary root has a store already

@@ -11,8 +11,6 @@
 namespace hoxcm_test {
 namespace {
 
-bool Has(const std::string& text, const std::string& part) { return text.find(part) != std::string::npos; }
-
 TEST(HoxcfgItemTest, GetSetAndDeleteAnswerWithTheirExitStatuses) {
   TempRoot root;
   ASSERT_EQ(RunHoxcfg(root, "init --sample").exitCode, 0);
@@ -26,26 +24,20 @@ TEST(HoxcfgItemTest, GetSetAndDeleteAnswerWithTheirExitStatuses) {
   EXPECT_EQ(r.exitCode, ::geteuid() == 0 ? 0 : 2) << r.out;
   EXPECT_EQ(Has(r.out, "$6$"), ::geteuid() == 0) << r.out;
 
-  // Findings per field: 1; a value that cannot be the item: 2.
-  r = RunHoxcfg(root, R"(set network/dns/config --yes --value '{"servers": "10.0.0.1"}')");
-  EXPECT_EQ(r.exitCode, 1);
-  EXPECT_EQ(r.out, "--value: /network/dns/config/servers: must be an array\n");
-  r = RunHoxcfg(root, R"(set network/dns/config --yes --value '[{"servers": []}]')");
-  EXPECT_EQ(r.exitCode, 2);
-  EXPECT_TRUE(Has(r.err, "error 2028: Not a Non-Singleton object: /network/dns/config")) << r.err;
-
-  // Applied, then unchanged; without --yes and a terminal, refused.
   const std::string dns = R"(set network/dns/config --value '{"servers": ["10.0.0.53"]}')";
-  EXPECT_EQ(RunHoxcfg(root, dns).exitCode, 2);
-  r = RunHoxcfg(root, dns + " --yes");
-  EXPECT_EQ(r.exitCode, 0);
-  EXPECT_EQ(r.out, "/network/dns/config: needs neither a reboot nor maintenance mode\n/network/dns/config: applied\n");
-  EXPECT_EQ(RunHoxcfg(root, dns + " --yes").out, "/network/dns/config: unchanged\n");
-
-  r = RunHoxcfg(root, "delete services/syslog/config --yes");
-  EXPECT_EQ(r.exitCode, 0);
-  EXPECT_EQ(r.out, "/services/syslog/config: deleted\n");
-  EXPECT_TRUE(Has(RunHoxcfg(root, "get services/syslog/config --json --compact").out, R"("current":null)"));
+  RunSteps(root, {
+      // Findings per field: 1; a value that cannot be the item: 2.
+      {R"(set network/dns/config --yes --value '{"servers": "10.0.0.1"}')", 1,
+       "--value: /network/dns/config/servers: must be an array\n"},
+      {R"(set network/dns/config --yes --value '[{"servers": []}]')", 2,
+       "error 2028: Not a Non-Singleton object: /network/dns/config"},
+      // Applied, then unchanged; without --yes and a terminal, refused.
+      {dns, 2, ""},
+      {dns + " --yes", 0, "/network/dns/config: needs neither a reboot nor maintenance mode\n/network/dns/config: applied\n"},
+      {dns + " --yes", 0, "/network/dns/config: unchanged\n"},
+      {"delete services/syslog/config --yes", 0, "/services/syslog/config: deleted\n"},
+      {"get services/syslog/config --json --compact", 0, R"("current":null)"},
+  });
 
   // Staged for the next boot: 3, shown as desired; then every change is refused.
   r = RunHoxcfg(root, "set system/kernel/boot_options --yes --json --compact --value "
@@ -55,10 +47,8 @@ TEST(HoxcfgItemTest, GetSetAndDeleteAnswerWithTheirExitStatuses) {
                    R"("system","group":"kernel","key":"boot_options","instance":"","action":"SET","impact":2,)"
                    R"("reasons":[{"rule":"property","impact":2,"path":"/system/kernel/boot_options/hugepages",)"
                    R"("oldValue":"2048","newValue":"4096"}]}]})" "\n");
-  EXPECT_TRUE(Has(RunHoxcfg(root, "show desired --compact").out, R"("hugepages":4096)"));
-  r = RunHoxcfg(root, R"(set network/dns/config --yes --value '{"servers": ["10.0.0.54"]}')");
-  EXPECT_EQ(r.exitCode, 2);
-  EXPECT_TRUE(Has(r.err, "error 2029")) << r.err;
+  RunSteps(root, {{"show desired --compact", 0, R"("hugepages":4096)"},
+                  {R"(set network/dns/config --yes --value '{"servers": ["10.0.0.54"]}')", 2, "error 2029"}});
 }
 
 }  // namespace

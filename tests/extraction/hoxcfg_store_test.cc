@@ -25,9 +25,7 @@ class HoxcfgStoreTest : public ::testing::Test {
 };
 
 TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExportsToAPrivateFile) {
-  const HoxcfgOutcome init = Run("init --root " + root_.path() + " --sample");
-  ASSERT_EQ(init.exitCode, 0) << init.err;
-  EXPECT_NE(init.out.find("installed schemas"), std::string::npos) << init.out;
+  RunSteps(root_, {{"init --root " + root_.path() + " --sample", 0, "installed schemas"}});
   EXPECT_TRUE(fileExists(root_.Path(kStoreHostPath)));
   EXPECT_TRUE(fileExists(root_.Path("/etc/tarvik/host-facts.json")));
 
@@ -44,31 +42,26 @@ TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExportsToAPrivateFile) {
   const std::string changed = Run("export").out;
   ASSERT_NE(changed, exported.out);
   for (const char* again : {"init --sample", "init", "init --sample --json"}) {
-    const HoxcfgOutcome refused = Run(again);
-    EXPECT_EQ(refused.exitCode, 2) << again;
-    EXPECT_NE(refused.err.find("a host already exists at " + root_.path()), std::string::npos) << refused.err;
-    EXPECT_NE(refused.err.find("--reset"), std::string::npos) << refused.err;
+    RunSteps(root_, {{again, 2, "a host already exists at " + root_.path()}, {again, 2, "--reset"}});
     EXPECT_EQ(Run("export").out, changed) << again;
   }
   EXPECT_EQ(Run("init --sample --reset").exitCode, 0);
   EXPECT_EQ(Run("export").out, exported.out);
 
   const std::string file = root_.Path("/tmp/host.json");
-  const HoxcfgOutcome toFile = Run("export --output " + file);
-  ASSERT_EQ(toFile.exitCode, 0) << toFile.err;
-  EXPECT_EQ(toFile.out, "");
+  EXPECT_EQ(Run("export --output " + file).out, "");
   struct stat st {};
   ASSERT_EQ(::stat(file.c_str(), &st), 0);
   EXPECT_EQ(st.st_mode & 0777, 0600u);
   // The export is applicable elsewhere, so it carries the secrets.
-  EXPECT_NE(root_.ReadFile("/tmp/host.json").find("s3cr3t-chap-01"), std::string::npos);
+  EXPECT_TRUE(Has(root_.ReadFile("/tmp/host.json"), "s3cr3t-chap-01"));
   // A link planted where the temporary file goes is replaced, not written through.
   const std::string victim = root_.Path("/tmp/victim");
   root_.WriteFile("/tmp/victim", "untouched");
   ASSERT_EQ(::symlink(victim.c_str(), (file + ".tmp").c_str()), 0);
   ASSERT_EQ(Run("export --output " + file).exitCode, 0);
   EXPECT_EQ(root_.ReadFile("/tmp/victim"), "untouched");
-  EXPECT_NE(root_.ReadFile("/tmp/host.json").find("s3cr3t-chap-01"), std::string::npos);
+  EXPECT_TRUE(Has(root_.ReadFile("/tmp/host.json"), "s3cr3t-chap-01"));
 }
 
 TEST_F(HoxcfgStoreTest, ShowMasksSensitiveValues) {
@@ -76,8 +69,7 @@ TEST_F(HoxcfgStoreTest, ShowMasksSensitiveValues) {
   for (const char* which : {"", "current", "user"}) {
     const HoxcfgOutcome shown = Run(std::string("show ") + which + " --compact");
     ASSERT_EQ(shown.exitCode, 0) << which << shown.err;
-    EXPECT_EQ(shown.out.find("s3cr3t-chap-01"), std::string::npos) << which;
-    EXPECT_NE(shown.out.find("******"), std::string::npos) << which;
+    EXPECT_TRUE(!Has(shown.out, "s3cr3t-chap-01") && Has(shown.out, "******")) << which;
     EXPECT_EQ(shown.out.find('\n'), shown.out.size() - 1) << "compact: one line";
   }
   EXPECT_EQ(Run("show desired").out, "{}\n");
@@ -98,9 +90,7 @@ TEST_F(HoxcfgStoreTest, ErrorsPrintTheCodeAndNothingOnStdout) {
   InitSample();
   StoreSql("UPDATE config_item SET value = '{oops' WHERE name = 'hostname'");
   for (const char* command : {"export", "show current"}) expectError(command, "2080");
-  const HoxcfgOutcome refused = Run("init --root /");
-  EXPECT_EQ(refused.exitCode, 2);
-  EXPECT_NE(refused.err.find("refusing"), std::string::npos) << refused.err;
+  RunSteps(root_, {{"init --root /", 2, "refusing"}});
 }
 
 TEST_F(HoxcfgStoreTest, InitFromAnExportMakesACopyOfTheHost) {
@@ -111,20 +101,15 @@ TEST_F(HoxcfgStoreTest, InitFromAnExportMakesACopyOfTheHost) {
   const std::string exported = root_.Path("/tmp/host.json");
   ASSERT_EQ(Run("export -o " + exported).exitCode, 0);
   const std::string copy = "--root " + root_.Path("/copy");
-  const HoxcfgOutcome init = Run("init " + copy + " --from " + exported);
-  ASSERT_EQ(init.exitCode, 0) << init.err;
-  EXPECT_NE(init.out.find("host identity 4c4c4544-0042-3510-8053-b4c04f4e3132 (the document's reference host)"),
-            std::string::npos)
-      << init.out;
+  RunSteps(root_, {{"init " + copy + " --from " + exported, 0,
+                    "host identity 4c4c4544-0042-3510-8053-b4c04f4e3132 (the document's reference host)"},
+                   {"compliance " + copy + " " + exported, 0, "compliant\n"}});
   EXPECT_EQ(Run("export " + copy).out, Run("export").out);
-  EXPECT_EQ(Run("compliance " + copy + " " + exported).out, "compliant\n");
 
   const std::string dns = "/copy/usr/lib/tarvik/configmanager/schemas/network/dns/config.json";
   root_.WriteFile(dns, R"({"multiInstance": false, "schema": )");
-  const HoxcfgOutcome broken = Run("compliance " + copy + " " + exported);
-  EXPECT_EQ(broken.exitCode, 2);
-  EXPECT_EQ(broken.err.rfind("hoxcfg: " + root_.Path(dns) + ": error 2021: ", 0), 0u) << broken.err;
-  EXPECT_NE(broken.err.find("not valid JSON"), std::string::npos) << broken.err;
+  RunSteps(root_, {{"compliance " + copy + " " + exported, 2, "hoxcfg: " + root_.Path(dns) + ": error 2021: "},
+                   {"compliance " + copy + " " + exported, 2, "not valid JSON"}});
 }
 
 TEST_F(HoxcfgStoreTest, InitChecksEverySchemaFileAndLoadsADocumentWholeOrNotAtAll) {
@@ -134,11 +119,9 @@ TEST_F(HoxcfgStoreTest, InitChecksEverySchemaFileAndLoadsADocumentWholeOrNotAtAl
   root_.CopyTree("data/sample-host/schemas", "/tmp/schemas");
   root_.WriteFile("/tmp/schemas/bad/x/key.json", R"({"multiInstance": false})");
   const std::string schemas = " --schemas " + root_.Path("/tmp/schemas");
-  const HoxcfgOutcome init = Run("init" + schemas);
-  EXPECT_EQ(init.exitCode, 1);
-  EXPECT_NE(init.out.find("refused schema file " + root_.Path(std::string(HoxPlatform::HostPaths::kSchemaDirectory)) + "/bad/x/key.json: "), std::string::npos)
-      << init.out;
-  EXPECT_EQ(Run("schemas --check").exitCode, 1);
+  RunSteps(root_, {{"init" + schemas, 1,
+                    "refused schema file " + root_.Path(std::string(HoxPlatform::HostPaths::kSchemaDirectory)) + "/bad/x/key.json: "},
+                   {"schemas --check", 1, ""}});
 
   Document doc = SampleDocument("user-config.json");
   auto& a = doc.GetAllocator();
@@ -153,7 +136,7 @@ TEST_F(HoxcfgStoreTest, InitChecksEverySchemaFileAndLoadsADocumentWholeOrNotAtAl
   EXPECT_EQ(refused.exitCode, 2);
   for (const char* named : {"no usable schema for 2 of its", "/none/x/key, /bad/x/key (its schema file was refused: ",
                             "nothing was loaded"}) {
-    EXPECT_NE(refused.err.find(named), std::string::npos) << named << ": " << refused.err;
+    EXPECT_TRUE(Has(refused.err, named)) << named << ": " << refused.err;
   }
   EXPECT_EQ(Run("show user --compact").out, "{\"profile\":{}}\n");
   EXPECT_EQ(Run("init --sample --from " + root_.Path("/tmp/doc.json")).exitCode, 2);

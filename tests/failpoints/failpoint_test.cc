@@ -54,12 +54,7 @@ class FailpointTest : public ::testing::TestWithParam<Param> {
   FailpointTest() {
     EXPECT_EQ(RunHoxcfg(root_, "init --sample").exitCode, 0);
     // A change of the DNS servers: one plugin (the C++ network plugin) runs.
-    const std::string desired = root_.Path("/desired.json");
-    EXPECT_EQ(RunHoxcfg(root_, "export -o " + desired).exitCode, 0);
-    HoxConfigManager::Document doc;
-    HoxConfigManager::ParseDocument(root_.ReadFile("/desired.json"), doc);
-    rapidjson::Pointer("/profile/network/dns/config/servers/0").Set(doc, "10.20.0.99");
-    root_.WriteFile("/desired.json", HoxConfigManager::JsonToString(doc));
+    ExportWith(root_, "desired.json", {{"/network/dns/config/servers/0", R"("10.20.0.99")"}});
     // What an earlier export left.
     root_.WriteFile("/export.json", "{}");
   }
