@@ -1,34 +1,22 @@
 // CheckApply and Apply against a host in a real store, with real manifests
 // and scripted plugin runs: every verdict and failure case, the host lock
-// and the apply history (real runners: apply_e2e_test.cc).
+// and the apply history (real runners: tests/cli/hoxcfg_apply_test.cc).
 #include <chrono>
 #include <thread>
 
 #include <hoxcm/config_store.h>
 #include <hoxcm/extraction.h>
 
-#include "plugins/plugin_fixture.h"
-#include "support/fake_plugin_runner.h"
-#include "support/json.h"
 #include "support/log_capture.h"
 #include "workflow/apply.h"
 #include "workflow/apply_history.h"
+#include "workflow/workflow_fixture.h"
 
 namespace hoxcm_test {
 namespace {
 
 using namespace HoxConfigManager;
 
-constexpr const char* kHost = R"({
-  "system": {"kernel": {"boot_options": {"iommu": true, "hugepages": 2048, "console": "ttyS0"}}},
-  "network": {"dns": {"config": {"servers": ["10.0.0.1"]}},
-              "firewall": {"rules": [{"name": "ssh", "action": "allow", "protocol": "tcp"}]}}})";
-
-// `kHost` with its first `from` replaced by `to`.
-std::string Changed(const std::string& from, const std::string& to) {
-  std::string text = kHost;
-  return text.replace(text.find(from), from.size(), to);
-}
 // The id of the ErrorInfo that `f` throws ("" when it throws none).
 template <typename F>
 std::string ThrownErrorId(F f) {
@@ -39,18 +27,10 @@ std::string ThrownErrorId(F f) {
   }
   return "";
 }
-// One change of each cost.
-const std::string kFree = Changed("10.0.0.1", "10.0.0.2");
-const std::string kMaintenance = Changed(R"("rules": [)", R"("rules": [{"name": "web", "action": "allow"},)");
-const std::string kReboot = Changed("2048", "4096");
 
-class ApplyTest : public PluginTest {
+class ApplyTest : public SmallHostTest {
  protected:
-  ApplyTest() : task_(std::make_shared<RecordingTask>()) {
-    // The one key whose default must always have an item: this small host
-    // has none.
-    std::filesystem::remove(root.Path(std::string(HoxPlatform::HostPaths::kSchemaDirectory) + "/services/time/ntp.json"));
-    HoxConfigStore::ImportConfiguration(HoxConfigStore::ConfigKind::User, Parse(kHost));
+  ApplyTest() {
     // The network plugin also judges impact; the kernel plugin runs after it.
     Manifest("net/plugin.json", V3Manifest("python", {"network:dns:config", "network:firewall:rules"}, "network",
                                            "REMEDIATE:net", {}, R"(,"impact":{"supports":true})"));
@@ -67,25 +47,10 @@ class ApplyTest : public PluginTest {
   static std::shared_ptr<CheckApplyResult> Stale(IMPACT_TYPE impact, const std::string& desired) {
     return std::make_shared<CheckApplyResult>(impact, Parse(desired), QUICK_BOOT_NOT_SUPPORTED, "ctx");
   }
-  // What the runs saw: "APPLY net 2", one entry per run.
-  std::vector<std::string> Runs() const {
-    std::vector<std::string> runs;
-    for (const auto& call : runner_.calls) {
-      if (call.kind == "APPLY") runs.push_back(call.pluginId + " " + std::to_string(call.inputs.size()));
-    }
-    return runs;
-  }
-  static ApplyHistoryRecord LastRecord() {
-    const std::vector<ApplyHistoryRecord> history = GetApplyHistory();
-    return history.empty() ? ApplyHistoryRecord() : history.back();
-  }
-
-  FakePluginRunner runner_;
-  std::shared_ptr<RecordingTask> task_;
 };
 
 TEST_F(ApplyTest, CheckApplyFreezesTheVerdictWithACopyOfTheDocument) {
-  EXPECT_EQ(Check(kHost), nullptr);
+  EXPECT_EQ(Check(kSmallHost), nullptr);
 
   root.WriteFile(std::string(HoxPlatform::HostPaths::kHostFacts), R"({"quickBootSupported": true, "stmSupported": false})");
   Document desired = Parse(kMaintenance);
@@ -130,7 +95,7 @@ TEST_F(ApplyTest, ApplyActsOnTheRecomputedVerdictOnlyWhenItStillHolds) {
        "throws 2026", {}, "", "refused"},
       {"maintenance mode required and entered", IMPACT_MAINTENANCE_MODE_REQUIRED, kMaintenance, true, "status 2",
        {"net 1"}, "", "applied"},
-      {"the drift went away meanwhile", IMPACT_MAINTENANCE_MODE_REQUIRED, kHost, false, "status 0", {},
+      {"the drift went away meanwhile", IMPACT_MAINTENANCE_MODE_REQUIRED, kSmallHost, false, "status 0", {},
        "Drift reported by CheckApply() is resolved.", "nothing to do"},
   };
   for (const Case& c : cases) {
@@ -147,7 +112,7 @@ TEST_F(ApplyTest, ApplyActsOnTheRecomputedVerdictOnlyWhenItStillHolds) {
     EXPECT_EQ(outcome, c.outcome);
     EXPECT_EQ(Runs(), c.runs);
     EXPECT_NE(log.find(c.logLine), std::string::npos) << log;
-    EXPECT_EQ(LastRecord().outcome, c.recorded);
+    EXPECT_EQ(LastHistory().outcome, c.recorded);
     // Remediation starts from the normal boot mode; a staged reboot keeps the
     // document for the next boot.
     EXPECT_EQ(HoxConfigStore::GetBootMode() == HoxConfigStore::BOOTMODE_NORMAL, !c.runs.empty());
@@ -156,7 +121,7 @@ TEST_F(ApplyTest, ApplyActsOnTheRecomputedVerdictOnlyWhenItStillHolds) {
     }
   }
   EXPECT_EQ(ThrownBy([&] { Apply(nullptr, task_, runner_); }).code, 2024);
-  EXPECT_EQ(LastRecord().outcome, "refused");
+  EXPECT_EQ(LastHistory().outcome, "refused");
 }
 
 TEST_F(ApplyTest, FailuresAndAbortsStopTheRunAndAreReturned) {
@@ -177,7 +142,7 @@ TEST_F(ApplyTest, FailuresAndAbortsStopTheRunAndAreReturned) {
   EXPECT_EQ(result.status, APPLY_COMPLETED);
   EXPECT_EQ(result.errorInfo, runner_.apply["net"]);
   EXPECT_EQ(Runs(), std::vector<std::string>{"net 2"});
-  ApplyHistoryRecord record = LastRecord();
+  ApplyHistoryRecord record = LastHistory();
   EXPECT_EQ(record.outcome, "failed");
   ASSERT_EQ(record.runs.size(), 1u);
   EXPECT_EQ(record.runs[0].key + " " + record.runs[0].outcome.id, "REMEDIATE:net net.failed");
@@ -191,7 +156,7 @@ TEST_F(ApplyTest, FailuresAndAbortsStopTheRunAndAreReturned) {
   result = Apply(check, task_, runner_);
   EXPECT_EQ(result.errorInfo.id, "com.tarvik.hox.settings.apply.plugin.aborted");
   EXPECT_EQ(Runs(), std::vector<std::string>{"net 2"});
-  EXPECT_EQ(LastRecord().outcome, "aborted");
+  EXPECT_EQ(LastHistory().outcome, "aborted");
 
   // Both succeed: status 2, each run recorded with its inputs.
   task_->aborted = false;
@@ -200,7 +165,7 @@ TEST_F(ApplyTest, FailuresAndAbortsStopTheRunAndAreReturned) {
   result = Apply(check, task_, runner_);
   EXPECT_EQ(result.status, APPLY_COMPLETED_IN_MAINTENANCE_MODE);
   EXPECT_EQ(Runs(), (std::vector<std::string>{"net 2", "kern 1"}));
-  record = LastRecord();
+  record = LastHistory();
   EXPECT_EQ(record.outcome + " " + std::to_string(record.runs.size()) + " " + record.document,
             "applied 2 " + DocumentDigest(check->document));
   EXPECT_EQ(record.impact, IMPACT_MAINTENANCE_MODE_REQUIRED);
@@ -230,7 +195,7 @@ TEST_F(ApplyTest, AnApplyWaitsForTheHostThenJudgesWhatTheOtherChanged) {
   other.reset();
   apply.join();
   EXPECT_TRUE(runner_.calls.empty());
-  EXPECT_EQ(LastRecord().outcome, "nothing to do");
+  EXPECT_EQ(LastHistory().outcome, "nothing to do");
 }
 
 TEST_F(ApplyTest, HistoryRecordsReadBackAsWrittenBoundedAndDamagedOnesAreMarked) {
@@ -248,7 +213,7 @@ TEST_F(ApplyTest, HistoryRecordsReadBackAsWrittenBoundedAndDamagedOnesAreMarked)
   reasons.objects[0].reasons.push_back({ImpactReason::Rule::kPlugin, IMPACT_REBOOT_REQUIRED, "", "", "", "p", "why"});
   ApplyHistoryRecord record;
   record.kind = "boot";
-  record.document = DocumentDigest(Parse(kHost));
+  record.document = DocumentDigest(Parse(kSmallHost));
   RecordVerdict(record, impact, reasons);
   record.runs = {{"REMEDIATE:net", "net", 2, ErrorInfo("net.failed", {"a"}, "m"), 0.25}};
   RecordResult(record, {APPLY_COMPLETED, ErrorInfo("net.failed", {"a"}, "m")}, false);

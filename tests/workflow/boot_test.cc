@@ -12,11 +12,9 @@
 #include <hoxcm/extraction.h>
 #include <hoxcm/operations.h>
 
-#include "plugins/plugin_fixture.h"
-#include "support/fake_plugin_runner.h"
-#include "support/json.h"
 #include "support/log_capture.h"
 #include "workflow/boot.h"
+#include "workflow/workflow_fixture.h"
 
 namespace hoxcm_test {
 namespace {
@@ -24,36 +22,20 @@ namespace {
 using namespace HoxConfigManager;
 namespace HostPaths = HoxPlatform::HostPaths;
 
-constexpr const char* kHost = R"({
-  "system": {"kernel": {"boot_options": {"iommu": true, "hugepages": 2048, "console": "ttyS0"}}},
-  "network": {"dns": {"config": {"servers": ["10.0.0.1"]}},
-              "firewall": {"rules": [{"name": "ssh", "action": "allow", "protocol": "tcp"}]}}})";
-
-std::string Changed(const std::string& from, const std::string& to) {
-  std::string text = kHost;
-  return text.replace(text.find(from), from.size(), to);
-}
-const std::string kFree = Changed("10.0.0.1", "10.0.0.2");
-const std::string kMaintenance = Changed(R"("rules": [)", R"("rules": [{"name": "web", "action": "allow", "protocol": "tcp"},)");
-const std::string kReboot = Changed("2048", "4096");
-
 const std::string kWaiter(HostPaths::kAutodeployWaiterNotify);
 const std::string kFirewall(HostPaths::kAutodeployFirewall);
 constexpr const char* kWaiterText = "{ \"url\": \"http://10.0.0.9/notify\",\n  \"token\": 7 }\n";
 // Line ends of both kinds and a tab: the file comes back byte for byte.
 constexpr const char* kXml = "<?xml version=\"1.0\"?>\r\n<rules>\n\t<rule id=\"1\"/>\n</rules>";
 
-class BootTest : public PluginTest {
+class BootTest : public SmallHostTest {
  protected:
   BootTest() {
-    std::filesystem::remove(root.Path(std::string(HostPaths::kSchemaDirectory) + "/services/time/ntp.json"));
-    HoxConfigStore::ImportConfiguration(HoxConfigStore::ConfigKind::User, Parse(kHost));
     // DNS and boot options are applied at boot; firewall rules are not.
     Manifest("net/plugin.json", V3Manifest("python", {"network:dns:config"}, "network", "REMEDIATE:net", {},
                                            R"(,"impact":{"supports":true})"));
-    std::string firewall = V3Manifest("python", {"network:firewall:rules"}, "network", "REMEDIATE:fw", {});
-    firewall.replace(firewall.find("\"boot\":true"), 11, "\"boot\":false");
-    Manifest("fw/plugin.json", firewall);
+    Manifest("fw/plugin.json", Replaced(V3Manifest("python", {"network:firewall:rules"}, "network", "REMEDIATE:fw", {}),
+                                        "\"boot\":true", "\"boot\":false"));
     Manifest("kern/plugin.json",
              V3Manifest("python", {"system:kernel:boot_options"}, "system", "REMEDIATE:kern", {"REMEDIATE:net"}));
   }
@@ -87,14 +69,6 @@ class BootTest : public PluginTest {
     return value;
   }
   static std::string Staged() { return JsonToString(ExtractDesiredConfiguration()); }
-  // "kern 1": one entry per apply run, with its input count.
-  std::vector<std::string> Runs() const {
-    std::vector<std::string> runs;
-    for (const auto& call : runner_.calls) {
-      if (call.kind == "APPLY") runs.push_back(call.pluginId + " " + std::to_string(call.inputs.size()));
-    }
-    return runs;
-  }
   // Plugins that record what they applied, as the runners do.
   void RecordApplied() {
     runner_.during = [this](const FakePluginRunner::Call& call) {
@@ -118,12 +92,6 @@ class BootTest : public PluginTest {
     for (const auto& f : HoxConfigStore::GetBootTimeRestoreFailures()) keys.push_back(f.component + "/" + f.group + "/" + f.key);
     return keys;
   }
-  static ApplyHistoryRecord LastHistory() {
-    const auto history = GetApplyHistory();
-    return history.empty() ? ApplyHistoryRecord() : history.back();
-  }
-
-  FakePluginRunner runner_;
 };
 
 TEST_F(BootTest, BootstrapAppliesAtOnceOrStagesWhatNeedsARebootAndStoresNothingWhenItFails) {
@@ -148,7 +116,7 @@ TEST_F(BootTest, BootstrapAppliesAtOnceOrStagesWhatNeedsARebootAndStoresNothingW
       {"reboot, no file", kReboot, false, false, nullptr, 1, "error=waiterNotify.json file does not exists.", {}, false},
       {"a key without schema", kMissingKey, true, true, nullptr, 1, "Failed to generate schema for boot document", {},
        false},
-      {"a value the schema refuses", Changed(R"(["10.0.0.1"])", "5"), true, true, nullptr, 1,
+      {"a value the schema refuses", SmallHostWith(R"(["10.0.0.1"])", "5"), true, true, nullptr, 1,
        "Failed to validate boot configuration document", {}, false},
       {"an impact plugin fails", kFree, true, true,
        [](FakePluginRunner& r) { r.impact["net"].error = ErrorInfo("net.down", {"net"}, "down"); }, 1,

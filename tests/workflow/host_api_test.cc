@@ -14,12 +14,10 @@
 #include <hoxcm/host_documents.h>
 
 #include "extraction/extraction_internal.h"
-#include "plugins/plugin_fixture.h"
-#include "support/fake_plugin_runner.h"
-#include "support/json.h"
 #include "support/store_sql.h"
 #include "workflow/host_api.h"
 #include "workflow/remediation.h"
+#include "workflow/workflow_fixture.h"
 
 namespace hoxcm_test {
 namespace {
@@ -35,9 +33,9 @@ Address Split(const std::string& path) {
   return {path.substr(1, a - 1), path.substr(a + 1, b - a - 1), path.substr(b + 1)};
 }
 
-class HostApiTest : public PluginTest {
+class HostApiTest : public WorkflowTest {
  protected:
-  HostApiTest() : task_(std::make_shared<RecordingTask>()) {
+  HostApiTest() {
     // A key that no plugin applies.
     root.WriteFile(std::string(HoxPlatform::HostPaths::kSchemaDirectory) + "/services/extra/unowned.json",
                    R"({"multiInstance": false, "schema": {"type": "object"}})");
@@ -89,9 +87,6 @@ class HostApiTest : public PluginTest {
     }
     return inputs;
   }
-
-  FakePluginRunner runner_;
-  std::shared_ptr<RecordingTask> task_;
 };
 
 TEST_F(HostApiTest, MalformedValuesGetAClearErrorOrFindingsAndChangeNothing) {
@@ -309,9 +304,7 @@ TEST_F(HostApiEndToEndTest, TheImpactDecidesWhetherAChangeIsAppliedStagedOrRefus
 
   // Maintenance mode outside it: refused, nothing stored.
   const std::vector<std::string> before = StoreState();
-  const std::string vnics = Get("/network/interfaces/vnic");
-  std::string jumbo = vnics;
-  jumbo.replace(jumbo.find("\"mtu\":1500"), 10, "\"mtu\":9000");
+  const std::string jumbo = Replaced(Get("/network/interfaces/vnic"), "\"mtu\":1500", "\"mtu\":9000");
   EXPECT_EQ(ThrownBy([&] { Set("/network/interfaces/vnic", jumbo); }).code, 2026);
   EXPECT_EQ(StoreState(), before);
 

@@ -4,11 +4,9 @@
 // verdicts_e2e_test.cc).
 #include <algorithm>
 
-#include "plugins/plugin_fixture.h"
-#include "support/fake_plugin_runner.h"
-#include "support/json.h"
 #include "workflow/impact.h"
 #include "workflow/impact_handler.h"
+#include "workflow/workflow_fixture.h"
 
 namespace hoxcm_test {
 namespace {
@@ -46,9 +44,9 @@ std::string Text(const ImpactReason& r) {
   return s + r.path + ": " + r.oldValue + " -> " + r.newValue;
 }
 
-class ImpactTest : public PluginTest {
+class ImpactTest : public WorkflowTest {
  protected:
-  ImpactTest() : task_(std::make_shared<RecordingTask>()) {
+  ImpactTest() {
     // Two impact plugins, in path order: net before net2, which is never
     // asked (only an object's first owner is).
     const std::string impact = R"(,"impact":{"supports":true})";
@@ -71,14 +69,7 @@ class ImpactTest : public PluginTest {
     Impact(desired, "task-1", result, task_, Parse(hostText), reasons, runner_);
     return result;
   }
-  // `text` with its first `from` replaced by `to`.
-  static std::string With(std::string text, const std::string& from, const std::string& to) {
-    return text.replace(text.find(from), from.size(), to);
-  }
-  static std::string Changed(const std::string& from, const std::string& to) { return With(kHost, from, to); }
-
-  FakePluginRunner runner_;
-  std::shared_ptr<RecordingTask> task_;
+  static std::string Changed(const std::string& from, const std::string& to) { return Replaced(kHost, from, to); }
 };
 
 TEST_F(ImpactTest, TriggerValuesCompareByThePropertysType) {
@@ -139,7 +130,7 @@ TEST_F(ImpactTest, EachKindOfChangeGetsTheImpactItsSchemaDeclares) {
        kHost, "impact=1 | maintenance-mode | add network rules firewall"},
       {Changed("\"allow\"", "\"deny\""), kHost, "impact=0 | set network rules firewall"},
       // Reboot wins over maintenance mode: one statement.
-      {With(Changed("1500", "9000"), "2048", "0"), kHost,
+      {Replaced(Changed("1500", "9000"), "2048", "0"), kHost,
        "impact=2 | reboot | set network vnic interfaces | set system boot_options kernel"},
   };
   for (const Case& c : cases) {
@@ -203,7 +194,7 @@ TEST_F(ImpactTest, PluginVerdictsJoinTheSchemasAndTheHighestLevelWins) {
   // Given a reboot by schema and maintenance mode by both plugins.
   runner_.impact["kern"].impacts = {{1, "system", "kernel", "boot_options", "k"}};
   runner_.impact["net"].impacts = {{1, "network", "interfaces", "vnic", "n"}};
-  const ImpactResult result = Run(With(Changed("1500", "9000"), "2048", "4096"));
+  const ImpactResult result = Run(Replaced(Changed("1500", "9000"), "2048", "4096"));
 
   EXPECT_EQ(Summary(result), "impact=2 | reboot | set network vnic interfaces | set system boot_options kernel");
   EXPECT_EQ(runner_.CalledIds(), (std::vector<std::string>{"kern", "net"}));
@@ -226,7 +217,7 @@ TEST_F(ImpactTest, PluginVerdictsJoinTheSchemasAndTheHighestLevelWins) {
 }
 
 TEST_F(ImpactTest, AFailedOrAbortedPluginRunLeavesOnlyTheError) {
-  const std::string desired = With(Changed("1500", "9000"), "2048", "4096");
+  const std::string desired = Replaced(Changed("1500", "9000"), "2048", "4096");
   const ErrorInfo failure("com.tarvik.hox.settings.impact.plugin.unexpected.error", {"kern"}, "runner died");
   runner_.impact["kern"].error = failure;
   ImpactResult result = Run(desired);
@@ -247,9 +238,9 @@ TEST_F(ImpactTest, ReasonsSayWhichChangeOrPluginCostsWhatWithSecretsMasked) {
   runner_.impact["net"].impacts = {{1, "network", "firewall", "rules", "rule change"}, {0, "network", "x", "y", ""}};
   std::string host = kHost;
   host.insert(host.rfind('}'), R"(,"test":{"secure":{"vault":{"secret":"s3cret-1","note":"a"}}})");
-  std::string desired = With(Changed("2048", "4096"), "\"iommu\": true", "\"iommu\": false");
-  desired = With(desired, "\"pg\"", "\"other\"");  // costs nothing: not listed
-  desired = With(desired, "\"protocol\": \"tcp\"}",
+  std::string desired = Replaced(Changed("2048", "4096"), "\"iommu\": true", "\"iommu\": false");
+  desired = Replaced(desired, "\"pg\"", "\"other\"");  // costs nothing: not listed
+  desired = Replaced(desired, "\"protocol\": \"tcp\"}",
                  R"("protocol": "tcp"}, {"name": "web", "action": "allow", "protocol": "udp"})");
   desired.insert(desired.rfind('}'), R"(,"test":{"secure":{"vault":{"secret":"s3cret-2","note":"a"}}})");
   ImpactReasons reasons;

@@ -3,10 +3,9 @@
 // real (small manifests in a temporary root); their runs are not.
 #include <algorithm>
 
-#include "plugins/plugin_fixture.h"
-#include "support/fake_plugin_runner.h"
 #include "support/log_capture.h"
 #include "workflow/remediation.h"
+#include "workflow/workflow_fixture.h"
 
 namespace hoxcm_test {
 namespace {
@@ -19,9 +18,9 @@ constexpr const char* kAborted = "com.tarvik.hox.settings.apply.plugin.aborted";
 
 std::string Progress(float value) { return "progress " + std::to_string(value); }
 
-class RemediationTest : public PluginTest {
+class RemediationTest : public WorkflowTest {
  protected:
-  RemediationTest() : task_(std::make_shared<RecordingTask>()) {
+  RemediationTest() {
     for (const char* id : {"a", "b", "c"}) {
       auto plugin = std::make_shared<Plugin>(
           Manifest(std::string(id) + "/plugin.json",
@@ -34,8 +33,6 @@ class RemediationTest : public PluginTest {
   RemediationOutcome Run() { return RunRemediation(plan_, runner_, "ctx", task_); }
 
   RemediationPlan plan_;
-  FakePluginRunner runner_;
-  std::shared_ptr<RecordingTask> task_;
 };
 
 TEST_F(RemediationTest, RunsEachGroupInOrderAndSharesEightyPercentAmongAllGroups) {

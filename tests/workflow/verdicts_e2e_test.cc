@@ -18,11 +18,6 @@ namespace {
 
 using namespace HoxConfigManager;
 
-// `text` with its first `from` replaced by `to`.
-std::string With(std::string text, const std::string& from, const std::string& to) {
-  return text.replace(text.find(from), from.size(), to);
-}
-
 class VerdictsEndToEndTest : public PluginTest {
  protected:
   VerdictsEndToEndTest() : host_(JsonToString(SampleDocument("user-config.json"))) { root.InstallRunners(); }
@@ -65,9 +60,9 @@ TEST_F(VerdictsEndToEndTest, TheSamplePluginsJudgeAndValidateInBothLanguages) {
   root.InstallSamplePlugins();
   // A firewall rule added (the C++ plugin) and the management port group
   // retagged (the Python plugin): maintenance mode, each for its reason.
-  std::string desired = With(host_, R"({"name":"ssh-mgmt")",
+  std::string desired = Replaced(host_, R"({"name":"ssh-mgmt")",
                              R"({"name":"web","action":"allow","protocol":"tcp","port":443},{"name":"ssh-mgmt")");
-  desired = With(desired, R"("vswitch":"vSwitch0","vlan":0)", R"("vswitch":"vSwitch0","vlan":10)");
+  desired = Replaced(desired, R"("vswitch":"vSwitch0","vlan":0)", R"("vswitch":"vSwitch0","vlan":10)");
   std::vector<std::string> reasons;
   const ImpactResult result = Judge(desired, &reasons);
   EXPECT_EQ(result.error, ErrorInfo());
@@ -83,9 +78,9 @@ TEST_F(VerdictsEndToEndTest, TheSamplePluginsJudgeAndValidateInBothLanguages) {
 
   // With the schema stage: the vNIC key fails its schema, so the C++ plugin
   // is skipped; the Python plugin finds the empty domain label.
-  std::string faulty = With(host_, R"("mtu":1500)", R"("mtu":100)");
-  faulty = With(faulty, R"("domain":"lab.example.com")", R"("domain":"lab..example.com")");
-  faulty = With(faulty, R"("10.20.0.11")", R"("10.20.0.311")");
+  std::string faulty = Replaced(host_, R"("mtu":1500)", R"("mtu":100)");
+  faulty = Replaced(faulty, R"("domain":"lab.example.com")", R"("domain":"lab..example.com")");
+  faulty = Replaced(faulty, R"("10.20.0.11")", R"("10.20.0.311")");
   EXPECT_EQ(Check(faulty, true), (std::vector<std::string>{
                                      "/network/dns/config/servers/1 com.tarvik.hox.settings.validation.pattern",
                                      "/network/interfaces/vnic/0/mtu com.tarvik.hox.settings.validation.minimum",
@@ -94,7 +89,7 @@ TEST_F(VerdictsEndToEndTest, TheSamplePluginsJudgeAndValidateInBothLanguages) {
                                  }));
   // Plugins only: the C++ plugin checks the DNS servers, and each vNIC's
   // port group against the port groups it gets as references.
-  faulty = With(faulty, R"("portgroup":"Storage")", R"("portgroup":"Nowhere")");
+  faulty = Replaced(faulty, R"("portgroup":"Storage")", R"("portgroup":"Nowhere")");
   EXPECT_EQ(Check(faulty, false), (std::vector<std::string>{
                                       "/network/dns/config/servers/1 com.tarvik.hox.settings.network.dns.invalid-server",
                                       "/network/interfaces/vnic/1/portgroup "
@@ -127,13 +122,13 @@ TEST_F(VerdictsEndToEndTest, ARunThatCrashesAnswersGarbageOrHangsEndsTheVerdictW
       {R"("hostname":"hox-host-01")", R"("hostname":"h","impact":7)", "cc"},  // a verdict out of range
   };
   for (const Case& c : cases) {
-    const ImpactResult result = Judge(With(host_, c.from, c.to));
+    const ImpactResult result = Judge(Replaced(host_, c.from, c.to));
     EXPECT_EQ(result.error.id + " " + result.error.args.at(0), unexpected + " " + c.plugin) << c.to;
     EXPECT_FALSE(result.error.message.empty());
     EXPECT_TRUE(result.impactInfo.empty());
   }
   ErrorInfo error;
-  Check(With(host_, R"("servers":[)", R"("behaviour":"garbage","servers":[)"), false, &error);
+  Check(Replaced(host_, R"("servers":[)", R"("behaviour":"garbage","servers":[)"), false, &error);
   EXPECT_EQ(error.id + " " + error.args.at(0), "com.tarvik.hox.settings.validation.plugin.unexpected.error py");
 
   // A plugin that hangs is stopped by the abort.
@@ -142,7 +137,7 @@ TEST_F(VerdictsEndToEndTest, ARunThatCrashesAnswersGarbageOrHangsEndsTheVerdictW
     std::this_thread::sleep_for(std::chrono::milliseconds(300));
     task->aborted = true;
   });
-  const ImpactResult hung = Judge(With(host_, R"("hugepages":2048)", R"("hugepages":4096)"), nullptr, task);
+  const ImpactResult hung = Judge(Replaced(host_, R"("hugepages":2048)", R"("hugepages":4096)"), nullptr, task);
   aborter.join();
   EXPECT_EQ(hung.error.id + " " + hung.error.args.at(0), "com.tarvik.hox.settings.impact.plugin.aborted sleepy");
 }
