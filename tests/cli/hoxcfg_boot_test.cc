@@ -83,18 +83,6 @@ TEST_F(HoxcfgBootTest, ABootstrapThatNeedsARebootIsAppliedByTheNextBoot) {
   EXPECT_FALSE(Exists(kFirewall));
 }
 
-TEST_F(HoxcfgBootTest, AKilledRunnerIsRecordedAsAFailureOnceTheBootIsComplete) {
-  ASSERT_EQ(Run("bootstrap " + Document()).exitCode, 3);
-  root_.WriteFile(kKernelPlugin, "import os, signal\n\ndef apply(request, host):\n    os.kill(os.getpid(), signal.SIGKILL)\n");
-  EXPECT_EQ(Run("boot run").exitCode, 1);
-  EXPECT_EQ(Run("boot complete").exitCode, 0);
-  EXPECT_EQ(Status(),
-            "failed com.tarvik.hox.settings.apply.plugin.unexpected.error com.tarvik.hox.settings.boot-restore.failed (1)");
-  EXPECT_TRUE(Has(Run("boot status").out, "[system kernel boot_options]"));
-  // The files came back whatever became of the plugins.
-  EXPECT_EQ(root_.ReadFile(kFirewall), SampleFile(kFirewall));
-}
-
 TEST_F(HoxcfgBootTest, AKilledBootRunLosesNothingAndTheNextBootAppliesTheStagedConfiguration) {
   ASSERT_EQ(Run("bootstrap " + Document()).exitCode, 3);
   root_.WriteFile(kKernelPlugin,

@@ -163,23 +163,6 @@ TEST(DocumentsTest, ParseFailuresCarryTheirLocationBesideTheFixedText) {
   }
 }
 
-TEST(DocumentsTest, FilesAreWrittenWholeAndReadBack) {
-  const Document doc = Parse(R"({"b":[1,2.5,"x\"y"],"a":{"n":null}})");
-  hoxcm_test::TempRoot root;
-  const std::string path = root.Path("/out.json");
-  CreateFileFromDocument(path.c_str(), doc);
-  EXPECT_EQ(root.ReadFile("/out.json"), JsonToString(doc));
-  Document back;
-  CreateDocumentFromFile(path.c_str(), back);
-  EXPECT_TRUE(back == doc);
-  EXPECT_TRUE(fileExists(path));
-  EXPECT_FALSE(fileExists(path + ".tmp"));
-  EXPECT_FALSE(fileExists(root.Path("/")));
-  EXPECT_FALSE(fileExists(path + "/below-a-file"));
-  const std::string unwritable = root.Path("/no/such/dir/out.json");
-  EXPECT_THROW(CreateFileFromDocument(unwritable.c_str(), doc), std::exception);
-}
-
 TEST(DocumentsTest, AddMemberCopiesTheNameIntoTheDocument) {
   auto doc = CreateDocument();
   doc->SetObject();

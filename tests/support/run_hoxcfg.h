@@ -152,10 +152,8 @@ inline HoxcfgOutcome RunHoxcfgOnTerminal(const TempRoot& root, const std::string
     if (n <= 0) break;
     shown.append(buffer, static_cast<std::size_t>(n));
   }
-  int status = 0;
-  ::waitpid(pid, &status, 0);
   ::close(master);
-  return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, shown, ""};
+  return {ExitStatusOf(pid), shown, ""};
 }
 
 }  // namespace hoxcm_test
