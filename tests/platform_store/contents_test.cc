@@ -120,21 +120,10 @@ TEST_F(StoreTest, NamespaceObjectsKeepTheirValuesByteForByteAndAreReplacedWhole)
   EXPECT_EQ(global->GetObject(id), nullptr);
 }
 
-TEST_F(StoreTest, HostStateHasDefaultsKeepsWhatIsSetAndRefusesDamagedRows) {
-  // Boot mode, maintenance mode and restore failures are also written and
-  // read across processes by the transaction, hoxcfg and concurrency tests.
-  EXPECT_EQ(GetBootMode(), BOOTMODE_NORMAL);
-  EXPECT_FALSE(GetMaintenanceMode());
-  EXPECT_EQ(Compact(getBootApplyRecord()), R"({"isBootComplete":false,"bootApplyRecord":""})");
-  setBootApplyRecord(R"({"time":"t"})");
-  SetBootComplete(true);
-  EXPECT_EQ(Compact(getBootApplyRecord()), R"({"isBootComplete":true,"bootApplyRecord":"{\"time\":\"t\"}"})");
-  AddBootTimeRestoreFailure({"system", "kernel", "boot_options"});
-  EXPECT_EQ(GetBootTimeRestoreFailures().at(0).key, "boot_options");
-  ClearBootTimeRestoreFailures();
-  EXPECT_TRUE(GetBootTimeRestoreFailures().empty());
-
-  // A damaged boot mode row is an error, never some mode by accident.
+TEST_F(StoreTest, ADamagedBootModeRowIsRefused) {
+  // Host state is written and read across processes by the transaction,
+  // hoxcfg, boot and concurrency tests; a damaged row is an error, never
+  // some mode by accident.
   SetBootMode(BOOTMODE_DESIRED_STAGED);
   for (const char* damaged : {"7", "4x", "", "normal"}) {
     StoreSql(std::string("UPDATE host_state SET value = '") + damaged + "' WHERE name = 'bootMode'");

@@ -145,19 +145,6 @@ TEST_F(ImpactTest, EachKindOfChangeGetsTheImpactItsSchemaDeclares) {
   EXPECT_EQ(task_->Events(), std::vector<std::string>{Progress(20)});
 }
 
-TEST_F(ImpactTest, AMultiInstanceObjectHeldAsDeletedDefaultIsAPlainSet) {
-  // The walk never reports it; the handler is asked directly.
-  ImpactHandler handler;
-  const auto vnic = HoxSchemaStore::SchemaStore::GetStore()->Find("network", "interfaces", "vnic");
-  const Document desired = Parse(R"({"name":"vnic0","portgroup":"pg"})");
-  const Value marker(rapidjson::StringRef("DELETE_DEFAULT"));
-  handler.Set(desired, marker, {"network", "interfaces", "vnic", "vnic0"}, vnic, "/network/interfaces/vnic/0",
-              Value());
-  const auto infos = handler.GetImpactInfo();
-  ASSERT_EQ(infos.size(), 1u);
-  EXPECT_EQ(infos.begin()->id, "com.tarvik.settings.impact.info.set");
-}
-
 TEST_F(ImpactTest, PropertyAnalysisFollowsObjectsAndArraysAndRefusesMalformedTriggers) {
   const auto kernel = HoxSchemaStore::SchemaStore::GetStore()->Find("system", "kernel", "boot_options");
   struct Case {

@@ -106,9 +106,8 @@ TEST_F(RemediationTest, AnAbortIsSeenBeforeEachGroupAndAfterTheLastWhenTheOrderG
 
 TEST_F(RemediationTest, RemediateHostPlansOverTheApplyRegistry) {
   // Given a plugin that cannot run at boot time beside one that can.
-  std::string noBoot = V3Manifest("python", {"system:identity:hostname"}, "system", "REMEDIATE:h", {});
-  noBoot.replace(noBoot.find("\"boot\":true"), 11, "\"boot\":false");
-  Manifest("h/plugin.json", noBoot);
+  Manifest("h/plugin.json", Replaced(V3Manifest("python", {"system:identity:hostname"}, "system", "REMEDIATE:h", {}),
+                                     "\"boot\":true", "\"boot\":false"));
   Document boot;
   ParseDocument(R"({"network":{"dns":{"config":{"servers":[]}}},"system":{"identity":{"hostname":{}}}})", boot);
   EXPECT_EQ(RemediateHost(boot, "ctx", task_, true, runner_), ErrorInfo());

@@ -7,8 +7,7 @@ hoxcm_add_test(workflow_test
   workflow/remediation_test.cc
   workflow/validation_test.cc
   workflow/verdicts_e2e_test.cc)
-# The end-to-end cases start the runners with the sample and conformance
-# plugins.
+# The end-to-end cases start the runners with the sample plugins.
 if(TARGET cpp_plugin_runner AND TARGET hoxcm_sample_network)
-  add_dependencies(workflow_test cpp_plugin_runner hoxcm_sample_network hoxcm_conformance_plugin)
+  add_dependencies(workflow_test cpp_plugin_runner hoxcm_sample_network)
 endif()
