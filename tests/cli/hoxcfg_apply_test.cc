@@ -32,10 +32,9 @@ std::string SlowStorage(double seconds) {
          "        f.write('end %d\\n' % os.getppid())\n";
 }
 
-class HoxcfgApplyTest : public ::testing::Test {
+class HoxcfgApplyTest : public HoxcfgTest {
  protected:
-  HoxcfgApplyTest() { EXPECT_EQ(Run("init --sample").exitCode, 0); }
-  HoxcfgOutcome Run(const std::string& args) { return RunHoxcfg(root_, args); }
+  void SetUp() override { InitSample(); }
   // The "outcome" of every history record, in order.
   std::vector<std::string> Outcomes() {
     const HoxcfgOutcome o = Run("history --json");
@@ -45,8 +44,6 @@ class HoxcfgApplyTest : public ::testing::Test {
     for (const auto& record : doc["records"].GetArray()) outcomes.push_back(record["outcome"].GetString());
     return outcomes;
   }
-
-  TempRoot root_;
 };
 
 TEST_F(HoxcfgApplyTest, PlanAndApplyAnswerWithTheDocumentedExitStatuses) {

@@ -28,9 +28,9 @@ std::string DataFile(const std::string& path) {
 std::string SampleFile(const std::string& path) { return DataFile("sample-host" + path); }
 const std::string kSampleKernelPlugin = DataFile("sample-plugins/system/kernel/plugin.py");
 
-class HoxcfgBootTest : public ::testing::Test {
+class HoxcfgBootTest : public HoxcfgTest {
  protected:
-  HoxcfgBootTest() { EXPECT_EQ(Run("init --sample").exitCode, 0); }
+  void SetUp() override { InitSample(); }
   HoxcfgOutcome Run(const std::string& args) { return RunHoxcfg(root_, "--yes " + args); }
   // The sample host's export with the value at `pointer` (below "/profile")
   // replaced by `json`; by default a change that needs a reboot.
@@ -49,8 +49,6 @@ class HoxcfgBootTest : public ::testing::Test {
     for (const auto& e : doc["errors"].GetArray()) status += std::string(" ") + e["id"].GetString();
     return status + " (" + std::to_string(o.exitCode) + ")";
   }
-
-  TempRoot root_;
 };
 
 TEST_F(HoxcfgBootTest, ABootstrapThatNeedsARebootIsAppliedByTheNextBoot) {

@@ -21,10 +21,8 @@
 namespace hoxcm_test {
 namespace {
 
-class HoxcfgCliTest : public ::testing::Test {
+class HoxcfgCliTest : public HoxcfgTest {
  protected:
-  HoxcfgOutcome Run(const std::string& args) { return RunHoxcfg(root_, args); }
-  void InitSample() { ASSERT_EQ(Run("init --sample").exitCode, 0); }
   // The sample host's export, changed: a user added, an NFS mount removed,
   // a CHAP secret changed.
   std::string ChangedDocument() {
@@ -33,7 +31,6 @@ class HoxcfgCliTest : public ::testing::Test {
                        {"/storage/nfs/mounts/1", ""},
                        {"/storage/iscsi/targets/0/chapSecret", R"("changed-secret")"}});
   }
-  TempRoot root_;
 };
 
 TEST_F(HoxcfgCliTest, FileProblemsNameTheFileTheReasonAndThePosition) {

@@ -11,21 +11,22 @@
 namespace hoxcm_test {
 namespace {
 
-TEST(HoxcfgItemTest, GetSetAndDeleteAnswerWithTheirExitStatuses) {
-  TempRoot root;
-  ASSERT_EQ(RunHoxcfg(root, "init --sample").exitCode, 0);
+using HoxcfgItemTest = HoxcfgTest;
+
+TEST_F(HoxcfgItemTest, GetSetAndDeleteAnswerWithTheirExitStatuses) {
+  InitSample();
 
   // Secrets are masked, and shown only to root on a terminal.
-  HoxcfgOutcome r = RunHoxcfg(root, "get security/accounts/users --json --compact");
+  HoxcfgOutcome r = Run("get security/accounts/users --json --compact");
   EXPECT_EQ(r.exitCode, 0);
   EXPECT_TRUE(Has(r.out, R"("password":"******")") && !Has(r.out, "$6$")) << r.out;
-  EXPECT_EQ(RunHoxcfg(root, "get security/accounts/users --show-secrets").exitCode, 2);
-  r = RunHoxcfgOnTerminal(root, "get security/accounts/users --show-secrets");
+  EXPECT_EQ(Run("get security/accounts/users --show-secrets").exitCode, 2);
+  r = RunHoxcfgOnTerminal(root_, "get security/accounts/users --show-secrets");
   EXPECT_EQ(r.exitCode, ::geteuid() == 0 ? 0 : 2) << r.out;
   EXPECT_EQ(Has(r.out, "$6$"), ::geteuid() == 0) << r.out;
 
   const std::string dns = R"(set network/dns/config --value '{"servers": ["10.0.0.53"]}')";
-  RunSteps(root, {
+  RunSteps(root_, {
       // Findings per field: 1; a value that cannot be the item: 2.
       {R"(set network/dns/config --yes --value '{"servers": "10.0.0.1"}')", 1,
        "--value: /network/dns/config/servers: must be an array\n"},
@@ -39,14 +40,14 @@ TEST(HoxcfgItemTest, GetSetAndDeleteAnswerWithTheirExitStatuses) {
   });
 
   // Staged for the next boot: 3, shown as desired; then every change is refused.
-  r = RunHoxcfg(root, "set system/kernel/boot_options --yes --json --compact --value "
+  r = Run("set system/kernel/boot_options --yes --json --compact --value "
                       R"('{"iommu": true, "hugepages": 4096, "console": "ttyS0"}')");
   EXPECT_EQ(r.exitCode, 3);
   EXPECT_EQ(r.out, R"({"item":"/system/kernel/boot_options","status":"staged","impact":2,"reasons":[{"component":)"
                    R"("system","group":"kernel","key":"boot_options","instance":"","action":"SET","impact":2,)"
                    R"("reasons":[{"rule":"property","impact":2,"path":"/system/kernel/boot_options/hugepages",)"
                    R"("oldValue":"2048","newValue":"4096"}]}]})" "\n");
-  RunSteps(root, {{"show desired --compact", 0, R"("hugepages":4096)"},
+  RunSteps(root_, {{"show desired --compact", 0, R"("hugepages":4096)"},
                   {R"(set network/dns/config --yes --value '{"servers": ["10.0.0.54"]}')", 2, "error 2029"}});
 }
 

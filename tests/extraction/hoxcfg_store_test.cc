@@ -14,15 +14,7 @@ namespace {
 
 using namespace HoxConfigManager;
 
-class HoxcfgStoreTest : public ::testing::Test {
- protected:
-  HoxcfgOutcome Run(const std::string& args) { return RunHoxcfg(root_, args); }
-  void InitSample() {
-    const HoxcfgOutcome init = Run("init --sample");
-    ASSERT_EQ(init.exitCode, 0) << init.err;
-  }
-  TempRoot root_;
-};
+using HoxcfgStoreTest = HoxcfgTest;
 
 TEST_F(HoxcfgStoreTest, InitCreatesASampleHostThatExportsToAPrivateFile) {
   RunSteps(root_, {{"init --root " + root_.path() + " --sample", 0, "installed schemas"}});

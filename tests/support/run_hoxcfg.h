@@ -120,6 +120,14 @@ inline std::string ExportWith(const TempRoot& root, const std::string& name,
   return root.Path("/" + name);
 }
 
+// A command-line test on its own sandbox root.
+class HoxcfgTest : public ::testing::Test {
+ protected:
+  HoxcfgOutcome Run(const std::string& args) { return RunHoxcfg(root_, args); }
+  void InitSample() { ASSERT_EQ(Run("init --sample").exitCode, 0); }
+  TempRoot root_;
+};
+
 // Runs hoxcfg with its standard streams on a new terminal, typing `input`,
 // then calling `whileRunning` with the terminal (to type more while it
 // runs). `out` holds what the terminal showed (stdout and stderr, "\r\n"
