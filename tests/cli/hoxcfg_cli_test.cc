@@ -157,7 +157,7 @@ TEST_F(HoxcfgCliTest, DriftAndComplianceAnswerByExitStatusAndSpellItemsOneWay) {
 
 TEST_F(HoxcfgCliTest, JsonOutputIsOneObjectOnOneLineWhenCompact) {
   // Given --json --compact, each command should print one JSON object on one
-  // line (the members of each: hoxcfg_docs_test.cc).
+  // line (the members of each: docs_and_help_pages_test.py).
   InitSample();
   const std::string doc = ChangedDocument();
   for (const std::string& args : std::vector<std::string>{"init --sample --reset", "maintenance status", "maintenance exit", "schemas", "plugins list", "plugins check",
