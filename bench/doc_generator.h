@@ -1,6 +1,6 @@
 // A deterministic generator of host configuration documents for benchmarks
 // and property tests: the sample host's keys replicated to scale, a host
-// document filled from their schemas, and a desired document that differs
+// document filled with values that their schemas allow, and a desired document that differs
 // from it in a controlled way.
 //
 // Not thread-safe (it writes files and changes nothing else).
@@ -29,13 +29,18 @@ struct GeneratorOptions {
   double oneSidedKeys = 0.01;
   // Share of multi-instance keys whose host instances are shuffled.
   double shuffledKeys = 0.2;
+  // Keys of the desired document, spread evenly, given one invalid value
+  // each (one schema finding each): real documents are valid, or nearly.
+  int faults = 0;
 };
 
 // Writes the sample host's schemas, replicated `replicas` times, into the
 // schema directory of the current root (HOX_ROOT).
 void InstallReplicatedSchemas(int replicas);
 
-// Fills `host` and `desired` as described above. With changeRate,
+// Fills `host` and `desired` as described above. Every value satisfies its
+// key's schema (patterns, enumerations, bounds, lengths, formats), so both
+// documents validate, except for the `faults` planted in `desired`. With changeRate,
 // instanceChurn, oneSidedKeys and shuffledKeys all 0, desired equals host.
 void GeneratePair(const GeneratorOptions& options, rapidjson::Document& host, rapidjson::Document& desired);
 
