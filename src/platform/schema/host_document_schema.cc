@@ -10,7 +10,9 @@
 #include <hoxcm/json.h>
 #include <hoxcm/schema_store.h>
 
+#include "foundation/compare/value_compare.h"
 #include "foundation/schema_refs.h"
+#include "platform/schema/prepared_schema.h"
 
 namespace HoxSchemaStore {
 namespace {
@@ -27,6 +29,23 @@ rapidjson::Value ClosedObjectSchema(rapidjson::Document::AllocatorType& a) {
 }
 
 }  // namespace
+
+rapidjson::Value detail::EmbeddedKeySchema(const SchemaObject& schema, std::string_view component,
+                                           std::string_view group, std::string_view key,
+                                           rapidjson::Document::AllocatorType& allocator) {
+  rapidjson::Value out(schema.GetJsonSchema(), allocator);
+  // The key's references name places in its own schema, which now sits
+  // three levels down.
+  std::string fragment;
+  for (const std::string_view name : {component, group, key}) {
+    fragment += "/properties";
+    HoxConfigManager::detail::AppendReferenceToken(fragment, name);
+  }
+  HoxConfigManager::detail::RebaseReferences(out, fragment, allocator);
+  // Host-specific keys are told apart when a document is split per host.
+  if (schema.IsHostSpecific()) out.AddMember("hostSpecific", true, allocator);
+  return out;
+}
 
 void GenerateSchemaDocument(const rapidjson::Value& value, const std::shared_ptr<SchemaCache>& cache,
                             rapidjson::Document& out) {
@@ -56,17 +75,10 @@ void GenerateSchemaDocument(const rapidjson::Value& value, const std::shared_ptr
     void Item(const HoxConfigManager::DocumentShape::Item<const rapidjson::Value>& item) {
       auto schema = store.Find(item.component.GetString(), item.group.GetString(), item.key.GetString());
       if (!schema) return;
-      rapidjson::Value keySchema(schema->GetJsonSchema(), a);
-      // The key's references name places in its own schema, which now sits
-      // three levels down.
-      std::string fragment;
-      for (const rapidjson::Value* name : {&item.component, &item.group, &item.key}) {
-        fragment += "/properties";
-        HoxConfigManager::detail::AppendReferenceToken(fragment, {name->GetString(), name->GetStringLength()});
-      }
-      HoxConfigManager::detail::RebaseReferences(keySchema, fragment, a);
-      // Host-specific keys are told apart when a document is split per host.
-      if (schema->IsHostSpecific()) keySchema.AddMember("hostSpecific", true, a);
+      rapidjson::Value keySchema =
+          detail::EmbeddedKeySchema(*schema, HoxConfigManager::compare::NameOf(item.component),
+                                    HoxConfigManager::compare::NameOf(item.group),
+                                    HoxConfigManager::compare::NameOf(item.key), a);
       keys->AddMember(rapidjson::Value(item.key, a), keySchema, a);
     }
     const SchemaStore& store;

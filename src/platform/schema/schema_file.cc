@@ -12,6 +12,7 @@
 #include "foundation/json_parse.h"
 #include "foundation/pattern.h"
 #include "foundation/schema_refs.h"
+#include "platform/schema/prepared_schema.h"
 #include "platform/schema/valijson.h"
 
 namespace HoxSchemaStore::detail {
@@ -330,6 +331,13 @@ KeySchema::KeySchema(Definition definition, std::unique_ptr<Pool> pool, rapidjso
     schema_ = instanceSchema;
     instance_ = &schema_;
   }
+}
+
+KeySchema::~KeySchema() = default;
+
+const JsonValidator::detail::PreparedSchema& KeySchema::Prepared() const {
+  std::call_once(preparedOnce_, [this] { prepared_ = JsonValidator::detail::PrepareKeySchema(*this); });
+  return *prepared_;
 }
 
 int KeySchema::GetRebootOperations(std::vector<std::string>& operations, bool& propertyLevel) const {

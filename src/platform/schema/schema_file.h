@@ -2,14 +2,20 @@
 // that the schema store hands out. The file format is described in
 // docs/schema-store.md.
 //
-// A KeySchema is immutable once built and may be shared between threads.
+// A KeySchema is immutable once built and may be shared between threads;
+// its prepared form for validation is built on first use, once.
 #pragma once
 
 #include <memory>
+#include <mutex>
 #include <string>
 #include <vector>
 
 #include <hoxcm/schema_store.h>
+
+namespace JsonValidator::detail {
+struct PreparedSchema;
+}
 
 namespace HoxSchemaStore::detail {
 
@@ -37,6 +43,7 @@ class KeySchema final : public SchemaObject {
   // moved into the key's JSON schema; it and every value it holds live in
   // `pool`, which the key keeps: nothing is copied.
   KeySchema(Definition definition, std::unique_ptr<Pool> pool, rapidjson::Value& instanceSchema);
+  ~KeySchema() override;
   KeySchema(const KeySchema&) = delete;
   KeySchema& operator=(const KeySchema&) = delete;
 
@@ -56,12 +63,20 @@ class KeySchema final : public SchemaObject {
 
   const Definition& definition() const { return def_; }
 
+  // The key's schema compiled for validating host documents: built by the
+  // first caller (others wait for it) and kept for the key's life, so it is
+  // never older than the schema it is compiled from. Throws std::exception
+  // when the engine refuses the schema, and the next call tries again.
+  const JsonValidator::detail::PreparedSchema& Prepared() const;
+
  private:
   const Definition def_;
   // Sized to the file, so that a small key holds a small pool.
   const std::unique_ptr<Pool> pool_;
   rapidjson::Value schema_;
   const rapidjson::Value* instance_;
+  mutable std::once_flag preparedOnce_;
+  mutable std::unique_ptr<const JsonValidator::detail::PreparedSchema> prepared_;
 };
 
 // Reads and checks the schema file at `path` for the key `id`. Null with a

@@ -1,14 +1,24 @@
 // JSON schema validation: the schema engine (draft 4) for the standard
 // keywords, plus our "unionTag" keyword, and the findings in our format.
+#include <algorithm>
+#include <cstdint>
+#include <iterator>
+#include <memory>
 #include <set>
 #include <string>
+#include <string_view>
+#include <tuple>
 #include <vector>
 
 #include <hoxcm/json.h>
 #include <hoxcm/schema_store.h>
 
+#include "foundation/compare/value_compare.h"
 #include "foundation/schema_refs.h"
 #include "platform/schema/patterns.h"
+#include "platform/schema/prepared_schema.h"
+#include "platform/schema/schema_file.h"
+#include "platform/schema/schema_store_impl.h"
 #include "platform/schema/validator_errors.h"
 #include "platform/schema/valijson.h"
 
@@ -111,6 +121,28 @@ std::string ExpectedType(const Value& schema, const std::string& base, const std
   return types;
 }
 
+using Seen = std::set<std::tuple<std::string, int, std::string>>;
+
+// The findings of an engine run on `schema` (the JSON form of what the
+// engine ran, for the expected types) for the value at `path`.
+void CollectEngineFindings(valijson::ValidationResults& results, const Value& schema, const std::string& path,
+                           Seen& seen, std::vector<Finding>& out) {
+  valijson::ValidationResults::Error error;
+  while (results.popError(error)) {
+    Finding f;
+    if (!detail::ClassifyEngineError(ContextToPath(path, error.context), error.description, f)) continue;
+    if (f.code == VALIDATION_ERR_TYPE) {
+      if (std::string expected = ExpectedType(schema, path, f.field); !expected.empty()) {
+        f.args.push_back(std::move(expected));
+        f.text = DescribeFinding(f.code, f.args, error.description);
+      }
+    }
+    // Variants of a failed oneOf/anyOf may report the same fault twice.
+    if (!seen.emplace(f.field, f.code, f.text).second) continue;
+    out.push_back(std::move(f));
+  }
+}
+
 void RunEngine(const Value& schema, const Value& document, const std::string& path, std::vector<Finding>& out) {
   // A reference the engine cannot resolve in the schema itself would send
   // it after a document it never fetches, or round in circles.
@@ -135,21 +167,8 @@ void RunEngine(const Value& schema, const Value& document, const std::string& pa
     out.push_back(SchemaInvalid(path, e.what()));
     return;
   }
-  valijson::ValidationResults::Error error;
-  std::set<std::tuple<std::string, int, std::string>> seen;
-  while (results.popError(error)) {
-    Finding f;
-    if (!detail::ClassifyEngineError(ContextToPath(path, error.context), error.description, f)) continue;
-    if (f.code == VALIDATION_ERR_TYPE) {
-      if (std::string expected = ExpectedType(schema, path, f.field); !expected.empty()) {
-        f.args.push_back(std::move(expected));
-        f.text = DescribeFinding(f.code, f.args, error.description);
-      }
-    }
-    // Variants of a failed oneOf/anyOf may report the same fault twice.
-    if (!seen.emplace(f.field, f.code, f.text).second) continue;
-    out.push_back(std::move(f));
-  }
+  Seen seen;
+  CollectEngineFindings(results, schema, path, seen, out);
 }
 
 void ValidateValue(const Value& schema, const Value& document, const std::string& path, int depth,
@@ -272,6 +291,197 @@ void ValidateValue(const Value& schema, const Value& document, const std::string
   UnionWalk(schema, depth, out).Walk(document, &schema, path);
 }
 
+// A host document schema that is exactly what the store generates for its
+// keys (one closed object schema per component and group level, each key
+// node equal to the store's key schema as embedded), validated with the
+// keys' compiled schemas. The findings, their order and the budget are the
+// engine's on the whole schema: the engine visits the members a schema
+// names in the order of their names, then reports the first member it does
+// not name; union nodes are checked after the engine, in document order.
+class StoreGeneratedSchema {
+ public:
+  // usable() is false when `schema` differs from what the store generates
+  // in any way, or the store of the current root is not at hand.
+  explicit StoreGeneratedSchema(const Value& schema) {
+    store_ = std::dynamic_pointer_cast<HoxSchemaStore::detail::DirectorySchemaStore>(
+        HoxSchemaStore::SchemaStore::GetStore());
+    usable_ = store_ != nullptr && IsRoot(schema) && Build(schema, 0, root_);
+  }
+  bool usable() const { return usable_; }
+
+  void Validate(const Value& document, const std::string& context, std::vector<Finding>& out) const {
+    std::vector<Finding> engine;
+    try {
+      Seen seen;
+      std::string path = context;
+      RunLevel(root_, document, path, 0, seen, engine);
+    } catch (const std::exception& e) {
+      // As the engine on the whole schema: nothing but why it stopped.
+      engine.clear();
+      engine.push_back(SchemaInvalid(context, e.what()));
+    }
+    out.insert(out.end(), std::make_move_iterator(engine.begin()), std::make_move_iterator(engine.end()));
+    std::string path = context;
+    WalkUnions(root_, document, path, 0, out);
+  }
+
+ private:
+  // A component or group level (members) or a key (key).
+  struct Node {
+    std::vector<std::pair<std::string_view, Node>> members;  // sorted by name
+    std::shared_ptr<HoxSchemaStore::detail::KeySchema> key;
+  };
+
+  // The constraints of a level node the engine evaluates: type, properties.
+  static constexpr std::uint64_t kLevelSteps = 2;
+  static constexpr int kKeyDepth = 3;
+
+  static bool IsRoot(const Value& schema) {
+    if (!schema.IsObject()) return false;
+    const auto version = schema.FindMember("$schema");
+    return version == schema.MemberEnd() || version->value == "http://json-schema.org/draft-04/schema#";
+  }
+
+  // {"type": "object", "properties": {...}, "additionalProperties": false},
+  // with "$schema" at the root.
+  static const Value* ClosedLevelProperties(const Value& node, bool root) {
+    if (!node.IsObject()) return nullptr;
+    const Value* properties = nullptr;
+    bool type = false;
+    bool closed = false;
+    for (const auto& m : node.GetObject()) {
+      if (m.name == "type" && !type && m.value == "object") {
+        type = true;
+      } else if (m.name == "properties" && properties == nullptr && m.value.IsObject()) {
+        properties = &m.value;
+      } else if (m.name == "additionalProperties" && !closed && m.value.IsFalse()) {
+        closed = true;
+      } else if (!(root && m.name == "$schema")) {
+        return nullptr;
+      }
+    }
+    return type && closed ? properties : nullptr;
+  }
+
+  bool Build(const Value& node, int depth, Node& out) {
+    const Value* properties = ClosedLevelProperties(node, depth == 0);
+    if (properties == nullptr) return false;
+    out.members.reserve(properties->MemberCount());
+    for (const auto& m : properties->GetObject()) {
+      out.members.emplace_back(HoxConfigManager::compare::NameOf(m.name), Node());
+      names_[depth] = out.members.back().first;
+      Node& child = out.members.back().second;
+      if (depth + 1 < kKeyDepth ? !Build(m.value, depth + 1, child) : !BuildKey(m.value, child)) return false;
+    }
+    std::sort(out.members.begin(), out.members.end(),
+              [](const auto& a, const auto& b) { return a.first < b.first; });
+    // The engine keeps one schema per name; a repeated name is left to it.
+    return std::adjacent_find(out.members.begin(), out.members.end(), [](const auto& a, const auto& b) {
+             return a.first == b.first;
+           }) == out.members.end();
+  }
+
+  bool BuildKey(const Value& node, Node& out) {
+    out.key = store_->FindKey(HoxSchemaStore::SchemaObjectId(std::string(names_[0]), std::string(names_[1]),
+                                                             std::string(names_[2])));
+    if (!out.key) return false;
+    try {
+      return node == out.key->Prepared().embedded;
+    } catch (const std::exception&) {
+      return false;  // the engine on the whole schema reports it
+    }
+  }
+
+  void RunLevel(const Node& node, const Value& doc, std::string& path, int depth, Seen& seen,
+                std::vector<Finding>& out) const {
+    if (depth == kKeyDepth) {
+      RunKey(*node.key, doc, path, seen, out);
+      return;
+    }
+    detail::ValidationBudget::Charge(kLevelSteps);
+    if (!doc.IsObject()) {
+      Finding f;
+      detail::ClassifyEngineError(path, "Value type not permitted by 'type' constraint.", f);
+      f.args.push_back("object");
+      f.text = DescribeFinding(f.code, f.args, "Value type not permitted by 'type' constraint.");
+      if (seen.emplace(f.field, f.code, f.text).second) out.push_back(std::move(f));
+      return;
+    }
+    // The document's members by name, the first of each name first.
+    std::vector<std::pair<std::string_view, rapidjson::SizeType>> byName;
+    byName.reserve(doc.MemberCount());
+    for (auto m = doc.MemberBegin(); m != doc.MemberEnd(); ++m) {
+      byName.emplace_back(HoxConfigManager::compare::NameOf(m->name),
+                          static_cast<rapidjson::SizeType>(m - doc.MemberBegin()));
+    }
+    std::stable_sort(byName.begin(), byName.end(), [](const auto& a, const auto& b) { return a.first < b.first; });
+    std::vector<bool> named(doc.MemberCount(), false);
+    std::size_t namesMatched = 0;
+    auto member = byName.begin();
+    for (const auto& [name, child] : node.members) {
+      while (member != byName.end() && member->first < name) ++member;
+      if (member == byName.end()) break;
+      if (member->first != name) continue;
+      ++namesMatched;
+      const std::size_t length = path.size();
+      HoxConfigManager::detail::AppendPointerToken(path, name);
+      RunLevel(child, doc.MemberBegin()[member->second].value, path, depth + 1, seen, out);
+      path.resize(length);
+      for (; member != byName.end() && member->first == name; ++member) named[member->second] = true;
+    }
+    if (namesMatched == doc.MemberCount()) return;
+    std::string unwanted;
+    for (rapidjson::SizeType i = 0; i < doc.MemberCount(); ++i) {
+      if (!named[i]) {
+        unwanted = HoxConfigManager::compare::NameOf(doc.MemberBegin()[i].name);
+        break;
+      }
+    }
+    Finding f;
+    detail::ClassifyEngineError(path,
+                                "Object contains a property that could not be validated using 'properties' or "
+                                "'additionalProperties' constraints: '" +
+                                    unwanted + "'.",
+                                f);
+    if (seen.emplace(f.field, f.code, f.text).second) out.push_back(std::move(f));
+  }
+
+  static void RunKey(const HoxSchemaStore::detail::KeySchema& key, const Value& doc, const std::string& path,
+                     Seen& seen, std::vector<Finding>& out) {
+    valijson::ValidationResults results;
+    valijson::Validator validator;
+    validator.validate(*key.Prepared().engine, valijson::adapters::RapidJsonAdapter(doc), &results);
+    CollectEngineFindings(results, key.GetJsonSchema(), path, seen, out);
+  }
+
+  // Members in document order, as the union walk on the whole schema goes.
+  void WalkUnions(const Node& node, const Value& doc, std::string& path, int depth, std::vector<Finding>& out) const {
+    if (depth == kKeyDepth) {
+      if (node.key->Prepared().unions) {
+        const Value& schema = node.key->GetJsonSchema();
+        UnionWalk(schema, 0, out).Walk(doc, &schema, path);
+      }
+      return;
+    }
+    if (!doc.IsObject()) return;
+    for (const auto& m : doc.GetObject()) {
+      const std::string_view name = HoxConfigManager::compare::NameOf(m.name);
+      const auto child = std::lower_bound(node.members.begin(), node.members.end(), name,
+                                          [](const auto& entry, std::string_view n) { return entry.first < n; });
+      if (child == node.members.end() || child->first != name) continue;
+      const std::size_t length = path.size();
+      HoxConfigManager::detail::AppendPointerToken(path, name);
+      WalkUnions(child->second, m.value, path, depth + 1, out);
+      path.resize(length);
+    }
+  }
+
+  std::shared_ptr<HoxSchemaStore::detail::DirectorySchemaStore> store_;
+  Node root_;
+  std::string_view names_[kKeyDepth];  // of the key being built
+  bool usable_ = false;
+};
+
 int WriteFindings(const std::vector<Finding>& findings, const std::set<int>& ignored, rapidjson::Document& result) {
   result.SetArray();
   auto& a = result.GetAllocator();
@@ -299,6 +509,34 @@ std::size_t Depth(const std::string& field, const std::string& context) {
 
 }  // namespace
 
+namespace detail {
+
+bool UsesKeySchemas(const Value& schema) { return StoreGeneratedSchema(schema).usable(); }
+
+PreparedSchema::PreparedSchema() = default;
+PreparedSchema::~PreparedSchema() = default;
+
+std::unique_ptr<const PreparedSchema> PrepareKeySchema(const HoxSchemaStore::SchemaObject& schema) {
+  auto prepared = std::make_unique<PreparedSchema>();
+  const HoxSchemaStore::SchemaObjectId& id = schema.GetId();
+  Value embedded =
+      HoxSchemaStore::detail::EmbeddedKeySchema(schema, id.component, id.group, id.key, prepared->embedded.GetAllocator());
+  static_cast<Value&>(prepared->embedded).Swap(embedded);
+  prepared->unions = ContainsUnionTag(schema.GetJsonSchema());
+  rapidjson::Document stripped;
+  if (prepared->unions) {
+    stripped.CopyFrom(schema.GetJsonSchema(), stripped.GetAllocator());
+    RemoveUnionVariants(stripped);
+  }
+  prepared->engine = std::make_unique<valijson::Schema>();
+  valijson::SchemaParser parser(valijson::SchemaParser::kDraft4);
+  const valijson::adapters::RapidJsonAdapter adapter(prepared->unions ? stripped : schema.GetJsonSchema());
+  parser.populateSchema(adapter, *prepared->engine);
+  return prepared;
+}
+
+}  // namespace detail
+
 int Validate(const Value& schema, const Value& document, rapidjson::Document& result, const std::set<int>& ignored,
              const std::string& context) {
   const detail::ValidationBudget budget(detail::BudgetFor(document));
@@ -311,7 +549,11 @@ int ValidateCMDocument(const Value& schema, const Value& document, rapidjson::Do
                        const std::set<int>& ignored, const std::string& context) {
   const detail::ValidationBudget budget(detail::BudgetFor(document));
   std::vector<Finding> findings;
-  ValidateValue(schema, document, context, 0, findings);
+  if (const StoreGeneratedSchema generated(schema); generated.usable()) {
+    generated.Validate(document, context, findings);
+  } else {
+    ValidateValue(schema, document, context, 0, findings);
+  }
   for (Finding& f : findings) {
     // Members the host document schema does not know, down to key level,
     // are configuration keys without a schema.
