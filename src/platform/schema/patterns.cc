@@ -1,8 +1,8 @@
 #include "platform/schema/patterns.h"
 
-#include <functional>
 #include <memory>
 #include <string_view>
+#include <unordered_map>
 
 #include "foundation/pattern.h"
 #include "foundation/schema_refs.h"
@@ -21,17 +21,40 @@ thread_local ValidationBudget* current = nullptr;
 
 // The compiled pattern; a refused one throws, which makes the schema
 // unusable (error 31) with the reason. CheckPatterns refuses such schemas
-// first, so this is only a safety net.
-std::shared_ptr<const SchemaPattern> Compiled(std::string_view source) {
-  std::string why;
-  auto pattern = SchemaPattern::Get(source, &why);
-  if (!pattern) throw std::runtime_error(why);
-  return pattern;
+// first, so this is only a safety net. Each thread keeps the patterns it
+// has used, so that matching a value takes neither the process-wide
+// cache's lock nor a copy of the pattern; a pattern's compiled form depends
+// on its text alone, so an entry is never stale.
+const SchemaPattern& Compiled(std::string_view source) {
+  constexpr std::size_t kMaxPerThread = 256;
+  thread_local std::unordered_map<std::string, std::shared_ptr<const SchemaPattern>> known;
+  thread_local std::string key;
+  key.assign(source);
+  auto it = known.find(key);
+  if (it == known.end()) {
+    std::string why;
+    auto pattern = SchemaPattern::Get(source, &why);
+    if (!pattern) throw std::runtime_error(why);
+    if (known.size() >= kMaxPerThread) known.clear();
+    it = known.emplace(key, std::move(pattern)).first;
+  }
+  return *it->second;
 }
 
 bool Matches(std::string_view source, std::string_view subject) {
   ValidationBudget::Charge(1 + subject.size() / kBytesPerStep);
-  return Compiled(source)->Search(subject);
+  return Compiled(source).Search(subject);
+}
+
+// The values of `v` (itself, its members and elements, at any depth).
+std::uint64_t CountValues(const rapidjson::Value& v) {
+  std::uint64_t values = 1;
+  if (v.IsObject()) {
+    for (const auto& m : v.GetObject()) values += CountValues(m.value);
+  } else if (v.IsArray()) {
+    for (const auto& e : v.GetArray()) values += CountValues(e);
+  }
+  return values;
 }
 
 }  // namespace
@@ -61,17 +84,7 @@ std::string CheckPatterns(const rapidjson::Value& schema) {
 }
 
 std::uint64_t BudgetFor(const rapidjson::Value& document) {
-  std::uint64_t values = 0;
-  const std::function<void(const rapidjson::Value&)> count = [&](const rapidjson::Value& v) {
-    ++values;
-    if (v.IsObject()) {
-      for (const auto& m : v.GetObject()) count(m.value);
-    } else if (v.IsArray()) {
-      for (const auto& e : v.GetArray()) count(e);
-    }
-  };
-  count(document);
-  return kBaseBudget + kBudgetPerValue * values;
+  return kBaseBudget + kBudgetPerValue * CountValues(document);
 }
 
 BudgetExhausted::BudgetExhausted(std::uint64_t steps)
@@ -112,7 +125,8 @@ bool Visitor::validationCallback(const constraints::Constraint& constraint, Visi
 template <>
 bool Visitor::visit(const constraints::PatternConstraint& constraint) {
   if ((m_strictTypes && !m_target.isString()) || !m_target.maybeString()) return true;
-  const std::string pattern = constraint.getPattern<std::string::allocator_type>();
+  thread_local std::string pattern;  // reused: no allocation per value
+  constraint.getPattern(pattern);
   if (Matches(pattern, m_target.asString())) return true;
   if (m_results) m_results->pushError(m_context, "Failed to match regex specified by 'pattern' constraint.");
   return false;
