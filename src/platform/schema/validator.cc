@@ -303,9 +303,12 @@ class StoreGeneratedSchema {
   // usable() is false when `schema` differs from what the store generates
   // in any way, or the store of the current root is not at hand.
   explicit StoreGeneratedSchema(const Value& schema) {
+    // The store is consulted only for a schema of its shape: a caller's own
+    // schema needs none (and a root without schemas would log its absence).
+    if (!IsRoot(schema) || ClosedLevelProperties(schema, true) == nullptr) return;
     store_ = std::dynamic_pointer_cast<HoxSchemaStore::detail::DirectorySchemaStore>(
         HoxSchemaStore::SchemaStore::GetStore());
-    usable_ = store_ != nullptr && IsRoot(schema) && Build(schema, 0, root_);
+    usable_ = store_ != nullptr && Build(schema, 0, root_);
   }
   bool usable() const { return usable_; }
 
