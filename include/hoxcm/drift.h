@@ -90,6 +90,8 @@ class HOXCM_API ApplyTaskGenerator final : public DriftHandler {
                   const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema, ACTION action,
                   std::shared_ptr<HoxConfigStore::DriftObject> drift);
   std::vector<DesiredConfigInput> getTasks() const;
+  // The list itself, moved out: the generator is left empty.
+  std::vector<DesiredConfigInput> takeTasks();
 
  private:
   std::vector<DesiredConfigInput> tasks_;

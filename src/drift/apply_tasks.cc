@@ -33,12 +33,18 @@ void ApplyTaskGenerator::createTask(const HoxConfigStore::ConfigStoreObjectId& i
 
 std::vector<DesiredConfigInput> ApplyTaskGenerator::getTasks() const { return tasks_; }
 
+std::vector<DesiredConfigInput> ApplyTaskGenerator::takeTasks() {
+  std::vector<DesiredConfigInput> tasks;
+  tasks.swap(tasks_);
+  return tasks;
+}
+
 std::vector<DesiredConfigInput> GenerateApplyTasks(Document& desired) {
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "GenerateApplyTasks");
   ApplyTaskGenerator generator;
   // The walk unwraps a "profile" wrapper itself.
   ComputeDrift(desired, desired.GetAllocator(), generator, std::nullopt);
-  return generator.getTasks();
+  return generator.takeTasks();
 }
 
 std::vector<DesiredConfigInput> GenerateBootTimeTasks(const Document& desired) {

@@ -77,7 +77,10 @@ ApplyResult ApplySteps(const std::shared_ptr<CheckApplyResult>& check, const std
   Document desired = CopyOf(check->document);
   ImpactResult impact;
   ImpactReasons reasons;
-  Impact(desired, check->operationContext, impact, task->ChildTask(2), std::nullopt, &reasons, *runner);
+  // One walk gives the verdict and the apply tasks: the host cannot change
+  // between the two while this apply holds the host run lock.
+  std::vector<DesiredConfigInput> tasks;
+  Impact(desired, check->operationContext, impact, task->ChildTask(2), std::nullopt, &reasons, *runner, tasks);
   if (!impact.error.id.empty()) {
     result.errorInfo = impact.error;
     return result;
@@ -119,7 +122,7 @@ ApplyResult ApplySteps(const std::shared_ptr<CheckApplyResult>& check, const std
   }
   HoxConfigStore::SetBootMode(HoxConfigStore::BOOTMODE_NORMAL);
   RemediationOutcome outcome =
-      RemediateHostRuns(desired, std::string(check->operationContext), task->ChildTask(2), false, *runner);
+      RemediateHostRuns(tasks, std::string(check->operationContext), task->ChildTask(2), *runner);
   record.runs = HistoryRuns(outcome.runs);
   result.errorInfo = std::move(outcome.error);
   if (result.errorInfo.id.empty() && maintenanceMode) result.status = APPLY_COMPLETED_IN_MAINTENANCE_MODE;

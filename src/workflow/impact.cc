@@ -59,6 +59,51 @@ void AddPluginReason(ImpactReasons& reasons, const TaskMap& run, const ImpactPlu
   entry.reasons.push_back(std::move(reason));
 }
 
+// Feeds one walk to the impact handler and the apply task generator, in
+// that order. Both ask the walk for the same report (consolidated sets with
+// their drift records, no per-property walk), so either sees exactly the
+// calls it would see walking alone.
+class ImpactAndTasks final : public DriftHandler {
+ public:
+  ImpactAndTasks(ImpactHandler& impact, ApplyTaskGenerator& tasks)
+      : DriftHandler(impact.IsConsolidatedActionRequired(), impact.IsCreateDriftObject(), impact.IsPerProperty()),
+        impact_(impact),
+        tasks_(tasks) {
+    RAPIDJSON_ASSERT(tasks.IsConsolidatedActionRequired() == IsConsolidatedActionRequired() &&
+                     tasks.IsCreateDriftObject() == IsCreateDriftObject() && tasks.IsPerProperty() == IsPerProperty());
+  }
+
+  void Add(const Value& desired, const HoxConfigStore::ConfigStoreObjectId& id,
+           const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema, const std::string& path) override {
+    impact_.Add(desired, id, schema, path);
+    tasks_.Add(desired, id, schema, path);
+  }
+  void Set(const Value& desired, const Value& current, const HoxConfigStore::ConfigStoreObjectId& id,
+           const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema, const std::string& path,
+           const Value& drift) override {
+    impact_.Set(desired, current, id, schema, path, drift);
+    tasks_.Set(desired, current, id, schema, path, drift);
+  }
+  void Delete(const Value& current, const HoxConfigStore::ConfigStoreObjectId& id,
+              const std::shared_ptr<HoxSchemaStore::SchemaObject>& schema, const std::string& path) override {
+    impact_.Delete(current, id, schema, path);
+    tasks_.Delete(current, id, schema, path);
+  }
+  void PropertyDrift(const Value& desired, const Value& current, const Value& schemaNode, const std::string& path,
+                     ACTION action) override {
+    impact_.PropertyDrift(desired, current, schemaNode, path, action);
+    tasks_.PropertyDrift(desired, current, schemaNode, path, action);
+  }
+
+ private:
+  ImpactHandler& impact_;
+  ApplyTaskGenerator& tasks_;
+};
+
+void ImpactWith(Document& desiredDocument, const std::string& taskId, ImpactResult& result,
+                std::shared_ptr<TaskHandle> taskHandle, std::optional<Document> currentDocument,
+                ImpactReasons* reasons, PluginRunner& runner, std::vector<DesiredConfigInput>* applyTasks);
+
 }  // namespace
 
 std::size_t ImpactInfoHash::operator()(const ImpactInfo& info) const {
@@ -111,13 +156,36 @@ void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& 
 void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& result,
             std::shared_ptr<TaskHandle> taskHandle, std::optional<Document> currentDocument, ImpactReasons* reasons,
             PluginRunner& runner) {
+  ImpactWith(desiredDocument, taskId, result, std::move(taskHandle), std::move(currentDocument), reasons, runner,
+             nullptr);
+}
+
+void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& result,
+            std::shared_ptr<TaskHandle> taskHandle, std::optional<Document> currentDocument, ImpactReasons* reasons,
+            PluginRunner& runner, std::vector<DesiredConfigInput>& applyTasks) {
+  ImpactWith(desiredDocument, taskId, result, std::move(taskHandle), std::move(currentDocument), reasons, runner,
+             &applyTasks);
+}
+
+namespace {
+
+void ImpactWith(Document& desiredDocument, const std::string& taskId, ImpactResult& result,
+                std::shared_ptr<TaskHandle> taskHandle, std::optional<Document> currentDocument,
+                ImpactReasons* reasons, PluginRunner& runner, std::vector<DesiredConfigInput>* applyTasks) {
   const HoxPlatform::LogContext operation(HoxPlatform::LogContext::Field::kOperation, "Impact");
   CSLogger::Log(CSLogger::kDetail, "%s invoked", "Impact");
   std::shared_ptr<TaskHandle> task = taskHandle ? std::move(taskHandle) : TaskHandle::Dummy();
   ImpactHandler handler(reasons != nullptr);
   RAPIDJSON_ASSERT(desiredDocument.IsObject());
   // The walk looks through a "profile" wrapper itself.
-  ComputeDrift(desiredDocument, desiredDocument.GetAllocator(), handler, std::move(currentDocument));
+  if (applyTasks != nullptr) {
+    ApplyTaskGenerator generator;
+    ImpactAndTasks both(handler, generator);
+    ComputeDrift(desiredDocument, desiredDocument.GetAllocator(), both, std::move(currentDocument));
+    *applyTasks = generator.takeTasks();
+  } else {
+    ComputeDrift(desiredDocument, desiredDocument.GetAllocator(), handler, std::move(currentDocument));
+  }
   ImpactReasons why = handler.TakeReasons();
 
   task->UpdateProgress(20.0f);
@@ -174,5 +242,7 @@ void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& 
   CSLogger::Log(CSLogger::kDetail, "Impact of the desired configuration: %s", ImpactName(result.impact));
   if (reasons != nullptr) *reasons = std::move(why);
 }
+
+}  // namespace
 
 }  // namespace HoxConfigManager

@@ -7,6 +7,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include <hoxcm/operations.h>
 
@@ -22,5 +23,14 @@ inline constexpr const char* kImpactInfoMaintenanceMode = "com.tarvik.settings.i
 void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& result,
             std::shared_ptr<TaskHandle> taskHandle, std::optional<Document> currentDocument, ImpactReasons* reasons,
             PluginRunner& runner);
+
+// Impact as above whose walk also yields the apply tasks of the document into
+// `applyTasks` (replaced): exactly what GenerateApplyTasks would return against
+// the same host. Apply uses it to walk the document once, while it holds the
+// host run lock, so that the host cannot change between the verdict and the
+// remediation it allows.
+void Impact(Document& desiredDocument, const std::string& taskId, ImpactResult& result,
+            std::shared_ptr<TaskHandle> taskHandle, std::optional<Document> currentDocument, ImpactReasons* reasons,
+            PluginRunner& runner, std::vector<DesiredConfigInput>& applyTasks);
 
 }  // namespace HoxConfigManager

@@ -51,10 +51,15 @@ RemediationOutcome RunRemediation(const RemediationPlan& plan, PluginRunner& run
   return outcome;
 }
 
-RemediationOutcome RemediateHostRuns(Document& desired, std::string operationContext,
-                                     std::shared_ptr<TaskHandle> task, bool boot, PluginRunner& runner) {
+namespace {
+
+void LogRemediating(bool boot) {
   CSLogger::Log(CSLogger::kDetail, "Remediating HOXi host to desired configuration (boot=%d).", boot ? 1 : 0);
-  const std::vector<DesiredConfigInput> tasks = boot ? GenerateBootTimeTasks(desired) : GenerateApplyTasks(desired);
+}
+
+// What follows the tasks: an empty list loads no plugin.
+RemediationOutcome RemediateTasks(const std::vector<DesiredConfigInput>& tasks, const std::string& operationContext,
+                                  std::shared_ptr<TaskHandle> task, bool boot, PluginRunner& runner) {
   if (tasks.empty()) {
     CSLogger::Log(CSLogger::kWarning, "No tasks generated for the desired configuration.");
     return {};
@@ -62,6 +67,21 @@ RemediationOutcome RemediateHostRuns(Document& desired, std::string operationCon
   PluginManager registry(APPLY);
   const RemediationPlan plan = PlanRemediation(tasks, RegistryOwners(registry), registry.GetDependencies(), boot);
   return RunRemediation(plan, runner, operationContext, std::move(task));
+}
+
+}  // namespace
+
+RemediationOutcome RemediateHostRuns(Document& desired, std::string operationContext,
+                                     std::shared_ptr<TaskHandle> task, bool boot, PluginRunner& runner) {
+  LogRemediating(boot);
+  const std::vector<DesiredConfigInput> tasks = boot ? GenerateBootTimeTasks(desired) : GenerateApplyTasks(desired);
+  return RemediateTasks(tasks, operationContext, std::move(task), boot, runner);
+}
+
+RemediationOutcome RemediateHostRuns(const std::vector<DesiredConfigInput>& applyTasks, std::string operationContext,
+                                     std::shared_ptr<TaskHandle> task, PluginRunner& runner) {
+  LogRemediating(false);
+  return RemediateTasks(applyTasks, operationContext, std::move(task), false, runner);
 }
 
 ErrorInfo RemediateHost(Document& desired, std::string operationContext, std::shared_ptr<TaskHandle> task,

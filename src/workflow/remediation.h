@@ -61,5 +61,11 @@ ErrorInfo RemediateHost(Document& desired, std::string operationContext, std::sh
 // record in the apply history.
 RemediationOutcome RemediateHostRuns(Document& desired, std::string operationContext,
                                      std::shared_ptr<TaskHandle> task, bool boot, PluginRunner& runner);
+// RemediateHostRuns without boot, given the apply tasks that
+// GenerateApplyTasks would return now (Apply has them from its impact walk,
+// made under the host run lock it still holds). Logs, plans and runs exactly
+// as the other form.
+RemediationOutcome RemediateHostRuns(const std::vector<DesiredConfigInput>& applyTasks, std::string operationContext,
+                                     std::shared_ptr<TaskHandle> task, PluginRunner& runner);
 
 }  // namespace HoxConfigManager

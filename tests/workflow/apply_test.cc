@@ -10,6 +10,7 @@
 #include "support/log_capture.h"
 #include "workflow/apply.h"
 #include "workflow/apply_history.h"
+#include "workflow/impact.h"
 #include "workflow/workflow_fixture.h"
 
 namespace hoxcm_test {
@@ -122,6 +123,34 @@ TEST_F(ApplyTest, ApplyActsOnTheRecomputedVerdictOnlyWhenItStillHolds) {
   }
   EXPECT_EQ(ThrownBy([&] { Apply(nullptr, task_, runner_); }).code, 2024);
   EXPECT_EQ(LastHistory().outcome, "refused");
+}
+
+TEST_F(ApplyTest, TheImpactWalkYieldsTheTasksThatGenerateApplyTasksReturns) {
+  // Given a change, an addition and a removal of instances, a reboot change
+  // and a profile wrapper, Apply's single walk should hand the remediation
+  // the very tasks of the separate call, in its order.
+  const std::string text = Replaced(Replaced(kFree, "2048", "4096"), R"({"name": "ssh", "action": "allow", "protocol": "tcp"})",
+                                    R"({"name": "web", "action": "allow"})");
+  const std::string desiredText = R"({"profile": )" + text + "}";
+  const auto Shown = [](const std::vector<DesiredConfigInput>& tasks) {
+    std::vector<std::string> lines;
+    for (const DesiredConfigInput& t : tasks) {
+      lines.push_back(t.action + " " + t.object->GetConfigStoreObjectId().toString() + " " + t.object->Serialize() +
+                      " " + (t.drift ? t.drift->Serialize() : "-"));
+    }
+    return lines;
+  };
+  Document reference = Parse(desiredText);
+  const std::vector<std::string> expected = Shown(GenerateApplyTasks(reference));
+  ASSERT_EQ(expected.size(), 4u);  // SET dns, SET kernel, ADD web, DELETE ssh
+
+  Document desired = Parse(desiredText);
+  ImpactResult impact;
+  ImpactReasons reasons;
+  std::vector<DesiredConfigInput> tasks;
+  Impact(desired, "ctx", impact, task_, std::nullopt, &reasons, runner_, tasks);
+  EXPECT_EQ(impact.impact, IMPACT_REBOOT_REQUIRED);
+  EXPECT_EQ(Shown(tasks), expected);
 }
 
 TEST_F(ApplyTest, FailuresAndAbortsStopTheRunAndAreReturned) {
