@@ -236,6 +236,11 @@ class HOXCM_API PluginLauncher {
  public:
   PluginLauncher(const std::string& id, int version, const std::string& operation,
                  const std::vector<DesiredConfigInput>& inputs, const std::string& type, std::string module);
+  // Apply and impact form whose caller writes the request itself
+  // (WriteInputsRequest in the library), so that no request document is
+  // built: GetRequest() is then empty.
+  PluginLauncher(const std::string& id, int version, const std::string& operation, const std::string& type,
+                 std::string module);
   // Validation form: the request is built from store objects.
   PluginLauncher(const std::string& id, int version,
                  const std::vector<std::shared_ptr<HoxConfigStore::ConfigStoreObject>>& data,

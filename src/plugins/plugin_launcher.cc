@@ -61,6 +61,12 @@ PluginLauncher::PluginLauncher(const std::string& id, int version, const std::st
   CheckAndAnnounce(id, operation, version, type, module);
 }
 
+PluginLauncher::PluginLauncher(const std::string& id, int version, const std::string& operation,
+                               const std::string& type, std::string module)
+    : id(id), operation(operation), type(type), version(version), start_(std::chrono::steady_clock::now()) {
+  CheckAndAnnounce(id, operation, version, type, module);
+}
+
 PluginLauncher::PluginLauncher(const std::string& id, int version,
                                const std::vector<std::shared_ptr<HoxConfigStore::ConfigStoreObject>>& data,
                                const std::vector<std::shared_ptr<HoxConfigStore::ConfigStoreObject>>& references,

@@ -2,12 +2,17 @@
 // library and read back by the runners.
 #include <filesystem>
 #include <stdexcept>
+#include <string_view>
 
 #include <hoxcm/documents.h>
 #include <hoxcm/files.h>
 #include <hoxcm/plugins.h>
 
+#include <rapidjson/stringbuffer.h>
+#include <rapidjson/writer.h>
+
 #include "platform/files/document_files.h"
+#include "plugins/plugin_request_writer.h"
 
 namespace HoxConfigManager {
 namespace {
@@ -54,7 +59,86 @@ void AddIdentity(Value& element, const HoxConfigStore::ConfigStoreObjectId& id, 
   element.AddMember("instanceId", Text(id.instanceId, a), a);
 }
 
+using RequestWriter = rapidjson::Writer<rapidjson::StringBuffer>;
+
+void WriteText(RequestWriter& writer, const std::string& text) {
+  writer.String(text.data(), static_cast<rapidjson::SizeType>(text.size()));
+}
+
+// A value as the member text the request carries: its compact JSON,
+// serialised into `scratch` (reused from one value to the next) and written
+// as a string, escaped by the writer as any string member is.
+void WriteAsText(RequestWriter& writer, const Value& value, rapidjson::StringBuffer& scratch) {
+  scratch.Clear();
+  RequestWriter inner(scratch);
+  value.Accept(inner);
+  writer.String(scratch.GetString(), static_cast<rapidjson::SizeType>(scratch.GetSize()));
+}
+
+void WriteIdentity(RequestWriter& writer, const HoxConfigStore::ConfigStoreObjectId& id) {
+  writer.Key("component");
+  WriteText(writer, id.component);
+  writer.Key("group");
+  WriteText(writer, id.group);
+  writer.Key("key");
+  WriteText(writer, id.key);
+  writer.Key("instanceId");
+  WriteText(writer, id.instanceId);
+}
+
+void WriteRequestFile(const std::string& path, std::string_view content) {
+  HoxPlatform::CreateDirectories(std::filesystem::path(path).parent_path().string());
+  // The request carries configuration values, passwords among them: only the
+  // owner may read it. It lives for one run: after a crash the run is gone
+  // too, so it needs atomic replacement but no flush to disk.
+  HoxPlatform::WriteFileAtomically(path, content, 0600, HoxPlatform::Durability::kAtomic);
+}
+
 }  // namespace
+
+void WriteInputsRequest(const std::string& path, const std::string& id, const std::string& operation,
+                        const std::string& module, int version, const std::vector<DesiredConfigInput>& inputs,
+                        const std::string& taskId, const std::string& clusterContext) {
+  // Members in the order the request document adds them.
+  rapidjson::StringBuffer out, scratch;
+  RequestWriter writer(out);
+  writer.StartObject();
+  writer.Key("key");
+  WriteText(writer, id);
+  writer.Key("version");
+  writer.Int(version);
+  writer.Key("type");
+  WriteText(writer, operation);
+  writer.Key("module");
+  WriteText(writer, module);
+  writer.Key("data");
+  writer.StartArray();
+  const HoxConfigStore::ConfigStoreObjectId noObject;
+  for (const DesiredConfigInput& input : inputs) {
+    writer.StartObject();
+    writer.Key("operation");
+    WriteText(writer, input.action);
+    writer.Key("config");
+    if (input.object) {
+      WriteAsText(writer, input.object->GetData(), scratch);
+    } else {
+      writer.String("null");
+    }
+    if (input.drift) {
+      writer.Key("drift");
+      WriteAsText(writer, input.drift->GetDrift(), scratch);
+    }
+    WriteIdentity(writer, input.object ? input.object->GetConfigStoreObjectId() : noObject);
+    writer.EndObject();
+  }
+  writer.EndArray();
+  writer.Key("taskId");
+  WriteText(writer, taskId);
+  writer.Key("clusterContext");
+  WriteText(writer, clusterContext);
+  writer.EndObject();
+  WriteRequestFile(path, std::string_view(out.GetString(), out.GetSize()));
+}
 
 PluginRequest::PluginRequest() { document_.SetObject(); }
 
@@ -130,11 +214,7 @@ void PluginRequest::Dump(const std::string& path, const std::string& taskId, con
   Allocator& a = document_.GetAllocator();
   PopulateTaskId(taskId, a);
   PopulateClusterContext(clusterContext, a);
-  HoxPlatform::CreateDirectories(std::filesystem::path(path).parent_path().string());
-  // The request carries configuration values, passwords among them: only the
-  // owner may read it. It lives for one run: after a crash the run is gone
-  // too, so it needs atomic replacement but no flush to disk.
-  HoxPlatform::WriteFileAtomically(path, JsonToString(document_), 0600, HoxPlatform::Durability::kAtomic);
+  WriteRequestFile(path, JsonToString(document_));
 }
 
 void PluginRequest::Load(const std::string& path) {

@@ -10,6 +10,8 @@
 
 #include <hoxcm/host.h>
 
+#include "plugins/plugin_request_writer.h"
+
 namespace HoxConfigManager {
 namespace {
 
@@ -57,28 +59,42 @@ std::unique_ptr<HoxPlatform::HostRunLock> LaunchingRunner::LockHost(const HoxPla
 
 // Everything a run does with the fixed files, under the host-wide lock so
 // that runs of different processes never interleave.
-template <typename Result, typename Reader>
-Result LaunchingRunner::Run(PluginLauncher& launcher, const std::string& clusterContext,
-                            const std::shared_ptr<PluginMonitor>& monitor, Reader read) {
+template <typename Result, typename Writer, typename Reader>
+Result LaunchingRunner::Run(PluginLauncher& launcher, const std::shared_ptr<PluginMonitor>& monitor, Writer write,
+                            Reader read) {
   std::optional<HoxPlatform::HostRunLock> lock;
   if (held_ == nullptr) lock.emplace(RunLockPath());
   const std::string resultPath = PluginResultPath();
   // A runner that writes nothing must not leave the previous run's result
   // to be read as its own.
   ::unlink(resultPath.c_str());
-  launcher.GetRequest().Dump(PluginRequestPath(), monitor->GetTaskId(), clusterContext);
+  write(PluginRequestPath(), monitor->GetTaskId());
   launcher.ForkPlugin(monitor);
   return read(resultPath);
+}
+
+// Apply and impact runs write their request straight from their inputs.
+template <typename Result, typename Reader>
+Result LaunchingRunner::RunInputs(const Plugin& plugin, const char* operation,
+                                  const std::vector<DesiredConfigInput>& inputs, const std::string& clusterContext,
+                                  const std::shared_ptr<PluginMonitor>& monitor, Reader read) {
+  const int version = static_cast<int>(plugin.GetVersion());
+  PluginLauncher launcher(plugin.GetId(), version, operation, plugin.GetType(), plugin.GetModule());
+  return Run<Result>(
+      launcher, monitor,
+      [&](const std::string& path, const std::string& taskId) {
+        WriteInputsRequest(path, plugin.GetId(), operation, plugin.GetModule(), version, inputs, taskId,
+                           clusterContext);
+      },
+      read);
 }
 
 ErrorInfo LaunchingRunner::Apply(const Plugin& plugin, const std::vector<DesiredConfigInput>& inputs,
                                  const std::string& clusterContext, std::shared_ptr<PluginMonitor> monitor) {
   if (!monitor) monitor = PluginMonitor::Dummy();
   try {
-    PluginLauncher launcher(plugin.GetId(), static_cast<int>(plugin.GetVersion()), "APPLY", inputs,
-                            plugin.GetType(), plugin.GetModule());
-    return Run<ErrorInfo>(launcher, clusterContext, monitor,
-                          [](const std::string& path) { return ErrorInfo::Load(path); });
+    return RunInputs<ErrorInfo>(plugin, "APPLY", inputs, clusterContext, monitor,
+                                [](const std::string& path) { return ErrorInfo::Load(path); });
   } catch (const std::exception& e) {
     CSLogger::Log(CSLogger::kError, "%s", e.what());
     return RunError(kApplyIds, plugin.GetId(), *monitor, e.what());
@@ -91,10 +107,9 @@ ImpactPluginResult LaunchingRunner::Impact(const Plugin& plugin, const std::vect
   if (!monitor) monitor = PluginMonitor::Dummy();
   ImpactPluginResult result;
   try {
-    PluginLauncher launcher(plugin.GetId(), static_cast<int>(plugin.GetVersion()), "IMPACT", inputs,
-                            plugin.GetType(), plugin.GetModule());
-    result = Run<ImpactPluginResult>(launcher, clusterContext, monitor,
-                                     [](const std::string& path) { return ImpactPluginResult::Load(path); });
+    result = RunInputs<ImpactPluginResult>(plugin, "IMPACT", inputs, clusterContext, monitor, [](const std::string& path) {
+      return ImpactPluginResult::Load(path);
+    });
   } catch (const std::exception& e) {
     CSLogger::Log(CSLogger::kError, "%s", e.what());
     result = ImpactPluginResult();
@@ -113,7 +128,11 @@ ValidationPluginResult LaunchingRunner::Validate(
     PluginLauncher launcher(plugin.GetId(), static_cast<int>(plugin.GetVersion()), data, references,
                             plugin.GetType(), plugin.GetModule());
     ValidationPluginResult result = Run<ValidationPluginResult>(
-        launcher, clusterContext, monitor, [](const std::string& path) { return ValidationPluginResult::Load(path); });
+        launcher, monitor,
+        [&](const std::string& path, const std::string& taskId) {
+          launcher.GetRequest().Dump(path, taskId, clusterContext);
+        },
+        [](const std::string& path) { return ValidationPluginResult::Load(path); });
     // Callers recognise a failed validation run by its message text.
     if (!result.error.id.empty() && result.error.message.empty()) result.error.message = result.error.id;
     return result;

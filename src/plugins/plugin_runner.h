@@ -71,9 +71,12 @@ class LaunchingRunner final : public PluginRunner {
                                   const std::string& clusterContext, std::shared_ptr<PluginMonitor> monitor) override;
 
  private:
+  // `write(path, taskId)` writes the run's request to `path`.
+  template <typename Result, typename Writer, typename Reader>
+  Result Run(PluginLauncher& launcher, const std::shared_ptr<PluginMonitor>& monitor, Writer write, Reader read);
   template <typename Result, typename Reader>
-  Result Run(PluginLauncher& launcher, const std::string& clusterContext,
-             const std::shared_ptr<PluginMonitor>& monitor, Reader read);
+  Result RunInputs(const Plugin& plugin, const char* operation, const std::vector<DesiredConfigInput>& inputs,
+                   const std::string& clusterContext, const std::shared_ptr<PluginMonitor>& monitor, Reader read);
 
   const HoxPlatform::HostRunLock* const held_ = nullptr;
 };

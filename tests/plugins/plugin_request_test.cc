@@ -2,6 +2,7 @@
 // runner-side getters, and the result files, of which nothing malformed
 // may read as success.
 #include "plugins/plugin_fixture.h"
+#include "plugins/plugin_request_writer.h"
 
 namespace hoxcm_test {
 namespace {
@@ -46,6 +47,27 @@ TEST(PluginRequestTest, ApplyRequestsCarryTextsInTheirFixedOrder) {
   EXPECT_EQ(loaded.GetData().at(0).config, "{}");
   EXPECT_EQ(loaded.GetReferences(), std::vector<ConfigStoreObjectId>{host});
   EXPECT_EQ(JsonToString(loaded.GetDocument()["references"][0]["config"]), R"({"hostname":"h"})");
+}
+
+TEST(PluginRequestTest, TheOnePassWriterWritesTheBytesOfTheRequestDocument) {
+  // Given values that need escaping twice (quotes, backslashes, control and
+  // non-ASCII characters), numbers of every kind, an input without drift and
+  // one without object, the runs' writer should write what Dump writes.
+  TempRoot root;
+  const ConfigStoreObjectId vnic("network", "interfaces", "vnic", "v\"0");
+  Document drift;
+  ParseDocument(R"({"mtu":{"old":1500,"new":9000},"note":"tab\there \u00e9 \u0001","ratio":0.1})", drift);
+  const std::vector<DesiredConfigInput> inputs = {
+      {Object(vnic, R"({"name":"v\"0","mtu":9000,"big":-9223372036854775808,"r":1e-7,"s":"a\\b\n\u2028","n":null,)"
+                    R"("l":[true,false,{},[]]})"),
+       std::make_shared<HoxConfigStore::DriftObject>(vnic, "SET", drift), "SET"},
+      {Object(ConfigStoreObjectId("network", "dns", "config"), R"({"servers":[]})"), nullptr, "ADD"},
+      {nullptr, nullptr, "DELETE"},
+  };
+  PluginRequest("n\u00e9t\"", "IMPACT", "lib.so", 3, inputs).Dump(PluginRequestPath(), "t\"1", "c\n");
+  const std::string expected = root.ReadFile("/var/tarvik/lifecycle/cm-plugin-input.json");
+  WriteInputsRequest(PluginRequestPath(), "n\u00e9t\"", "IMPACT", "lib.so", 3, inputs, "t\"1", "c\n");
+  EXPECT_EQ(root.ReadFile("/var/tarvik/lifecycle/cm-plugin-input.json"), expected);
 }
 
 TEST(PluginRequestTest, MissingOrMistypedMembersThrow) {
