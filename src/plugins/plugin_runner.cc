@@ -107,9 +107,8 @@ ImpactPluginResult LaunchingRunner::Impact(const Plugin& plugin, const std::vect
   if (!monitor) monitor = PluginMonitor::Dummy();
   ImpactPluginResult result;
   try {
-    result = RunInputs<ImpactPluginResult>(plugin, "IMPACT", inputs, clusterContext, monitor, [](const std::string& path) {
-      return ImpactPluginResult::Load(path);
-    });
+    result = RunInputs<ImpactPluginResult>(plugin, "IMPACT", inputs, clusterContext, monitor,
+                                           [](const std::string& path) { return ImpactPluginResult::Load(path); });
   } catch (const std::exception& e) {
     CSLogger::Log(CSLogger::kError, "%s", e.what());
     result = ImpactPluginResult();

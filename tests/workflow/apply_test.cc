@@ -129,7 +129,8 @@ TEST_F(ApplyTest, TheImpactWalkYieldsTheTasksThatGenerateApplyTasksReturns) {
   // Given a change, an addition and a removal of instances, a reboot change
   // and a profile wrapper, Apply's single walk should hand the remediation
   // the very tasks of the separate call, in its order.
-  const std::string text = Replaced(Replaced(kFree, "2048", "4096"), R"({"name": "ssh", "action": "allow", "protocol": "tcp"})",
+  const std::string text = Replaced(Replaced(kFree, "2048", "4096"),
+                                    R"({"name": "ssh", "action": "allow", "protocol": "tcp"})",
                                     R"({"name": "web", "action": "allow"})");
   const std::string desiredText = R"({"profile": )" + text + "}";
   const auto Shown = [](const std::vector<DesiredConfigInput>& tasks) {
