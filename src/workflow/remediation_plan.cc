@@ -1,5 +1,6 @@
 #include "workflow/remediation_plan.h"
 
+#include <memory>
 #include <unordered_map>
 
 #include <hoxcm/host.h>
@@ -7,12 +8,28 @@
 namespace HoxConfigManager {
 
 OwnerLookup RegistryOwners(PluginManager& registry) {
-  return [&registry](const HoxConfigStore::ConfigStoreObjectId& id) {
+  // The registry knows owners per key, not per instance, and a plan's tasks
+  // come key by key: the last key's owners serve its next instances. Not
+  // while detail lines are written, since the registry logs every object it
+  // is asked about.
+  struct LastKey {
+    HoxConfigStore::ConfigStoreObjectId id;
+    std::vector<PlanOwner> owners;
+    bool known = false;
+  };
+  auto last = std::make_shared<LastKey>();
+  const bool remember = !CSLogger::IsEnabled(CSLogger::kDetail);
+  return [&registry, last, remember](const HoxConfigStore::ConfigStoreObjectId& id) {
+    if (remember && last->known && last->id.key == id.key && last->id.group == id.group &&
+        last->id.component == id.component) {
+      return last->owners;
+    }
     std::vector<PlanOwner> owners;
     for (const std::shared_ptr<Plugin>& plugin : registry.Find(id)) {
       if (!plugin) continue;
       owners.push_back({plugin, plugin->GetId(), plugin->GetVersion(), plugin->CheckType(APPLY_BOOT)});
     }
+    if (remember) *last = {id, owners, true};
     return owners;
   };
 }

@@ -125,5 +125,35 @@ TEST_F(RemediationTest, RemediateHostPlansOverTheApplyRegistry) {
   EXPECT_ANY_THROW(RemediateHost(boot, "", task_, true, runner_));
 }
 
+// The same group and key under two components, each with its own plugin.
+class RegistryOwnersTest : public WorkflowTest {
+ protected:
+  RegistryOwnersTest() {
+    for (const std::string n : {"1", "2"}) {
+      root.WriteFile(std::string(HoxPlatform::HostPaths::kSchemaDirectory) + "/storage_" + n + "/nfs/mounts.json",
+                     R"({"formatVersion": 1, "multiInstance": false, "schema": {"type": "object"}})");
+      Manifest("s" + n + "/plugin.json",
+               V3Manifest("python", {"storage_" + n + ":nfs:mounts"}, "network", "REMEDIATE:s" + n, {}));
+    }
+  }
+};
+
+TEST_F(RegistryOwnersTest, OwnersFollowTheComponentAsWellAsTheKey) {
+  // Looked up in turn, each object should get its component's owner, whether
+  // detail lines are written or not.
+  PluginManager registry(APPLY);
+  for (const char* level : {"1", "3"}) {
+    std::string owners;
+    LogOf(level, [&] {
+      const OwnerLookup lookup = RegistryOwners(registry);
+      for (const char* component : {"storage_1", "storage_1", "storage_2", "storage_1", "network"}) {
+        for (const PlanOwner& owner : lookup({component, "nfs", "mounts"})) owners += owner.id + " ";
+        owners += "| ";
+      }
+    });
+    EXPECT_EQ(owners, "s1 | s1 | s2 | s1 | | ") << level;
+  }
+}
+
 }  // namespace
 }  // namespace hoxcm_test
