@@ -330,9 +330,16 @@ class StoreGeneratedSchema {
 
  private:
   // A component or group level (members) or a key (key).
+  // Member is declared apart from Node: a pair holding Node inside Node
+  // is refused by clang's standard library checks as an incomplete type.
+  struct Member;
   struct Node {
-    std::vector<std::pair<std::string_view, Node>> members;  // sorted by name
+    std::vector<Member> members;  // sorted by name
     std::shared_ptr<HoxSchemaStore::detail::KeySchema> key;
+  };
+  struct Member {
+    std::string_view name;
+    Node node;
   };
 
   // The constraints of a level node the engine evaluates: type, properties.
@@ -371,16 +378,16 @@ class StoreGeneratedSchema {
     if (properties == nullptr) return false;
     out.members.reserve(properties->MemberCount());
     for (const auto& m : properties->GetObject()) {
-      out.members.emplace_back(HoxConfigManager::compare::NameOf(m.name), Node());
-      names_[depth] = out.members.back().first;
-      Node& child = out.members.back().second;
+      out.members.push_back(Member{HoxConfigManager::compare::NameOf(m.name), Node()});
+      names_[depth] = out.members.back().name;
+      Node& child = out.members.back().node;
       if (depth + 1 < kKeyDepth ? !Build(m.value, depth + 1, child) : !BuildKey(m.value, child)) return false;
     }
     std::sort(out.members.begin(), out.members.end(),
-              [](const auto& a, const auto& b) { return a.first < b.first; });
+              [](const Member& a, const Member& b) { return a.name < b.name; });
     // The engine keeps one schema per name; a repeated name is left to it.
-    return std::adjacent_find(out.members.begin(), out.members.end(), [](const auto& a, const auto& b) {
-             return a.first == b.first;
+    return std::adjacent_find(out.members.begin(), out.members.end(), [](const Member& a, const Member& b) {
+             return a.name == b.name;
            }) == out.members.end();
   }
 
@@ -470,11 +477,11 @@ class StoreGeneratedSchema {
     for (const auto& m : doc.GetObject()) {
       const std::string_view name = HoxConfigManager::compare::NameOf(m.name);
       const auto child = std::lower_bound(node.members.begin(), node.members.end(), name,
-                                          [](const auto& entry, std::string_view n) { return entry.first < n; });
-      if (child == node.members.end() || child->first != name) continue;
+                                          [](const Member& entry, std::string_view n) { return entry.name < n; });
+      if (child == node.members.end() || child->name != name) continue;
       const std::size_t length = path.size();
       HoxConfigManager::detail::AppendPointerToken(path, name);
-      WalkUnions(child->second, m.value, path, depth + 1, out);
+      WalkUnions(child->node, m.value, path, depth + 1, out);
       path.resize(length);
     }
   }
