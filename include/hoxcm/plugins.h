@@ -18,6 +18,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -263,6 +264,14 @@ class HOXCM_API PluginLauncher {
   int version;
   std::chrono::steady_clock::time_point start_;
 };
+
+// Takes the host run lock that every apply, boot-time run and single-item
+// change holds from its checks to its last plugin run, for a caller that
+// replaces what they read (hoxcfg init --reset). Blocks until the lock is
+// free, calling `waiting` once if another holder has it first; held until
+// the returned handle is released. Throws std::system_error when the lock
+// file cannot be opened or locked.
+HOXCM_API std::shared_ptr<void> HoldHostRunLock(const std::function<void()>& waiting);
 
 // Fixed paths of the plugin framework, resolved under the root.
 HOXCM_API std::string PluginDirectory();        // ".../apply_modules/"

@@ -57,6 +57,10 @@ std::unique_ptr<HoxPlatform::HostRunLock> LaunchingRunner::LockHost(const HoxPla
   return HoxPlatform::HostRunLock::Acquire(RunLockPath(), waiting);
 }
 
+std::shared_ptr<void> HoldHostRunLock(const std::function<void()>& waiting) {
+  return LaunchingRunner::LockHost(HoxPlatform::HostRunLock::Waiting{waiting, nullptr});
+}
+
 // Everything a run does with the fixed files, under the host-wide lock so
 // that runs of different processes never interleave.
 template <typename Result, typename Writer, typename Reader>

@@ -109,6 +109,21 @@ TEST_F(HoxcfgApplyTest, TwoAppliesAtOnceTakeTurnsAndTheSecondJudgesWhatTheFirstL
   EXPECT_EQ(Outcomes(), (std::vector<std::string>{"applied", "applied"}));
 }
 
+TEST_F(HoxcfgApplyTest, InitReplacingTheHostWaitsForARunningApply) {
+  root_.WriteFile(kModules + "storage/plugin.py", SlowStorage(1));
+  const std::string mount = ExportWith(root_, "mount.json", {{"/storage/nfs/mounts/0/readOnly", "false"}});
+  const pid_t apply = StartHoxcfg(root_, "apply --yes " + mount, "a");
+  ASSERT_TRUE(WaitFor(root_, "/runs.log", "start"));
+  const pid_t init = StartHoxcfg(root_, "init --reset --sample", "init");
+  EXPECT_TRUE(WaitFor(root_, "/init.err", "hoxcfg: waiting for another apply to finish\n"));
+  EXPECT_EQ(ExitStatusOf(apply), 0) << root_.ReadFile("/a.err");
+  EXPECT_EQ(ExitStatusOf(init), 0) << root_.ReadFile("/init.err");
+  // The apply ran to its end on the host it started with; the sample host
+  // replaced it afterwards.
+  EXPECT_EQ(Lines(root_.ReadFile("/runs.log")).size(), 2u);
+  EXPECT_EQ(Run("plan " + mount).exitCode, 1);
+}
+
 TEST_F(HoxcfgApplyTest, OnATerminalItAsksShowsProgressAndCtrlCStopsTheRunningPlugin) {
   root_.WriteFile(kModules + "storage/plugin.py", SlowStorage(30));
   const std::string mount = ExportWith(root_, "mount.json", {{"/storage/nfs/mounts/0/readOnly", "false"}});

@@ -11,6 +11,7 @@
 #include <hoxcm/host.h>
 #include <hoxcm/extraction.h>
 #include <hoxcm/host_documents.h>
+#include <hoxcm/plugins.h>
 #include <hoxcm/schema_store.h>
 
 #include "hoxcfg/cli.h"
@@ -66,6 +67,12 @@ void RegisterInit(CLI::App& app, GlobalOptions& options) {
     // A second init by mistake must not wipe the host's configuration.
     if (HostExists() && !*reset) {
       throw Failure("a host already exists at " + root + "; nothing was changed", "pass --reset to replace it");
+    }
+    // An apply, a boot-time run or a set running now reads the store and the
+    // files being replaced: wait until it is done.
+    std::shared_ptr<void> hold;
+    if (HostExists()) {
+      hold = HoxConfigManager::HoldHostRunLock([] { std::cerr << "hoxcfg: waiting for another apply to finish\n" << std::flush; });
     }
     auto report = std::make_shared<InitReport>(InitHostRoot(LocateProductFiles(), *request));
     AuditChange(request->sample          ? "host root initialised with the sample host"
