@@ -20,8 +20,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
-#include <filesystem>
-#include <fstream>
 #include <string>
 #include <vector>
 
@@ -33,8 +31,8 @@
 #include <hoxcm/operations.h>
 
 #include "bare_spawn.h"
+#include "bench_root.h"
 
-namespace fs = std::filesystem;
 using namespace HoxConfigManager;
 using Clock = std::chrono::steady_clock;
 
@@ -54,44 +52,25 @@ std::string Component(int i) { return i == 0 ? "storage" : "storage_" + std::to_
 // do-nothing runner installed as the script runner; removed at exit.
 class ApplyRoot {
  public:
-  ApplyRoot() {
-    std::string tmpl = (fs::temp_directory_path() / "hoxcm-apply-bench-XXXXXX").string();
-    if (::mkdtemp(tmpl.data()) == nullptr) std::abort();
-    path_ = tmpl;
-    ::setenv("HOX_ROOT", path_.c_str(), 1);
-    ::setenv("HOX_LOG_LEVEL", "-1", 1);
+  ApplyRoot() : root_("apply-bench") {
     const std::string schemas = "/usr/lib/tarvik/configmanager/schemas/";
     for (int i = 0; i < kPlugins; ++i) {
-      fs::create_directories(path_ + schemas + Component(i) + "/nfs");
-      fs::copy_file(std::string(HOXCM_SOURCE_DIR) + "/data/sample-host/schemas/storage/nfs/mounts.json",
-                    path_ + schemas + Component(i) + "/nfs/mounts.json");
+      root_.Copy(std::string(HOXCM_SOURCE_DIR) + "/data/sample-host/schemas/storage/nfs",
+                 schemas + Component(i) + "/nfs");
       const std::string depends = i == 0 ? "" : "\"REMEDIATE:bench" + std::to_string(i - 1) + "\"";
-      Write(kModules + "bench" + std::to_string(i) + "/plugin.json",
-            R"({"version":3,"type":"python","accepts":[")" + Component(i) +
-                R"(:nfs:mounts"],"apply":{"boot":true,"apply_group":"storage",)"
-                R"("REMEDIATE":{"provides":"REMEDIATE:bench)" + std::to_string(i) + R"(","depends":[)" +
-                depends + "]}}}");
+      root_.Write(kModules + "bench" + std::to_string(i) + "/plugin.json",
+                  R"({"version":3,"type":"python","accepts":[")" + Component(i) +
+                      R"(:nfs:mounts"],"apply":{"boot":true,"apply_group":"storage",)"
+                      R"("REMEDIATE":{"provides":"REMEDIATE:bench)" + std::to_string(i) + R"(","depends":[)" +
+                      depends + "]}}}");
     }
-    Copy(std::string(HOXCM_SOURCE_DIR) + "/data/plugin_schemas", "/usr/lib/tarvik/configmanager/plugin_schemas");
-    fs::create_directories(path_ + "/usr/lib/tarvik/configmanager/bin");
-    fs::create_directories(path_ + "/var/tarvik/lifecycle");
-    runner_ = path_ + "/usr/lib/tarvik/configmanager/bin/py_plugin_runner";
-    fs::create_symlink(HOXCM_NOOP_RUNNER, runner_);
-
     Document host;
     Fill(host, false);
     HoxConfigStore::ImportConfiguration(HoxConfigStore::ConfigKind::User, host);
     HoxConfigStore::SetBootMode(HoxConfigStore::BOOTMODE_NORMAL);
     Fill(desired_, true);
   }
-  ~ApplyRoot() {
-    std::error_code ec;
-    fs::remove_all(path_, ec);
-  }
-  ApplyRoot(const ApplyRoot&) = delete;
-  ApplyRoot& operator=(const ApplyRoot&) = delete;
-
-  const std::string& runner() const { return runner_; }
+  const std::string& runner() const { return root_.runner(); }
   const Document& desired() const { return desired_; }
 
   // Removes the apply history, through a connection of its own, so that
@@ -107,14 +86,6 @@ class ApplyRoot {
   }
 
  private:
-  void Copy(const std::string& from, const std::string& hostPath) const {
-    fs::create_directories(path_ + hostPath);
-    fs::copy(from, path_ + hostPath, fs::copy_options::recursive | fs::copy_options::overwrite_existing);
-  }
-  void Write(const std::string& hostPath, const std::string& text) const {
-    fs::create_directories(fs::path(path_ + hostPath).parent_path());
-    std::ofstream(path_ + hostPath) << text;
-  }
   // The host's mounts, or the desired ones (changed, dropped and added).
   static void Fill(Document& doc, bool desired) {
     doc.SetObject();
@@ -139,8 +110,7 @@ class ApplyRoot {
     }
   }
 
-  std::string path_;
-  std::string runner_;
+  hoxcm_bench::BenchRoot root_;
   Document desired_;
 };
 

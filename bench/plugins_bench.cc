@@ -8,7 +8,6 @@
 #include <chrono>
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <memory>
 
 #include <benchmark/benchmark.h>
@@ -18,6 +17,7 @@
 #include <hoxcm/plugins.h>
 
 #include "bare_spawn.h"
+#include "bench_root.h"
 
 namespace fs = std::filesystem;
 using namespace HoxConfigManager;
@@ -26,45 +26,15 @@ namespace {
 
 const std::string kModules = "/usr/lib/tarvik/configmanager/apply_modules/";
 
-// A temporary host root with the schemas, the manifest schemas and the
-// do-nothing runner installed as the script runner; removed at exit.
-class BenchRoot {
- public:
-  BenchRoot() {
-    std::string tmpl = (fs::temp_directory_path() / "hoxcm-bench-XXXXXX").string();
-    if (::mkdtemp(tmpl.data()) == nullptr) std::abort();
-    path_ = tmpl;
-    ::setenv("HOX_ROOT", path_.c_str(), 1);
-    ::setenv("HOX_LOG_LEVEL", "-1", 1);
-    Copy(std::string(HOXCM_SOURCE_DIR) + "/data/sample-host/schemas", "/usr/lib/tarvik/configmanager/schemas");
-    Copy(std::string(HOXCM_SOURCE_DIR) + "/data/plugin_schemas", "/usr/lib/tarvik/configmanager/plugin_schemas");
-    fs::create_directories(path_ + "/usr/lib/tarvik/configmanager/bin");
-    fs::create_directories(path_ + "/var/tarvik/lifecycle");
-    runner_ = path_ + "/usr/lib/tarvik/configmanager/bin/py_plugin_runner";
-    fs::create_symlink(HOXCM_NOOP_RUNNER, runner_);
-  }
-  ~BenchRoot() {
-    std::error_code ec;
-    fs::remove_all(path_, ec);
-  }
-  void Copy(const std::string& from, const std::string& hostPath) const {
-    fs::create_directories(path_ + hostPath);
-    fs::copy(from, path_ + hostPath, fs::copy_options::recursive | fs::copy_options::overwrite_existing);
-  }
-  void Write(const std::string& hostPath, const std::string& text) const {
-    fs::create_directories(fs::path(path_ + hostPath).parent_path());
-    std::ofstream(path_ + hostPath) << text;
-  }
-  const std::string& runner() const { return runner_; }
-  const std::string& path() const { return path_; }
+using hoxcm_bench::BenchRoot;
 
- private:
-  std::string path_;
-  std::string runner_;
-};
-
+// The plugin framework's root, with the sample host's schemas.
 BenchRoot& Root() {
-  static BenchRoot root;
+  static BenchRoot root("bench");
+  static const bool schemas =
+      (root.Copy(std::string(HOXCM_SOURCE_DIR) + "/data/sample-host/schemas", "/usr/lib/tarvik/configmanager/schemas"),
+       true);
+  (void)schemas;
   return root;
 }
 
