@@ -13,7 +13,8 @@ int JournalPriority(int priority);
 // the fields of this thread's LogContext.
 std::string JournalRecord(int priority, std::string_view message);
 // Sends a record to the journal's socket under the root, else the
-// machine's, without waiting; false when neither took it at once.
+// machine's, waiting at most half a second at each for a journal that is
+// behind; false when neither took it.
 bool SendToJournal(std::string_view record);
 // Whether systemd connected this process's stderr to the journal
 // (JOURNAL_STREAM names stderr's device and inode).

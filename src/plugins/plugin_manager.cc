@@ -254,8 +254,11 @@ void PluginManager::ProcessOperation(const PluginApplyOperation& op, const std::
 
 void PluginManager::BuildDependencies() {
   DependencyTable table = GroupTable();
-  for (const auto& [path, plugin] : plugins) {
-    CSLogger::Log(CSLogger::kDetail, "Processing operations in %s", path.c_str());
+  // In manifest path order, as OrderTable reads them: when two operations
+  // provide one name, the later one's list wins in both, so the order built
+  // here and the faults `plugins check` names agree.
+  for (const auto& plugin : GetPlugins()) {
+    CSLogger::Log(CSLogger::kDetail, "Processing operations in %s", plugin->GetPath().c_str());
     const std::string group = plugin->GetApplyGroup();
     for (const auto& op : OrderedOperations(*plugin)) ProcessOperation(op, group, table);
   }

@@ -240,25 +240,11 @@ void Validate(const Document& desiredDocument, const Document& schemaDocument, c
     Document output;
     JsonValidator::ValidateCMDocument(schemaDocument, root, output, {}, "");
     RAPIDJSON_ASSERT(output.IsArray());
-    std::unordered_map<int, std::string> messageIds;
     std::string_view lastKey;  // findings come in runs per key: mark each key once
     for (const Value& finding : output.GetArray()) {
-      RAPIDJSON_ASSERT(finding.IsObject());
-      const Value& field = finding["field"];
-      const Value& code = finding["errId"];
-      const Value& args = finding["errArgs"];
-      RAPIDJSON_ASSERT(field.IsString() && code.IsInt() && args.IsArray());
-      auto id = messageIds.find(code.GetInt());
-      if (id == messageIds.end()) {
-        id = messageIds.emplace(code.GetInt(), JsonValidator::ConvertErrorCodeToMsgId(code.GetInt())).first;
-      }
-      ErrorInfo error(id->second, {}, "");
-      for (const Value& arg : args.GetArray()) {
-        RAPIDJSON_ASSERT(arg.IsString());
-        error.args.emplace_back(arg.GetString(), arg.GetStringLength());
-      }
-      const std::string_view name = NameOf(field);
-      findings.Entry(name).errors.push_back(std::move(error));
+      // The name as a view into `output`: the key marks below keep views of it.
+      const std::string_view name = NameOf(finding["field"]);
+      findings.Entry(name).errors.push_back(SchemaFinding(finding).second);
       if (const std::string_view key = KeyPrefix(name); key != lastKey) {
         failed.insert(FailedObjectOf(std::string(key)));
         lastKey = key;

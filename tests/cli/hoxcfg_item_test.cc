@@ -37,6 +37,11 @@ TEST_F(HoxcfgItemTest, GetSetAndDeleteAnswerWithTheirExitStatuses) {
       {dns + " --yes", 0, "/network/dns/config: unchanged\n"},
       {"delete services/syslog/config --yes", 0, "/services/syslog/config: deleted\n"},
       {"get services/syslog/config --json --compact", 0, R"("current":null)"},
+      // An item is named with exactly three parts, with or without "/".
+      {"get /services/syslog/config --json --compact", 0, R"("current":null)"},
+      {"get services/syslog", 2, "'services/syslog' is not an item"},
+      {"delete services//config --yes", 2, "is not an item"},
+      {"get network/dns/config[x]", 2, "is not an item"},
   });
 
   // Staged for the next boot: 3, shown as desired; then every change is refused.

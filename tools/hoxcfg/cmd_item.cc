@@ -30,19 +30,14 @@ struct Item {
   std::string Name() const { return ItemName(component, group, key); }
 };
 
+// COMPONENT/GROUP/KEY, with or without a leading "/", as item names are
+// written (ParseItemName), without an instance.
 Item ParseItem(const std::string& text) {
-  std::vector<std::string> parts;
-  std::string rest = text.size() > 1 && text.front() == '/' ? text.substr(1) : text;
-  for (std::size_t slash; (slash = rest.find('/')) != std::string::npos; rest.erase(0, slash + 1)) {
-    parts.push_back(rest.substr(0, slash));
+  const auto item = ParseItemName(!text.empty() && text.front() == '/' ? text : "/" + text);
+  if (!item || !item->instance.empty()) {
+    throw Failure("'" + text + "' is not an item", "name it COMPONENT/GROUP/KEY, for example network/dns/config");
   }
-  parts.push_back(rest);
-  for (const std::string& part : parts) {
-    if (parts.size() != 3 || part.empty()) {
-      throw Failure("'" + text + "' is not an item", "name it COMPONENT/GROUP/KEY, for example network/dns/config");
-    }
-  }
-  return {parts[0], parts[1], parts[2]};
+  return {item->component, item->group, item->key};
 }
 
 std::shared_ptr<HoxSchemaStore::SchemaObject> SchemaOf(const Item& item) {
