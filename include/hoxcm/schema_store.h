@@ -13,6 +13,7 @@
 #include <memory>
 #include <set>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include <hoxcm/export.h>
@@ -118,6 +119,12 @@ class HOXCM_API SchemaCache {
   virtual ~SchemaCache();
   virtual std::shared_ptr<SchemaStore> GetStore() const = 0;
 };
+
+// Whether the key's list of `query` (SchemaObject::GetRebootOperations or
+// GetMaintenanceModeOperations) names `operation` ("SET", "ADD", "DELETE").
+HOXCM_API bool ListsOperation(const SchemaObject& schema,
+                              int (SchemaObject::*query)(std::vector<std::string>&, bool&) const,
+                              std::string_view operation);
 
 // Schema of (component, group, key) in `store`; null when missing.
 HOXCM_API std::shared_ptr<SchemaObject> GetSchema(const std::string& component, const std::string& group,

@@ -120,14 +120,6 @@ void Stage(const HostItem& item, const std::shared_ptr<HoxConfigStore::DBStore>&
   transaction.Commit();
 }
 
-bool Lists(int (HoxSchemaStore::SchemaObject::*query)(std::vector<std::string>&, bool&) const,
-           const HoxSchemaStore::SchemaObject& schema, const char* operation) {
-  std::vector<std::string> operations;
-  bool propertyLevel = false;
-  return (schema.*query)(operations, propertyLevel) == 0 &&
-         std::find(operations.begin(), operations.end(), operation) != operations.end();
-}
-
 // Records one change in the apply history, as Apply is recorded (the host
 // API's changes are listed beside the applies), then throws a plugin's
 // error as the host API's 2084; an abort is returned.
@@ -214,10 +206,11 @@ ApplyResult DeleteConfigWith(const std::string& component, const std::string& gr
       return Aborted({});
     }
     RequireNormalBootMode();
+    using HoxSchemaStore::SchemaObject;
     const bool maintenance =
-        Lists(&HoxSchemaStore::SchemaObject::GetMaintenanceModeOperations, *item.schema, "DELETE");
+        HoxSchemaStore::ListsOperation(*item.schema, &SchemaObject::GetMaintenanceModeOperations, "DELETE");
     if (maintenance && !IsMaintenanceModeEnabled()) ThrowNotInMaintenanceMode();
-    if (Lists(&HoxSchemaStore::SchemaObject::GetRebootOperations, *item.schema, "DELETE")) {
+    if (HoxSchemaStore::ListsOperation(*item.schema, &SchemaObject::GetRebootOperations, "DELETE")) {
       // A removal cannot be staged: the boot-time apply only adds and sets.
       CSLogger::Log(CSLogger::kWarning, "The removal of %s takes effect at the next boot", item.Path().c_str());
     }

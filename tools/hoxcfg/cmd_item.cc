@@ -280,13 +280,10 @@ void RegisterDelete(CLI::App& app, GlobalOptions& options) {
     }
     std::string plan = "delete the configuration of " + outcome->item + ": " +
                        HoxConfigManager::JsonToString(Shown(at, current, false));
-    if (const auto schema = SchemaOf(at)) {
-      std::vector<std::string> operations;
-      bool propertyLevel = false;
-      if (schema->GetRebootOperations(operations, propertyLevel) == 0 &&
-          std::find(operations.begin(), operations.end(), "DELETE") != operations.end()) {
-        plan += "\n  it takes effect at the next boot";
-      }
+    const auto schema = SchemaOf(at);
+    if (schema &&
+        HoxSchemaStore::ListsOperation(*schema, &HoxSchemaStore::SchemaObject::GetRebootOperations, "DELETE")) {
+      plan += "\n  it takes effect at the next boot";
     }
     InterruptWatch watch;
     ConfirmChange(options, plan);

@@ -239,6 +239,14 @@ void ThrowSchemaNotFound(const SchemaStore* store, const SchemaObjectId& id, con
   HoxConfigManager::ThrowException<HoxConfigManager::SchemaNotFound>(HoxConfigManager::SchemaObjectNotFound, what);
 }
 
+bool ListsOperation(const SchemaObject& schema, int (SchemaObject::*query)(std::vector<std::string>&, bool&) const,
+                    std::string_view operation) {
+  std::vector<std::string> operations;
+  bool propertyLevel = false;
+  return (schema.*query)(operations, propertyLevel) == 0 &&
+         std::find(operations.begin(), operations.end(), operation) != operations.end();
+}
+
 std::shared_ptr<SchemaObject> GetSchema(const std::string& component, const std::string& group, const std::string& key,
                                         const std::shared_ptr<SchemaStore>& store) {
   return store ? store->Find(component, group, key) : nullptr;
