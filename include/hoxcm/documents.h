@@ -51,6 +51,12 @@ inline constexpr std::string_view kGeneratedId = "cs_generated_id";
 // The value the store keeps for a default configuration that was deleted.
 inline constexpr std::string_view kDeleteDefault = "DELETE_DEFAULT";
 
+// Whether `value` is the marker of a deleted default configuration.
+inline bool IsDeleteDefault(const Value& value) {
+  return value.IsString() &&
+         std::string_view(value.GetString(), value.GetStringLength()) == kDeleteDefault;
+}
+
 // A string reference to one of the names above, for RapidJSON calls (no
 // copy, no length count).
 inline rapidjson::GenericStringRef<char> Ref(std::string_view name) {

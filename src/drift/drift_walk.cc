@@ -126,7 +126,7 @@ class DriftWalk {
   void CompareSingle(const Value& desired, const Value& host, ConfigStoreObjectId& id,
                      const std::shared_ptr<SchemaObject>& schema) {
     // A singleton whose configuration was deleted holds this marker on the host.
-    const bool deletedDefault = host.IsString() && NameOf(host) == DocumentShape::kDeleteDefault;
+    const bool deletedDefault = DocumentShape::IsDeleteDefault(host);
     RAPIDJSON_ASSERT(desired.IsNull() || desired.IsObject());
     RAPIDJSON_ASSERT(host.IsNull() || host.IsObject() || deletedDefault);
     const Value& node = schema->GetInstanceSchema();

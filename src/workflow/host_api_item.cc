@@ -24,7 +24,6 @@ using HoxConfigStore::ConfigStoreDocument;
 using compare::FindByName;
 using compare::NameOf;
 
-bool IsDeleteDefault(const Value& v) { return v.IsString() && NameOf(v) == DocumentShape::kDeleteDefault; }
 
 ErrorLocation At(const std::string& documentPath) {
   ErrorLocation location;
@@ -40,7 +39,9 @@ ErrorLocation At(const std::string& documentPath) {
 void CheckShape(const HostItem& item, const Value& value, bool strict) {
   const std::string path = item.Path();
   const std::string key = item.schema->GetId().toString();
-  if (IsDeleteDefault(value)) ThrowExceptionAt<InvalidArgumentException>(At(path), DeleteDefaultNotSupported, key);
+  if (DocumentShape::IsDeleteDefault(value)) {
+    ThrowExceptionAt<InvalidArgumentException>(At(path), DeleteDefaultNotSupported, key);
+  }
   const bool multi = item.schema->IsMultiInstance();
   if (!multi && value.IsArray()) ThrowExceptionAt<InvalidArgumentException>(At(path), NotNonSingletonObject, path);
   if (multi && value.IsObject()) ThrowExceptionAt<InvalidArgumentException>(At(path), NotSingletonObject, path);
@@ -54,7 +55,9 @@ void CheckShape(const HostItem& item, const Value& value, bool strict) {
   for (rapidjson::SizeType i = 0; i < value.Size(); ++i) {
     const Value& instance = value[i];
     const std::string at = path + "/" + std::to_string(i);
-    if (IsDeleteDefault(instance)) ThrowExceptionAt<InvalidArgumentException>(At(at), DeleteDefaultNotSupported, key);
+    if (DocumentShape::IsDeleteDefault(instance)) {
+      ThrowExceptionAt<InvalidArgumentException>(At(at), DeleteDefaultNotSupported, key);
+    }
     if (!instance.IsObject()) {
       if (strict) ThrowExceptionAt<InvalidArgumentException>(At(at), InvalidKeyValue, at);
       continue;

@@ -38,8 +38,7 @@ bool Lists(const std::vector<std::string>& operations, const char* action) {
 // A singleton the host holds no configuration for: an absent value, an
 // empty object, or the marker of a deleted default configuration.
 bool Unconfigured(const Value& host) {
-  return host.IsNull() || (host.IsObject() && host.ObjectEmpty()) ||
-         (host.IsString() && NameOf(host) == DocumentShape::kDeleteDefault);
+  return host.IsNull() || (host.IsObject() && host.ObjectEmpty()) || DocumentShape::IsDeleteDefault(host);
 }
 
 }  // namespace

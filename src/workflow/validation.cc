@@ -65,7 +65,6 @@ bool Failed(const FailedSet& failed, const ConfigStoreObjectId& key) {
          failed.count(ConfigStoreObjectId(key.component, "", "")) != 0 || failed.count(ConfigStoreObjectId()) != 0;
 }
 
-bool IsDeleteDefault(const Value& v) { return v.IsString() && NameOf(v) == DocumentShape::kDeleteDefault; }
 
 // One store object per configured value of the keys: one for a singleton's
 // object, one per instance. The marker of a deleted default configuration
@@ -80,9 +79,11 @@ StoreObjects Gather(const Value& root, const std::vector<ConfigStoreObjectId>& k
     const ConfigStoreObjectId id(key.component, key.group, key.key);
     if (item->IsArray()) {
       for (const Value& instance : item->GetArray()) {
-        if (!IsDeleteDefault(instance)) objects.push_back(HoxConfigStore::CreateObject(id, instance, schema));
+        if (!DocumentShape::IsDeleteDefault(instance)) {
+          objects.push_back(HoxConfigStore::CreateObject(id, instance, schema));
+        }
       }
-    } else if (!IsDeleteDefault(*item)) {
+    } else if (!DocumentShape::IsDeleteDefault(*item)) {
       objects.push_back(HoxConfigStore::CreateObject(id, *item, schema));
     }
   }
